@@ -1,0 +1,213 @@
+#include "common/json.h"
+
+#include <json/reader.h>
+#include <json/writer.h>
+
+#include <memory>
+#include <sstream>
+#include <type_traits>
+
+#include "common/check.h"
+#include "common/error.h"
+#include "common/file.h"
+
+namespace vexlo {
+namespace {
+
+Json::CharReader* NewReader() {
+  Json::CharReaderBuilder builder;
+  builder["collectComments"] = false;
+  builder["failIfExtra"] = true;
+  builder["allowTrailingCommas"] = false;
+  builder["skipBom"] = false;
+  return builder.newCharReader();
+}
+
+// Made once a thread: building a reader costs more than parsing a queue line.
+Json::CharReader& Reader() {
+  thread_local const std::unique_ptr<Json::CharReader> reader(NewReader());
+  return *reader;  // NOLINT(clang-analyzer-cplusplus.NewDelete): it lives as long as the thread.
+}
+
+std::string Write(const Json::Value& value, const char* indentation) {
+  Json::StreamWriterBuilder builder;
+  builder["indentation"] = indentation;
+  builder["emitUTF8"] = true;  // Every other form replaces bytes that are not UTF-8.
+  return Json::writeString(builder, value);
+}
+
+}  // namespace
+
+bool JsonFromString(Json::Value& value, std::string_view text) {
+  try {
+    return Reader().parse(text.data(), text.data() + text.size(), &value, nullptr);
+  } catch (const Json::Exception&) {
+    return false;  // Nested too deep.
+  }
+}
+
+bool JsonFromFile(Json::Value& value, const std::string& path) {
+  std::string text;
+  return ReadFile(text, path) && JsonFromString(value, text);
+}
+
+std::string JsonToString(const Json::Value& value) { return Write(value, ""); }
+
+void AppendJsonText(std::string& out, std::string_view text) {
+  constexpr char kHex[] = "0123456789abcdef";
+  out += '"';
+  size_t plain_from = 0;
+  for (size_t i = 0; i < text.size(); ++i) {
+    const auto byte = static_cast<unsigned char>(text[i]);
+    if (byte >= 0x20 && byte != '"' && byte != '\\') {
+      continue;
+    }
+    out.append(text, plain_from, i - plain_from);
+    plain_from = i + 1;
+    if (byte >= 0x20) {
+      out += {'\\', text[i]};
+    } else {
+      out += {'\\', 'u', '0', '0', kHex[byte >> 4], kHex[byte & 15]};
+    }
+  }
+  out.append(text, plain_from);
+  out += '"';
+}
+
+std::string JsonToStyledString(const Json::Value& value) { return Write(value, "   ") + "\n"; }
+
+bool JsonToFile(const Json::Value& value, const std::string& path) {
+  return ReplaceFile(path, JsonToStyledString(value));
+}
+
+template <>
+bool isJsonType<std::string>(const Json::Value& value) {
+  return value.isConvertibleTo(Json::stringValue);
+}
+template <>
+std::string asJsonType<std::string>(const Json::Value& value) {
+  return value.asString();
+}
+template <>
+bool isJsonType<bool>(const Json::Value& value) {
+  return value.isConvertibleTo(Json::booleanValue);
+}
+template <>
+bool asJsonType<bool>(const Json::Value& value) {
+  return value.asBool();
+}
+template <>
+bool isJsonType<int>(const Json::Value& value) {
+  return value.isConvertibleTo(Json::intValue);
+}
+template <>
+int asJsonType<int>(const Json::Value& value) {
+  return value.asInt();
+}
+template <>
+bool isJsonType<unsigned int>(const Json::Value& value) {
+  return value.isConvertibleTo(Json::uintValue);
+}
+template <>
+unsigned int asJsonType<unsigned int>(const Json::Value& value) {
+  return value.asUInt();
+}
+template <>
+bool isJsonType<long>(const Json::Value& value) {
+  // Asking for the stored type alone would let a number over INT64_MAX through to a throwing read.
+  return (value.type() == Json::intValue || value.type() == Json::uintValue) && value.isInt64();
+}
+template <>
+long asJsonType<long>(const Json::Value& value) {
+  return static_cast<long>(value.asInt64());
+}
+template <>
+bool isJsonType<double>(const Json::Value& value) {
+  return value.isConvertibleTo(Json::realValue);
+}
+template <>
+double asJsonType<double>(const Json::Value& value) {
+  return value.asDouble();
+}
+
+template <typename T>
+void GetJsonValue(T& out, const Json::Value& object, const std::string& key, bool required) {
+  VEXLO_CHECK(!object.isObject(), ERR_BAD_PARAMETER, "Not an object" + AppendData(object));
+  const Json::Value* member = object.find(key.data(), key.data() + key.size());
+  if (!required && member == nullptr) {
+    return;
+  }
+  VEXLO_CHECK(!object.isMember(key), ERR_BAD_PARAMETER,
+              "Missing property: " + key + AppendData(object));
+  if constexpr (std::is_same_v<T, Json::Value>) {
+    out = *member;
+  } else {
+    const bool readable = isJsonType<T>(*member);
+    if (!required && !readable) {
+      return;
+    }
+    VEXLO_CHECK(!readable, ERR_BAD_PARAMETER, "Not a string" + AppendData(object));
+    out = asJsonType<T>(*member);
+  }
+}
+
+template void GetJsonValue<std::string>(std::string&, const Json::Value&, const std::string&, bool);
+template void GetJsonValue<bool>(bool&, const Json::Value&, const std::string&, bool);
+template void GetJsonValue<int>(int&, const Json::Value&, const std::string&, bool);
+template void GetJsonValue<unsigned int>(unsigned int&, const Json::Value&, const std::string&,
+                                         bool);
+template void GetJsonValue<long>(long&, const Json::Value&, const std::string&, bool);
+template void GetJsonValue<double>(double&, const Json::Value&, const std::string&, bool);
+template void GetJsonValue<Json::Value>(Json::Value&, const Json::Value&, const std::string&, bool);
+
+void JsonApplyChanges(Json::Value& target, const Json::Value& changes) {
+  if (target.isNull()) {
+    target = Json::objectValue;
+  }
+  VEXLO_CHECK(!target.isObject(), ERR_BAD_PARAMETER, "Not an object" + AppendData(target));
+  if (changes.isNull()) {
+    return;
+  }
+  VEXLO_CHECK(!changes.isObject(), ERR_BAD_PARAMETER, "Not an object" + AppendData(changes));
+  for (auto change = changes.begin(); change != changes.end(); ++change) {
+    const std::string name = change.name();
+    if (change->isNull()) {
+      target.removeMember(name);
+    } else if (change->isObject()) {
+      Json::Value& member = target[name];
+      if (!member.isObject()) {
+        member = Json::objectValue;
+      }
+      JsonApplyChanges(member, *change);
+    } else {
+      target[name] = *change;
+    }
+  }
+}
+
+std::string AppendData(const Json::Value& value) { return ", data=" + JsonToStyledString(value); }
+
+template <>
+Json::Value Vec2JsonArr<std::string>(const std::vector<std::string>& values) {
+  Json::Value array(Json::arrayValue);
+  for (const std::string& value : values) {
+    array.append(value);
+  }
+  return array;
+}
+
+template <>
+std::vector<std::string> JsonArr2Vec<std::string>(const Json::Value& array) {
+  VEXLO_CHECK(!array.isArray() && !array.isNull(), ERR_BAD_PARAMETER,
+              "Not an array" + AppendData(array));
+  std::vector<std::string> values;
+  values.reserve(array.size());
+  for (const Json::Value& element : array) {
+    VEXLO_CHECK(!isJsonType<std::string>(element), ERR_BAD_PARAMETER,
+                "Not a string" + AppendData(array));
+    values.push_back(element.asString());
+  }
+  return values;
+}
+
+}  // namespace vexlo

@@ -1,0 +1,99 @@
+#include "common/lock.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <random>
+
+#include "common/check.h"
+#include "common/error.h"
+
+namespace vexlo {
+namespace {
+
+constexpr int kMaxAttempts = 64;
+constexpr useconds_t kPauseStepMicroseconds = 100000;
+
+// Not rand(): unseeded, every process would draw the same pauses and collide again in step.
+useconds_t RandomPause() {
+  thread_local std::minstd_rand generator{std::random_device{}()};
+  return static_cast<useconds_t>(generator() % 10) * kPauseStepMicroseconds;
+}
+
+// Opening without O_CREAT first: with fs.protected_regular set, the kernel refuses even root an
+// O_CREAT on another user's file in a sticky directory such as /tmp.
+int OpenLockFile(const char* path) {
+  // O_NONBLOCK keeps a FIFO planted at the path from holding us up; it means nothing to a file.
+  constexpr int kFlags = O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK;
+  const int fd = open(path, kFlags);
+  return fd < 0 && errno == ENOENT ? open(path, kFlags | O_CREAT, 0644) : fd;
+}
+
+bool IsStillAt(int fd, const char* path) {
+  struct stat held {};
+  struct stat named {};
+  return fstat(fd, &held) == 0 && lstat(path, &named) == 0 && held.st_dev == named.st_dev &&
+         held.st_ino == named.st_ino;
+}
+
+}  // namespace
+
+Mutex::Mutex() : mutex_() { pthread_mutex_init(&mutex_, nullptr); }
+
+Mutex::~Mutex() { pthread_mutex_destroy(&mutex_); }
+
+bool Mutex::Lock() { return pthread_mutex_lock(&mutex_) == 0; }
+
+bool Mutex::TryLock() { return pthread_mutex_trylock(&mutex_) == 0; }
+
+bool Mutex::Unlock() { return pthread_mutex_unlock(&mutex_) == 0; }
+
+LockMutex::LockMutex(Mutex& mutex) : mutex_(mutex) {
+  if (!mutex_.Lock()) {
+    LogFailure({VEXLO_SOURCE, __LINE__, __func__, "!mutex_.Lock()"}, errno);
+  }
+}
+
+LockMutex::~LockMutex() {
+  if (!mutex_.Unlock()) {
+    LogFailure({VEXLO_SOURCE, __LINE__, __func__, "!mutex_.Unlock()"}, errno);
+  }
+}
+
+LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(path) {
+  for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
+    fd_ = OpenLockFile(path_.c_str());
+    VEXLO_CHECK_AT((LogSite{VEXLO_SOURCE, __LINE__, __func__,
+                            "0 > (fd_ = open(path_.c_str(), O_RDONLY | O_CREAT, 0644))"}),
+                   0 > fd_, ERR_LOCK, "open failed, path=" + path_ + ", reason=" + strerror(errno));
+    const bool locked = flock(fd_, (exclusive ? LOCK_EX : LOCK_SH) | LOCK_NB) == 0;
+    if (locked && IsStillAt(fd_, path_.c_str())) {
+      return;
+    }
+    const int error = errno;
+    close(fd_);  // The destructor does not run when a constructor throws.
+    fd_ = -1;
+    if (locked) {
+      continue;  // The path names another file by now: nothing to wait for.
+    }
+    if (error != EINTR && error != EAGAIN) {
+      errno = error;
+      throw Error(ERR_LOCK, strerror(error));
+    }
+    usleep(RandomPause());
+  }
+  throw Error(ERR_LOCK, "Exceed max retry, path=" + path_);
+}
+
+LockFile::~LockFile() {
+  if (fd_ >= 0) {
+    flock(fd_, LOCK_UN);
+    close(fd_);
+  }
+}
+
+}  // namespace vexlo

@@ -1,0 +1,10 @@
+#include "common/sdk/mutex.h"
+
+namespace vexlo::sdk {
+
+Mutex& SDKMutex() {
+  static Mutex mutex;
+  return mutex;
+}
+
+}  // namespace vexlo::sdk

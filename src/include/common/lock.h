@@ -1,0 +1,66 @@
+// A mutex for one process, and a lock file between processes.
+#ifndef COMMON_LOCK_H_
+#define COMMON_LOCK_H_
+
+#include <pthread.h>
+
+#include <string>
+
+#include "common/export.h"
+
+namespace vexlo {
+
+// One non-recursive POSIX mutex. The calls return true when the POSIX call returned 0.
+class VEXLO_EXPORT Mutex {
+ public:
+  Mutex();
+  ~Mutex();
+  Mutex(const Mutex&) = delete;
+  Mutex& operator=(const Mutex&) = delete;
+
+  bool Lock();
+  bool TryLock();
+  bool Unlock();
+
+ private:
+  pthread_mutex_t mutex_;
+};
+
+// Holds a Mutex for a scope. A failure to lock or unlock is logged and the caller goes on: a
+// destructor must not throw, and both ends behave alike.
+class VEXLO_EXPORT LockMutex {
+ public:
+  explicit LockMutex(Mutex& mutex);
+  ~LockMutex();
+  LockMutex(const LockMutex&) = delete;
+  LockMutex& operator=(const LockMutex&) = delete;
+
+ private:
+  Mutex& mutex_;
+};
+
+// Holds an flock on a file for a scope; the file is made when it is missing. The lock belongs to
+// the file that the path names: when the path has moved on to another file between open and lock (a
+// queue is renamed to its snapshot), the lock is given up and taken anew on the file that stands
+// there now, so two holders never coexist.
+//
+// Two LockFiles on one path exclude each other within a process too: never nest them. A LockFile is
+// not shared between threads, and its descriptor is not inherited by programs that are started.
+class VEXLO_EXPORT LockFile {
+ public:
+  // Tries up to 64 times with pauses of 0 to 0.9 s (about 29 s on average), shared unless
+  // `exclusive`. Throws Error 506 when the path cannot be opened (a symbolic link is refused) or
+  // locked, or the tries are used up.
+  LockFile(const std::string& path, bool exclusive);
+  ~LockFile();
+  LockFile(const LockFile&) = delete;
+  LockFile& operator=(const LockFile&) = delete;
+
+ private:
+  int fd_;
+  std::string path_;
+};
+
+}  // namespace vexlo
+
+#endif  // COMMON_LOCK_H_

@@ -1,0 +1,120 @@
+#include "common/lock.h"
+
+#include <gtest/gtest.h>
+#include <sys/file.h>
+
+#include <functional>
+#include <memory>
+#include <vector>
+
+#include "common/error.h"
+#include "support/faults.h"
+#include "support/syslog_capture.h"
+#include "support/temp_folder.h"
+
+// Pauses are noted and not made.
+std::vector<useconds_t> pauses;
+std::function<void()> before_pause = [] {};
+std::function<void()> before_flock = [] {};
+
+INTERPOSED int usleep(useconds_t microseconds) {
+  pauses.push_back(microseconds);
+  std::exchange(before_pause, [] {})();
+  return 0;
+}
+
+INTERPOSED int flock(int fd, int operation) noexcept {
+  static const auto real = REAL_FUNCTION(int, flock, (int, int));
+  std::exchange(before_flock, [] {})();
+  return ScopedFault::Fires("flock") ? -1 : real(fd, operation);
+}
+
+FAULTABLE(int, pthread_mutex_unlock, (pthread_mutex_t * mutex) noexcept, (mutex))
+
+namespace vexlo {
+
+const TempFolder kFolder;
+const std::string kPath = kFolder / "lock";
+
+// What the lock throws, or "".
+std::string Failure(const std::string& file, bool exclusive) {
+  try {
+    const LockFile lock(file, exclusive);
+    return "";
+  } catch (const Error& error) {
+    EXPECT_EQ(error.GetErrorCode(), ERR_LOCK);
+    return error.what();
+  }
+}
+
+TEST(Lock, AMutexIsHeldByOneAndAFailureToGiveItBackIsLogged) {
+  Mutex mutex;
+  SyslogCapture log;
+  for (const bool fails : {false, true}) {
+    {
+      const ScopedFault fault(fails ? "pthread_mutex_unlock" : "", EPERM);
+      const LockMutex lock(mutex);
+      EXPECT_FALSE(mutex.TryLock());
+    }
+    EXPECT_EQ(log.Take().size(), fails ? 1U : 0U);
+  }
+  EXPECT_TRUE(mutex.Unlock());
+}
+
+TEST(Lock, SharedOnesCoexistAndAnExclusiveOneWaitsForAll) {
+  pauses.clear();
+  auto first = std::make_unique<LockFile>(kPath, /*exclusive=*/false);
+  auto second = std::make_unique<LockFile>(kPath, /*exclusive=*/false);
+  EXPECT_TRUE(pauses.empty());
+  const int next_fd = dup(0);
+  close(next_fd);
+  EXPECT_EQ(Failure(kPath, /*exclusive=*/true), "Exceed max retry, path=" + kPath);
+  EXPECT_EQ(pauses.size(), 64U);
+  for (const useconds_t pause : pauses) {
+    EXPECT_TRUE(pause <= 900000 && pause % 100000 == 0) << pause;
+  }
+  EXPECT_GT(std::set(pauses.begin(), pauses.end()).size(), 4U) << "the pauses do not vary";
+  EXPECT_EQ(dup(0), next_fd) << "descriptors are left open";
+  close(next_fd);
+  before_pause = [&] {
+    first.reset();
+    before_pause = [&second] { second.reset(); };
+  };
+  const LockFile exclusive(kPath, /*exclusive=*/true);
+  EXPECT_EQ(pauses.size(), 66U);
+}
+
+TEST(Lock, WhatCannotBeOpenedOrLockedFailsAtOnce) {
+  pauses.clear();
+  ASSERT_EQ(symlink((kFolder / "victim").c_str(), (kFolder / "link").c_str()), 0);
+  ASSERT_EQ(mkfifo((kFolder / "fifo").c_str(), 0644), 0);
+  EXPECT_EQ(Failure(kFolder / "no/lock", true),
+            "open failed, path=" + (kFolder / "no/lock") + ", reason=No such file or directory");
+  EXPECT_NE(Failure(kFolder / "link", true), "");
+  EXPECT_EQ(Failure(kFolder / "fifo", true), "") << "or waited for a writer";
+  const ScopedFault fault("flock", ENOLCK);
+  EXPECT_EQ(Failure(kPath, true), "No locks available");
+  EXPECT_TRUE(pauses.empty());
+  EXPECT_FALSE(kFolder.Names().contains("victim"));
+}
+
+TEST(Lock, LocksTheFileThatThePathNamesNow) {
+  pauses.clear();
+  const std::vector<std::function<void()>> moves = {
+      [&] { rename(kPath.c_str(), (kFolder / "snapshot").c_str()); },
+      [&] { rename((kFolder / "new").c_str(), kPath.c_str()); },
+      [&] { unlink(kPath.c_str()); },
+  };
+  for (const auto& move : moves) {
+    WriteText(kPath, "");
+    WriteText(kFolder / "new", "");
+    before_flock = move;
+    const LockFile lock(kPath, /*exclusive=*/true);
+    EXPECT_TRUE(pauses.empty()) << "nobody to wait for";
+    EXPECT_NE(Failure(kPath, true), "") << "a second holder";
+    pauses.clear();
+  }
+  EXPECT_EQ(Failure(kFolder / "snapshot", true), "");
+}
+
+}  // namespace vexlo

@@ -1,0 +1,62 @@
+#include "cli/text.h"
+
+#include <filesystem>
+
+namespace vexlo::cli {
+
+std::vector<std::string> Split(std::string_view text, char separator) {
+  std::vector<std::string> parts;
+  while (true) {
+    const size_t end = text.find(separator);
+    parts.emplace_back(text.substr(0, end));
+    if (end == std::string_view::npos) {
+      return parts;
+    }
+    text.remove_prefix(end + 1);
+  }
+}
+
+std::string Grouped(uint64_t number) {
+  std::string text = std::to_string(number);
+  for (size_t at = text.size(); at > 3;) {
+    at -= 3;
+    text.insert(at, ",");
+  }
+  return text;
+}
+
+std::string Counted(uint64_t number, std::string_view noun) {
+  std::string text = Grouped(number) + " ";
+  text += noun;
+  return number == 1 ? text : text + "s";
+}
+
+std::string ForTerminal(std::string_view text) {
+  std::string shown;
+  for (const char c : text) {
+    const auto byte = static_cast<unsigned char>(c);
+    if (byte >= 0x20 && byte != 0x7f) {
+      shown += c;
+    } else {
+      shown += {'\\', static_cast<char>('0' + (byte >> 6)),
+                static_cast<char>('0' + (byte >> 3 & 7)), static_cast<char>('0' + (byte & 7))};
+    }
+  }
+  return shown;
+}
+
+std::string CauseOf(std::string_view reason) {
+  constexpr std::string_view kMark = "reason=";
+  const size_t at = reason.rfind(kMark);
+  return std::string(at == std::string_view::npos ? reason : reason.substr(at + kMark.size()));
+}
+
+std::string AbsolutePath(const std::string& path) {
+  std::string absolute = std::filesystem::absolute(path).lexically_normal().string();
+  if (absolute.size() > 1 && absolute.back() == '/') {
+    absolute.pop_back();
+  }
+  return absolute;
+}
+
+}  // namespace vexlo::cli

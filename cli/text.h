@@ -1,0 +1,32 @@
+// Texts for people.
+#ifndef CLI_TEXT_H_
+#define CLI_TEXT_H_
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace vexlo::cli {
+
+std::vector<std::string> Split(std::string_view text, char separator);
+
+// 1234567 as "1,234,567".
+std::string Grouped(uint64_t number);
+
+// "1 line", "2,000 lines".
+std::string Counted(uint64_t number, std::string_view noun);
+
+// Control characters as "\012", so that a file name cannot drive the terminal; the rest as it is.
+std::string ForTerminal(std::string_view text);
+
+// What a library reason says of the system's error: the text behind its last "reason=", or all.
+std::string CauseOf(std::string_view reason);
+
+// The argument as an absolute path without ".", ".." and doubled or trailing slashes. Works on the
+// text alone: nothing needs to exist.
+std::string AbsolutePath(const std::string& path);
+
+}  // namespace vexlo::cli
+
+#endif  // CLI_TEXT_H_

@@ -1,0 +1,10 @@
+# fileindex::fileindex; and fileindex::kavoplatform where the local platform was built along with it.
+include(CMakeFindDependencyMacro)
+find_dependency(PkgConfig)
+pkg_check_modules(JSONCPP QUIET IMPORTED_TARGET jsoncpp)
+if(NOT JSONCPP_FOUND)
+  set(fileindex_FOUND FALSE)
+  set(fileindex_NOT_FOUND_MESSAGE "fileindex needs jsoncpp, and pkg-config does not find it")
+  return()
+endif()
+include(${CMAKE_CURRENT_LIST_DIR}/fileindexTargets.cmake)

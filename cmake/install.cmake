@@ -1,0 +1,59 @@
+# What is installed. The tree may be moved as a whole afterwards: everything in it finds the rest from
+# where it stands itself.
+include(CMakePackageConfigHelpers)
+
+set(fileindex_headers ${CMAKE_INSTALL_INCLUDEDIR}/vexlo)
+set(fileindex_package ${CMAKE_INSTALL_LIBDIR}/cmake/fileindex)
+
+# fileindex_install_headers(FOLDER SUBFOLDER): the headers below FOLDER/SUBFOLDER, at the path from
+# FOLDER that their includes are spelled with; without those whose first comment says "Not installed."
+function(fileindex_install_headers folder subfolder)
+  file(GLOB_RECURSE headers RELATIVE ${folder} CONFIGURE_DEPENDS ${folder}/${subfolder}/*.h)
+  foreach(header IN LISTS headers)
+    file(READ ${folder}/${header} text)
+    string(REGEX MATCH "^(//[^\n]*\n)+" comment "${text}")
+    string(FIND "${comment}" "Not installed." marked)
+    if(marked EQUAL -1)
+      get_filename_component(place ${header} DIRECTORY)
+      install(FILES ${folder}/${header} DESTINATION ${fileindex_headers}/${place})
+    endif()
+  endforeach()
+endfunction()
+
+fileindex_install_headers(${CMAKE_SOURCE_DIR}/src/include common)
+fileindex_install_headers(${CMAKE_SOURCE_DIR}/src fileindex)
+
+set(fileindex_libraries fileindex)
+if(TARGET kavoplatform)
+  fileindex_install_headers(${CMAKE_SOURCE_DIR}/platform/include kavo)
+  list(APPEND fileindex_libraries kavoplatform)
+  # An exported target must not name the source tree.
+  set_property(TARGET kavoplatform PROPERTY INTERFACE_INCLUDE_DIRECTORIES
+    $<BUILD_INTERFACE:${CMAKE_SOURCE_DIR}/platform/include>
+    $<INSTALL_INTERFACE:${fileindex_headers}>)
+endif()
+
+file(RELATIVE_PATH fileindex_bin_to_lib
+  ${CMAKE_INSTALL_FULL_BINDIR} ${CMAKE_INSTALL_FULL_LIBDIR})
+set_property(TARGET ${fileindex_libraries} PROPERTY INSTALL_RPATH "$ORIGIN")
+set_property(TARGET fileindex_cli PROPERTY INSTALL_RPATH "$ORIGIN/${fileindex_bin_to_lib}")
+
+install(TARGETS ${fileindex_libraries} EXPORT fileindexTargets
+  LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
+install(TARGETS fileindex_cli RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+install(EXPORT fileindexTargets NAMESPACE fileindex:: DESTINATION ${fileindex_package})
+
+write_basic_package_version_file(${CMAKE_BINARY_DIR}/fileindexConfigVersion.cmake
+  COMPATIBILITY SameMinorVersion)
+install(FILES
+  ${CMAKE_SOURCE_DIR}/cmake/fileindexConfig.cmake
+  ${CMAKE_BINARY_DIR}/fileindexConfigVersion.cmake
+  DESTINATION ${fileindex_package})
+
+file(RELATIVE_PATH FILEINDEX_PC_TO_PREFIX
+  ${CMAKE_INSTALL_FULL_LIBDIR}/pkgconfig ${CMAKE_INSTALL_PREFIX})
+configure_file(${CMAKE_SOURCE_DIR}/cmake/fileindex.pc.in ${CMAKE_BINARY_DIR}/fileindex.pc @ONLY)
+install(FILES ${CMAKE_BINARY_DIR}/fileindex.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
+
+install(FILES ${CMAKE_SOURCE_DIR}/README.md ${CMAKE_SOURCE_DIR}/LICENSE
+  DESTINATION ${CMAKE_INSTALL_DOCDIR})

@@ -260,6 +260,10 @@ class Session {
   }
 
   void Summarise() {
+    if (events_ == 0 && writer_.GetCount() == 0) {
+      console_.err << "no changes seen\n";
+      return;
+    }
     char factor[32];
     (void)snprintf(factor, sizeof(factor), "%.1f",
                    static_cast<double>(events_) /

@@ -96,7 +96,8 @@ void FolderRename(int64_t lines, const Sink& sink) {
   constexpr int64_t kRenames = 10;
   for (int64_t i = 0; i < lines; ++i) {
     const int64_t step = i % (kFiles + kRenames);
-    const std::string folder = "/volume1/work/job-" + std::to_string(i / (kFiles + kRenames)) + "-";
+    const std::string folder =
+        "/volume1/projects/job-" + std::to_string(i / (kFiles + kRenames)) + "-";
     if (step < kFiles) {
       sink(Line(0x40, folder + "0/part-" + std::to_string(step)));
     } else {

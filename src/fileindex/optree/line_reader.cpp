@@ -17,15 +17,17 @@ constexpr size_t kFirstBufferBytes = size_t{256} * 1024;
 
 }  // namespace
 
-// O_NONBLOCK means nothing to a file and keeps a FIFO at the path from holding the caller up.
+// O_NONBLOCK means nothing to a file and keeps a FIFO at the path from holding the caller up. What
+// can be read only once is refused: a queue may have to be read again from its start.
 LineReader::LineReader(const std::string& path)
     : fd_(open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK)) {
   struct stat info {};
   if (fd_ < 0) {
     return;
   }
-  if (fstat(fd_, &info) != 0 || S_ISDIR(info.st_mode)) {
-    const int error = S_ISDIR(info.st_mode) ? EISDIR : errno;
+  const bool known = fstat(fd_, &info) == 0;
+  if (!known || S_ISDIR(info.st_mode) || S_ISFIFO(info.st_mode)) {
+    const int error = !known ? errno : S_ISDIR(info.st_mode) ? EISDIR : ENOTSUP;
     close(fd_);
     fd_ = -1;
     errno = error;

@@ -21,7 +21,8 @@ struct QueueLine {
 // line over kMaxQueueLineBytes is read past without being kept.
 class LineReader {
  public:
-  // Opens the file; IsOpen() is false and errno is set when that fails, also for a folder.
+  // Opens the file; IsOpen() is false and errno is set when that fails, also for a folder or a
+  // FIFO.
   explicit LineReader(const std::string& path);
   ~LineReader();
   LineReader(const LineReader&) = delete;

@@ -41,65 +41,43 @@ struct OPTree::Rule {
   enum : uint8_t { kKeepData, kSetData, kMergeData } data = kKeepData;
 };
 
-// By handler, then by the pending operation's kind. The asymmetries are meant: a delete stands
-// behind a folder update or a reindex, since the folder may be gone before those are done; a create
-// revives a pending delete, while a modify that was seen late does not.
+namespace {
+
+// Four letters each, so that the columns of the table stand below each other.
+constexpr FileIndexOP kNone = OP_NONE;
+constexpr FileIndexOP kDele = OP_DELETE;
+constexpr FileIndexOP kUpse = OP_UPSERT;
+constexpr FileIndexOP kAttr = OP_ATTR;
+constexpr FileIndexOP kFold = OP_UPDATE_DIRECTORY;
+constexpr FileIndexOP kRena = OP_RENAME;
+constexpr FileIndexOP kRein = OP_REINDEX;
+constexpr FileIndexOP kCras = OP_QUEUE_CRASHED;
+constexpr bool kKeep = false;
+constexpr bool kDrop = true;
+
+}  // namespace
+
+// A row a handler, a column a pending operation's kind: what that becomes, and whether the new one
+// is kept or dropped. The asymmetries are meant: a delete stands behind a folder update or a
+// reindex, since the folder may be gone before those are done; a create revives a pending delete,
+// while a modify that was seen late does not.
+// clang-format off
 const OPTree::Rule OPTree::kRules[6][8] = {
-    /* create */
-    {{OP_NONE, false},
-     {OP_UPSERT, true},
-     {OP_UPSERT, true},
-     {OP_UPSERT, true},
-     {OP_UPDATE_DIRECTORY, true},
-     {OP_RENAME, false},
-     {OP_REINDEX, true},
-     {OP_QUEUE_CRASHED, false}},
-    /* modify and close-write */
-    {{OP_NONE, false},
-     {OP_DELETE, true},
-     {OP_UPSERT, true},
-     {OP_UPSERT, true},
-     {OP_UPDATE_DIRECTORY, true},
-     {OP_RENAME, false},
-     {OP_REINDEX, true},
-     {OP_QUEUE_CRASHED, false}},
-    /* attr */
-    {{OP_NONE, false},
-     {OP_DELETE, true},
-     {OP_UPSERT, true},
-     {OP_ATTR, true},
-     {OP_UPDATE_DIRECTORY, true},
-     {OP_RENAME, false},
-     {OP_REINDEX, true},
-     {OP_QUEUE_CRASHED, false}},
-    /* delete */
-    {{OP_NONE, false},
-     {OP_DELETE, true},
-     {OP_DELETE, true},
-     {OP_DELETE, true},
-     {OP_UPDATE_DIRECTORY, false},
-     {OP_RENAME, false},
-     {OP_REINDEX, false},
-     {OP_QUEUE_CRASHED, false}},
-    /* reindex */
-    {{OP_NONE, false},
-     {OP_DELETE, true},
-     {OP_REINDEX, true},
-     {OP_REINDEX, true},
-     {OP_REINDEX, true},
-     {OP_RENAME, false},
-     {OP_REINDEX, true},
-     {OP_QUEUE_CRASHED, false}},
-    /* update directory */
-    {{OP_NONE, false},
-     {OP_DELETE, true},
-     {OP_UPDATE_DIRECTORY, true, Rule::kSetData},
-     {OP_UPDATE_DIRECTORY, true, Rule::kSetData},
-     {OP_UPDATE_DIRECTORY, true, Rule::kMergeData},
-     {OP_RENAME, false},
-     {OP_REINDEX, true},
-     {OP_QUEUE_CRASHED, false}},
+    /* create */ {{kNone, kKeep}, {kUpse, kDrop}, {kUpse, kDrop}, {kUpse, kDrop},
+                  {kFold, kDrop}, {kRena, kKeep}, {kRein, kDrop}, {kCras, kKeep}},
+    /* modify */ {{kNone, kKeep}, {kDele, kDrop}, {kUpse, kDrop}, {kUpse, kDrop},
+                  {kFold, kDrop}, {kRena, kKeep}, {kRein, kDrop}, {kCras, kKeep}},
+    /* attr   */ {{kNone, kKeep}, {kDele, kDrop}, {kUpse, kDrop}, {kAttr, kDrop},
+                  {kFold, kDrop}, {kRena, kKeep}, {kRein, kDrop}, {kCras, kKeep}},
+    /* delete */ {{kNone, kKeep}, {kDele, kDrop}, {kDele, kDrop}, {kDele, kDrop},
+                  {kFold, kKeep}, {kRena, kKeep}, {kRein, kKeep}, {kCras, kKeep}},
+    /* reindex*/ {{kNone, kKeep}, {kDele, kDrop}, {kRein, kDrop}, {kRein, kDrop},
+                  {kRein, kDrop}, {kRena, kKeep}, {kRein, kDrop}, {kCras, kKeep}},
+    /* folder */ {{kNone, kKeep}, {kDele, kDrop},
+                  {kFold, kDrop, Rule::kSetData}, {kFold, kDrop, Rule::kSetData},
+                  {kFold, kDrop, Rule::kMergeData}, {kRena, kKeep}, {kRein, kDrop}, {kCras, kKeep}},
 };
+// clang-format on
 
 namespace {
 

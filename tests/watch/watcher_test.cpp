@@ -182,6 +182,18 @@ TEST_F(WatcherTest, RootThatGoesAndComesBack) {
   }
 }
 
+TEST_F(WatcherTest, AnotherFolderInARootsPlaceIsANewOne) {
+  Clear();
+  Do("mkdir -p r/d");
+  Start({in_ + "/r"});
+  Do("mv r ../out; mkdir -p r/e");
+  Take();
+  Take(kRescan);
+  EXPECT_TRUE(watcher_->State().live);
+  Do("touch r/e/new ../out/r/d/elsewhere");
+  EXPECT_EQ(Text(Take()).substr(0, 14), "create r/e/new");
+}
+
 TEST(QueueLineTest, EveryByteOfANameComesBack) {
   EXPECT_EQ(QueueLine({kMaskRename, true, "/b", "/a"}),
             R"({"event":256,"is_dir":true,"path":"/b","path_old":"/a","data":null})"

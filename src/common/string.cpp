@@ -1,7 +1,6 @@
 #include "common/string.h"
 
 #include <algorithm>
-#include <string_view>
 
 namespace vexlo {
 namespace {
@@ -14,6 +13,10 @@ char AsciiLower(char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A
 
 bool StringStartWith(const std::string& str, const std::string& prefix) {
   return str.starts_with(prefix);
+}
+
+bool IsSameOrBelow(std::string_view path, std::string_view folder) {
+  return path.starts_with(folder) && (path.size() == folder.size() || path[folder.size()] == '/');
 }
 
 std::string Basename(const std::string& path) {

@@ -5,12 +5,12 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
-#include <string_view>
 
 #include "common/check.h"
 #include "common/file.h"
 #include "common/json.h"
 #include "common/lock.h"
+#include "common/string.h"
 #include "fileindex/optree/line_parser.h"
 #include "fileindex/optree/line_reader.h"
 
@@ -19,11 +19,6 @@ namespace {
 
 constexpr int kTornLineTries = 10;
 constexpr useconds_t kTornLinePauseMicroseconds = 10000;
-
-// Whether `path` is `folder` or lies below it.
-bool IsCoveredBy(std::string_view path, std::string_view folder) {
-  return path.starts_with(folder) && (path.size() == folder.size() || path[folder.size()] == '/');
-}
 
 bool IsWhole(const QueueLine& line) {
   EventView event;
@@ -119,14 +114,14 @@ int QueueMgr::ProcessOP(std::function<void(std::shared_ptr<OP>)> callback, bool 
 
 bool QueueMgr::IsFullPathProcessing(const std::string& full_path) {
   const auto concerns = [&full_path](const EventView& event) {
-    return IsCoveredBy(event.path, full_path) || IsCoveredBy(event.path_old, full_path);
+    return IsSameOrBelow(event.path, full_path) || IsSameOrBelow(event.path_old, full_path);
   };
   return ScanQueue(queue_path_, concerns) || ScanQueue(queue_path_tmp_, concerns);
 }
 
 bool QueueMgr::IsFullPathHasReindex(const std::string& full_path) {
   const auto reindexes = [&full_path](const EventView& event) {
-    return event.event == EV_REINDEX && IsCoveredBy(full_path, event.path);
+    return event.event == EV_REINDEX && IsSameOrBelow(full_path, event.path);
   };
   return ScanQueue(queue_path_, reindexes) || ScanQueue(queue_path_tmp_, reindexes);
 }

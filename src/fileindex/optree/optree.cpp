@@ -7,6 +7,7 @@
 #include <utility>
 
 #include "common/check.h"
+#include "common/string.h"
 #include "fileindex/optree/child_index.h"
 #include "fileindex/optree/line_parser.h"
 #include "fileindex/optree/line_reader.h"
@@ -23,9 +24,8 @@ constexpr uint64_t kMostOverlappingBytes = uint64_t{4} * 1024 * 1024;
 // A kind that no rule looks at or changes.
 bool IsSettled(FileIndexOP op) { return op == OP_NONE || op == OP_RENAME; }
 
-bool IsSameOrBelow(std::string_view path, std::string_view folder) {
-  return path.starts_with(folder) && (path.size() == folder.size() || path[folder.size()] == '/');
-}
+// Cancelled operations do not matter, and a delete stays with the old path.
+bool MovesWithItsFolder(const OP& op) { return op.op >= OP_UPSERT; }
 
 const Json::Value& NullData() {
   static const Json::Value null;
@@ -444,20 +444,21 @@ bool OPTree::ApplyRules(Handler handler, OPNode& node, const Json::Value& data, 
 }
 
 void OPTree::CancelBelow(OPNode& node) {
-  std::vector<OPNode*> marked;
-  const auto cancel = [&marked](OPNode& child) {
-    for (size_t i = child.settled_ops_; i < child.ops.size(); ++i) {
-      if (child.ops[i]->op != OP_RENAME) {
-        child.ops[i]->op = OP_NONE;
-      }
-    }
-    marked.push_back(&child);
-  };
-  TakeMarkedChildren(node, kCancellable, cancel);
+  if (node.children.empty()) {
+    return;
+  }
+  std::vector<OPNode*> marked = {&node};
   while (!marked.empty()) {
-    OPNode& child = *marked.back();
+    OPNode& parent = *marked.back();
     marked.pop_back();
-    TakeMarkedChildren(child, kCancellable, cancel);
+    TakeMarkedChildren(parent, kCancellable, [&marked](OPNode& child) {
+      for (size_t i = child.settled_ops_; i < child.ops.size(); ++i) {
+        if (child.ops[i]->op != OP_RENAME) {
+          child.ops[i]->op = OP_NONE;
+        }
+      }
+      marked.push_back(&child);
+    });
   }
 }
 
@@ -491,7 +492,9 @@ void OPTree::Rename(OPNode& node, std::string_view new_path, const std::shared_p
   if (may_trade && TradePlaces(source, node)) {
     moved = &source;
     op->node = moved->weak_from_this();
-    LeaveBehind(*moved, node);
+    // A pending delete stays with the old path.
+    MoveMarkedBelow(*moved, node, kStaying,
+                    [](const OP& pending) { return pending.op == OP_DELETE; });
   } else {
     if (&source != &node) {
       MoveOps(source, node, [](const OP&) { return true; });
@@ -499,7 +502,7 @@ void OPTree::Rename(OPNode& node, std::string_view new_path, const std::shared_p
     if (literal_) {
       MoveAllBelow(source, old_path, new_path, overlapping);
     } else {
-      MoveMarkedBelow(source, node);
+      MoveMarkedBelow(source, node, kMovable, MovesWithItsFolder);
     }
   }
   Add(op);  // To its node, which the moves may have changed.
@@ -545,39 +548,22 @@ bool OPTree::TradePlaces(OPNode& source, OPNode& target) {
   return true;
 }
 
-// A pending delete stays with the old path when a folder above is renamed.
-void OPTree::LeaveBehind(OPNode& moved, OPNode& old_place) {
-  std::vector<std::pair<OPNode*, OPNode*>> marked;
-  const auto leave_children = [&marked](OPNode& parent, OPNode& old_parent) {
-    TakeMarkedChildren(parent, kStaying, [&](OPNode& child) {
-      OPNode& old_child = old_parent.FindOrAddChild(child.name);
-      MoveOps(child, old_child, [](const OP& op) { return op.op == OP_DELETE; });
-      marked.emplace_back(&child, &old_child);
-    });
-  };
-  leave_children(moved, old_place);
-  while (!marked.empty()) {
-    const auto [child, old_child] = marked.back();
-    marked.pop_back();
-    leave_children(*child, *old_child);
+// Moves, below `from`, the operations for which `which` holds to the nodes of the same names below
+// `to`, which are made only where something moves there.
+template <typename Which>
+void OPTree::MoveMarkedBelow(OPNode& from, OPNode& to, Mark mark, Which which) {
+  if (from.children.empty()) {
+    return;
   }
-}
-
-// Makes nodes at the new place only where something moves there.
-void OPTree::MoveMarkedBelow(OPNode& from, OPNode& to) {
-  std::vector<std::pair<OPNode*, OPNode*>> marked;
-  const auto move_children = [&marked](OPNode& parent_from, OPNode& parent_to) {
-    TakeMarkedChildren(parent_from, kMovable, [&](OPNode& child) {
-      OPNode& child_to = parent_to.FindOrAddChild(child.name);
-      MoveOps(child, child_to, [](const OP& op) { return op.op >= OP_UPSERT; });
+  std::vector<std::pair<OPNode*, OPNode*>> marked = {{&from, &to}};
+  while (!marked.empty()) {
+    const auto [node, node_to] = marked.back();
+    marked.pop_back();
+    TakeMarkedChildren(*node, mark, [&, target = node_to](OPNode& child) {
+      OPNode& child_to = target->FindOrAddChild(child.name);
+      MoveOps(child, child_to, which);
       marked.emplace_back(&child, &child_to);
     });
-  };
-  move_children(from, to);
-  while (!marked.empty()) {
-    const auto [child, child_to] = marked.back();
-    marked.pop_back();
-    move_children(*child, *child_to);
   }
 }
 
@@ -595,7 +581,7 @@ void OPTree::MoveAllBelow(OPNode& from, std::string_view old_path, std::string_v
         std::string path(new_path);
         path += std::string_view(node->GetPath()).substr(old_path.size());
         overlapping_bytes_ += overlapping ? path.size() : 0;
-        MoveOps(*node, FindNode(path), [](const OP& op) { return op.op >= OP_UPSERT; });
+        MoveOps(*node, FindNode(path), MovesWithItsFolder);
       },
       /*skip_self=*/true);
   if (overlapping && overlapping_bytes_ > kMostOverlappingBytes && !crashed) {

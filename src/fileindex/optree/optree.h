@@ -120,8 +120,8 @@ class VEXLO_EXPORT OPTree {
   void Rename(OPNode& node, std::string_view new_path, const std::shared_ptr<OP>& op,
               bool may_trade);
   static bool TradePlaces(OPNode& source, OPNode& target);
-  static void LeaveBehind(OPNode& moved, OPNode& old_place);
-  static void MoveMarkedBelow(OPNode& from, OPNode& to);
+  template <typename Which>
+  static void MoveMarkedBelow(OPNode& from, OPNode& to, Mark mark, Which which);
   void MoveAllBelow(OPNode& from, std::string_view old_path, std::string_view new_path,
                     bool overlapping);
   template <typename Which>

@@ -4,14 +4,18 @@
 #define COMMON_STRING_H_
 
 #include <string>
+#include <string_view>
 
 #include "common/export.h"
 
 namespace vexlo {
 
 // True when `str` begins with `prefix`; an empty prefix always matches. To ask whether a path lies
-// inside a folder, append "/" to both.
+// inside a folder, see IsSameOrBelow().
 VEXLO_EXPORT bool StringStartWith(const std::string& str, const std::string& prefix);
+
+// True when `path` is `folder` or lies below it: with "/" behind both, `folder` is a prefix.
+VEXLO_EXPORT bool IsSameOrBelow(std::string_view path, std::string_view folder);
 
 // What follows the last "/"; the whole path when it holds none. "/a/b/" gives "".
 VEXLO_EXPORT std::string Basename(const std::string& path);

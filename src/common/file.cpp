@@ -18,6 +18,7 @@
 #include "common/string.h"
 #include "kavo/acl.h"
 #include "kavo/file.h"
+#include "kavo/filesystem.h"
 #include "kavo/user.h"
 
 namespace vexlo {

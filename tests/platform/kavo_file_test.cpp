@@ -164,12 +164,3 @@ TEST(KAVOFileCopy, RefusesWhatItCannotCopyAndLosesNothing) {
   EXPECT_EQ(Copy("/proc/version", folder / "file", kCopy), 0);  // Has no size.
   EXPECT_EQ(ReadText(folder / "file"), ReadText("/proc/version"));
 }
-
-TEST(KAVOFSDirIsMntPoint, TellsMountPoints) {
-  const TempFolder folder;
-  ASSERT_EQ(symlink("/proc", (folder / "link").c_str()), 0);
-  EXPECT_EQ(KAVOFSDirIsMntPoint("/proc/"), 1);
-  EXPECT_EQ(KAVOFSDirIsMntPoint(folder.Path().c_str()), 0);
-  EXPECT_EQ(KAVOFSDirIsMntPoint((folder / "link").c_str()), 0);
-  EXPECT_EQ(KAVOFSDirIsMntPoint((folder / "missing").c_str()), -1);
-}

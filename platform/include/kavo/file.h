@@ -21,10 +21,6 @@ struct KAVO_FILE_COPY_ARGS {
 // call said.
 int KAVOFileCopy(const char* from, const char* to, const struct KAVO_FILE_COPY_ARGS* args);
 
-// 1 when a file system is mounted on the directory (a bind mount counts), 0 when none is, -1 with
-// errno when the path cannot be looked at. A symbolic link is looked at itself.
-int KAVOFSDirIsMntPoint(const char* path);
-
 #ifdef __cplusplus
 }  // extern "C"
 #endif

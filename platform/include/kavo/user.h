@@ -1,4 +1,4 @@
-// The platform's user records.
+// The platform's users and groups. Callers serialise the calls.
 #ifndef KAVO_USER_H_
 #define KAVO_USER_H_
 
@@ -14,12 +14,21 @@ struct KAVO_USER {
   gid_t gid;  // The primary group.
 };
 
-// Looks up a user by name. 0 and a record that the caller releases with KAVOUserFree, or -1 with
-// `*user` null when there is no such user or the look-up fails. Callers serialise the calls.
+// Looks up a user. 0 and a record that the caller releases with KAVOUserFree, or -1 with `*user`
+// null when there is no such user or the look-up fails.
 int KAVOUserGet(const char* name, struct KAVO_USER** user);
+int KAVOUserGetByUID(uid_t uid, struct KAVO_USER** user);
 
 // Releases a record; null is taken.
 void KAVOUserFree(struct KAVO_USER* user);
+
+// 1 when the user is one of the administrators, 0 when not, negative when there is no such user or
+// the groups cannot be told. `flags` is 0.
+int KLIBGroupIsAdminGroupMem(const char* user, int flags);
+
+// Sets `path` to the user's home directory. 0; negative with errno when there is no such user or
+// the buffer is too small.
+int KAVOServiceHomePathGet(const char* user, char* path, size_t bytes);
 
 #ifdef __cplusplus
 }  // extern "C"

@@ -1,136 +1,25 @@
 #include "kavo/acl.h"
 
-#include <acl/libacl.h>
-#include <sys/acl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
-#include <memory>
 #include <new>
-#include <type_traits>
 #include <vector>
+
+#include "platform/local/access.h"
+#include "platform/local/accounts.h"
 
 namespace {
 
-constexpr unsigned kRead = KAVO_ACL_READ;
-constexpr unsigned kWrite = KAVO_ACL_WRITE;
-constexpr unsigned kExecute = KAVO_ACL_EXECUTE;
-constexpr unsigned kAll = kRead | kWrite | kExecute;
-
-using Acl = std::unique_ptr<std::remove_pointer_t<acl_t>, decltype(&acl_free)>;
-
-// The effective group and the supplementary ones; false with errno when they cannot be told.
-bool GetGroups(std::vector<gid_t>& groups) {
-  while (true) {
-    const int count = getgroups(0, nullptr);
-    if (count < 0) {
-      return false;
-    }
-    groups.resize(static_cast<size_t>(count));
-    const int got = count == 0 ? 0 : getgroups(count, groups.data());
-    if (got >= 0) {
-      groups.resize(static_cast<size_t>(got));
-      groups.push_back(getegid());
-      return true;
-    }
-    if (errno != EINVAL) {  // EINVAL: the list has grown in between.
-      return false;
-    }
-  }
-}
-
-unsigned PermOf(acl_entry_t entry) {
-  acl_permset_t set = nullptr;
-  if (acl_get_permset(entry, &set) != 0) {
-    return 0;
-  }
-  unsigned perm = 0;
-  perm |= acl_get_perm(set, ACL_READ) == 1 ? kRead : 0;
-  perm |= acl_get_perm(set, ACL_WRITE) == 1 ? kWrite : 0;
-  perm |= acl_get_perm(set, ACL_EXECUTE) == 1 ? kExecute : 0;
-  return perm;
-}
-
-// The user or group (their ids are one type) that an entry names; -1, which no entry names, when it
-// cannot be told.
-id_t QualifierOf(acl_entry_t entry) {
-  const std::unique_ptr<void, decltype(&acl_free)> id(acl_get_qualifier(entry), &acl_free);
-  return id == nullptr ? static_cast<id_t>(-1) : *static_cast<const id_t*>(id.get());
-}
-
-// The rights of a user who does not own the file. A named user is looked for first; then every
-// group that matches adds its rights; only who matches nothing is "other". `groups` holds no -1.
-unsigned EvaluateAcl(acl_t acl, uid_t user, gid_t file_group, const std::vector<gid_t>& groups) {
-  const auto is_member = [&groups](gid_t group) {
-    return std::find(groups.begin(), groups.end(), group) != groups.end();
-  };
-  unsigned by_group = 0;
-  unsigned by_user = 0;
-  unsigned other = 0;
-  unsigned mask = kAll;
-  bool user_named = false;
-  bool group_matched = false;
-  acl_entry_t entry = nullptr;
-  for (int which = ACL_FIRST_ENTRY; acl_get_entry(acl, which, &entry) == 1;
-       which = ACL_NEXT_ENTRY) {
-    acl_tag_t tag = ACL_UNDEFINED_TAG;
-    acl_get_tag_type(entry, &tag);
-    const unsigned perm = PermOf(entry);
-    if (tag == ACL_MASK) {
-      mask = perm;
-    } else if (tag == ACL_OTHER) {
-      other = perm;
-    } else if (tag == ACL_USER && QualifierOf(entry) == user) {
-      user_named = true;
-      by_user = perm;
-    } else if ((tag == ACL_GROUP_OBJ && is_member(file_group)) ||
-               (tag == ACL_GROUP && is_member(QualifierOf(entry)))) {
-      group_matched = true;
-      by_group |= perm;
-    }
-  }
-  if (user_named) {
-    return by_user & mask;
-  }
-  return group_matched ? by_group & mask : other;
-}
-
-bool GetPerm(const char* path, unsigned& perm) {
+bool GetOwnAccess(const char* path, unsigned& perm) {
   struct stat info {};
-  if (stat(path, &info) != 0) {
-    return false;
-  }
-  const uid_t user = geteuid();
-  if (user == 0) {
-    const bool may_execute = S_ISDIR(info.st_mode) || (info.st_mode & 0111) != 0;
-    perm = may_execute ? kAll : kRead | kWrite;
-    return true;
-  }
-  if (user == info.st_uid) {
-    perm = (info.st_mode >> 6) & kAll;
-    return true;
-  }
   std::vector<gid_t> groups;
-  if (!GetGroups(groups)) {
+  if (stat(path, &info) != 0 || !kavo::local::GetOwnGroups(groups)) {
     return false;
   }
-  // The kernel does not look at an ACL that masks everything: not even a named user is found in it
-  // then, and gets what others get.
-  if ((info.st_mode & S_IRWXG) != 0) {
-    const Acl acl(acl_get_file(path, ACL_TYPE_ACCESS), &acl_free);
-    if (acl != nullptr) {
-      perm = EvaluateAcl(acl.get(), user, info.st_gid, groups);
-      return true;
-    }
-    if (errno != ENOTSUP && errno != ENOSYS) {
-      return false;
-    }
-  }
-  const bool is_member = std::find(groups.begin(), groups.end(), info.st_gid) != groups.end();
-  perm = (is_member ? info.st_mode >> 3 : info.st_mode) & kAll;
-  return true;
+  groups.push_back(getegid());
+  return kavo::local::GetAccess(path, info, geteuid(), groups, perm);
 }
 
 }  // namespace
@@ -139,7 +28,7 @@ int KAVOACLPermGet(const char* path, unsigned* mask) {
   *mask = 0;
   try {
     unsigned perm = 0;
-    if (!GetPerm(path, perm)) {
+    if (!GetOwnAccess(path, perm)) {
       return -1;
     }
     *mask = perm;

@@ -2,6 +2,8 @@
 #ifndef KAVO_CREDENTIALS_H_
 #define KAVO_CREDENTIALS_H_
 
+#include <stdbool.h>
+
 #ifdef __cplusplus
 extern "C" {
 #endif
@@ -13,7 +15,8 @@ extern "C" {
 // is passed as true by all callers.
 //
 // On a local platform with a root folder of its own "root" names the owner of that folder, who is
-// the administrator of all below it.
+// the administrator of all below it, and is so with whatever group: true at once when the user is
+// that already.
 bool ResetCredentialsByName(const char* name, bool keep_saved);
 
 #ifdef __cplusplus

@@ -50,8 +50,10 @@ int KLIBShareRecycleStatusGet(const struct KAVO_SHARE* share, int* is_enabled);
 // several threads.
 int KLIBShareHideUnreadableGet(const struct KAVO_SHARE* share, int* is_hidden);
 
-// What a user may do in the share, KAVO_SHARE_PRIVILEGE_* bits; negative when there is no such user
-// or the rights cannot be told. Safe to call from several threads.
+// What a user may do in the share, KAVO_SHARE_PRIVILEGE_* bits: by mode, owner, groups and ACL of
+// the share's directory itself (the folders on the way are not looked at), where both bits want the
+// right to enter it, and nobody writes on a file system that is mounted read-only. Negative when
+// there is no such user or the rights cannot be told. Safe to call from several threads.
 int KAVOShareUserPrivCalc(const char* user, const struct KAVO_SHARE* share);
 
 // Which shares KLIBShareEnum() lists.

@@ -23,11 +23,12 @@ int KAVOUserGetByUID(uid_t uid, struct KAVO_USER** user);
 void KAVOUserFree(struct KAVO_USER* user);
 
 // 1 when the user is one of the administrators, 0 when not, negative when there is no such user or
-// the groups cannot be told. `flags` is 0.
+// the groups cannot be told. `flags` is 0. On the local platform the administrators are the members
+// of the group "administrators", of "sudo" where there is none, of "wheel" where there is neither.
 int KLIBGroupIsAdminGroupMem(const char* user, int flags);
 
 // Sets `path` to the user's home directory. 0; negative with errno when there is no such user or
-// the buffer is too small.
+// the buffer is too small (ERANGE; nothing is written then).
 int KAVOServiceHomePathGet(const char* user, char* path, size_t bytes);
 
 #ifdef __cplusplus

@@ -4,11 +4,16 @@
 #include <grp.h>
 #include <gtest/gtest.h>
 #include <sys/acl.h>
+#include <sys/statvfs.h>
 
 #include <algorithm>
 #include <random>
+#include <tuple>
 #include <vector>
 
+#include "kavo/last_error.h"
+#include "kavo/share.h"
+#include "support/accounts.h"
 #include "support/faults.h"
 #include "support/temp_folder.h"
 
@@ -16,6 +21,20 @@
 INTERPOSED acl_t acl_get_file(const char* path, acl_type_t type) {
   static const auto real = REAL_FUNCTION(acl_t, acl_get_file, (const char*, acl_type_t));
   return ScopedFault::Fires("acl_get_file") ? nullptr : real(path, type);
+}
+
+bool is_mounted_read_only = false;
+
+INTERPOSED int statvfs(const char* path, struct statvfs* info) noexcept {
+  static const auto real = REAL_FUNCTION(int, statvfs, (const char*, struct statvfs*));
+  const int result = real(path, info);
+  info->f_flag = (info->f_flag & ~ST_RDONLY) | (is_mounted_read_only ? ST_RDONLY : 0);
+  return result;
+}
+
+int GetPrivilege(const std::string& user, std::string path) {
+  const KAVO_SHARE share{nullptr, path.data(), 0};
+  return KAVOShareUserPrivCalc(user.c_str(), &share);
 }
 
 bool SetAcl(const std::string& path, const std::string& text) {
@@ -54,7 +73,8 @@ TEST(KAVOACLPermGet, AgreesWithTheKernel) {
     }
     ASSERT_TRUE(SetAcl(path, acl)) << acl;
     // A file system without ACLs says so; the mode is all there is then.
-    const ScopedFault fault(below(2) == 0 && acl.size() < 25 ? "acl_get_file" : "", ENOTSUP);
+    const ScopedFault fault(below(2) == 0 && acl.size() < 25 ? "acl_get_file" : "", ENOTSUP, 1,
+                            /*lasting=*/true);
     std::vector<gid_t> groups(below(4));
     std::generate(groups.begin(), groups.end(), id);
     ASSERT_EQ(setgroups(groups.size(), groups.data()), 0);
@@ -68,7 +88,15 @@ TEST(KAVOACLPermGet, AgreesWithTheKernel) {
       want |= faccessat(AT_FDCWD, path.c_str(), right, AT_EACCESS) == 0 ? right : 0;
     }
     EXPECT_EQ(mask, want) << acl << " for " << geteuid() << ":" << getegid();
+    groups.push_back(getegid());
+    test_users = {{"tester", geteuid(), getegid(), groups}};
     ASSERT_TRUE(seteuid(0) == 0 && setegid(0) == 0 && setgroups(0, nullptr) == 0);
+    if (path.ends_with("/directory")) {
+      is_mounted_read_only = below(4) == 0;
+      want &= is_mounted_read_only ? R_OK | X_OK : R_OK | W_OK | X_OK;
+      want = (want & X_OK) == 0 ? 0 : (want & R_OK ? 1 : 0) | (want & W_OK ? 2 : 0);
+      EXPECT_EQ(GetPrivilege("tester", path), static_cast<int>(want)) << acl;
+    }
     ASSERT_FALSE(HasFailure()) << "seed " << seed;
   }
 }
@@ -79,4 +107,15 @@ TEST(KAVOACLPermGet, WhatCannotBeToldIsNoRight) {
   EXPECT_EQ(KAVOACLPermGet((folder / "missing").c_str(), &mask), -1);
   EXPECT_EQ(errno, ENOENT);
   EXPECT_EQ(mask, 0U);
+  WriteText(folder / "file", "x");
+  test_users = {{"tester", 0, 0, {0}}};
+  using Case = std::tuple<const char*, const char*, int, int>;
+  for (const auto& [user, name, error, kind] :
+       {Case{"no-such-user", ".", ENOENT, KAVO_ERR_NOT_FOUND},
+        Case{"tester", "missing", ENOENT, KAVO_ERR_SYSTEM},
+        Case{"tester", "file", ENOTDIR, KAVO_ERR_SYSTEM}}) {
+    EXPECT_EQ(GetPrivilege(user, folder / name), -1) << name;
+    EXPECT_EQ(errno, error) << name;
+    EXPECT_EQ(KLIBCErrGet(), kind) << name;
+  }
 }

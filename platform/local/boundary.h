@@ -1,26 +1,30 @@
-// The edge between the C functions of the platform and the C++ behind them. Not installed.
+// What the platform's C functions share: none of them lets an exception out. Not installed.
 #ifndef PLATFORM_LOCAL_BOUNDARY_H_
 #define PLATFORM_LOCAL_BOUNDARY_H_
 
 #include <cerrno>
-#include <exception>
 #include <new>
 
 #include "platform/local/last_error.h"
 
 namespace kavo::local {
 
-// What `body()` returns; -1 with errno and the last error when it throws.
+// Sets both and returns -1.
+inline int Fail(int kavo_error, int error) noexcept {
+  errno = error;
+  return SetLastError(kavo_error);
+}
+
+// What `body` returns; -1 when it throws.
 template <typename Body>
-int AtBoundary(Body body) noexcept {
+int Guarded(Body body) noexcept {
   try {
     return body();
   } catch (const std::bad_alloc&) {
-    errno = ENOMEM;
-  } catch (const std::exception&) {
-    errno = EIO;
+    return Fail(KAVO_ERR_SYSTEM, ENOMEM);
+  } catch (...) {  // A caller's own function; ours throw nothing else that gets here.
+    return Fail(KAVO_ERR_SYSTEM, EIO);
   }
-  return SetLastError(KAVO_ERR_SYSTEM);
 }
 
 }  // namespace kavo::local

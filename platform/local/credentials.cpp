@@ -100,5 +100,5 @@ int BecomeUser(const char* name) {
 }  // namespace
 
 bool ResetCredentialsByName(const char* name, bool /*keep_saved*/) {
-  return kavo::local::AtBoundary([name] { return BecomeUser(name); }) == 0;
+  return kavo::local::Guarded([name] { return BecomeUser(name); }) == 0;
 }

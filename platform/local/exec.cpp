@@ -87,7 +87,7 @@ int Run(Arguments& arguments) {
 int KLIBCExec(const char* path, ...) {
   va_list rest;
   va_start(rest, path);
-  const int result = kavo::local::AtBoundary([path, &rest] {
+  const int result = kavo::local::Guarded([path, &rest] {
     Arguments arguments{const_cast<char*>(path)};
     Append(arguments, rest);
     return Run(arguments);
@@ -99,7 +99,7 @@ int KLIBCExec(const char* path, ...) {
 int KLIBCExecl(const char* path, int options, ...) {
   va_list rest;
   va_start(rest, options);
-  const int result = kavo::local::AtBoundary([path, &rest] {
+  const int result = kavo::local::Guarded([path, &rest] {
     Arguments arguments{const_cast<char*>(path)};
     Append(arguments, rest);
     return Run(arguments);

@@ -19,6 +19,11 @@
 #include <type_traits>
 #include <vector>
 
+#include "platform/local/fd.h"
+
+using kavo::local::ScopedFd;
+using kavo::local::WriteAll;
+
 namespace {
 
 constexpr size_t kBufferBytes = size_t{128} * 1024;
@@ -26,29 +31,6 @@ constexpr size_t kRangeBytes = size_t{1} << 30;
 constexpr int kNameAttempts = 100;
 constexpr char kAccessAcl[] = "system.posix_acl_access";
 constexpr std::string_view kAclPrefix = "system.posix_acl_";
-
-// Closes a descriptor at the end of a scope without touching errno.
-class ScopedFd {
- public:
-  explicit ScopedFd(int fd) : fd_(fd) {}
-  ~ScopedFd() {
-    const int saved = errno;
-    Close();
-    errno = saved;
-  }
-  ScopedFd(const ScopedFd&) = delete;
-  ScopedFd& operator=(const ScopedFd&) = delete;
-
-  int Get() const { return fd_; }
-  bool Close() {
-    const int fd = fd_;
-    fd_ = -1;
-    return fd < 0 || close(fd) == 0;
-  }
-
- private:
-  int fd_;
-};
 
 // With the slash that ends it; "" for the working directory.
 std::string FolderPrefixOf(const std::string& path) {
@@ -256,18 +238,6 @@ bool CopyAttributes(const Object& from, const Object& to, const struct stat& sou
     }
   }
   return to.SetTimes({source.st_atim, source.st_mtim}) == 0;
-}
-
-bool WriteAll(int fd, std::string_view data) {
-  while (!data.empty()) {
-    const ssize_t written = write(fd, data.data(), data.size());
-    if (written >= 0) {
-      data.remove_prefix(static_cast<size_t>(written));
-    } else if (errno != EINTR) {
-      return false;
-    }
-  }
-  return true;
 }
 
 // From where both files stand to the end.

@@ -36,7 +36,7 @@ int ErrorOf(int exit_status) {
 }
 
 int Control(const char* verb, const char* name) {
-  return kavo::local::AtBoundary([verb, name] {
+  return kavo::local::Guarded([verb, name] {
     if (!HasServiceManager()) {
       syslog(LOG_NOTICE, "kavoplatform: no service manager here, nothing done to %s service %s",
              verb, name);

@@ -64,5 +64,5 @@ int GetPrivilege(const char* user, const char* path) {
 }  // namespace
 
 int KAVOShareUserPrivCalc(const char* user, const struct KAVO_SHARE* share) {
-  return kavo::local::AtBoundary([user, share] { return GetPrivilege(user, share->szPath); });
+  return kavo::local::Guarded([user, share] { return GetPrivilege(user, share->szPath); });
 }

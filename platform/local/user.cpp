@@ -10,8 +10,8 @@
 #include "platform/local/boundary.h"
 
 using kavo::local::Account;
-using kavo::local::AtBoundary;
 using kavo::local::FailLookUp;
+using kavo::local::Guarded;
 using kavo::local::SetLastError;
 
 namespace {
@@ -23,7 +23,7 @@ constexpr const char* kAdminGroups[] = {"administrators", "sudo", "wheel"};
 template <typename Find>
 int GetUser(Find find, KAVO_USER** user) {
   *user = nullptr;
-  return AtBoundary([find, user] {
+  return Guarded([find, user] {
     Account account;
     if (const int error = find(account); error != 0) {
       return FailLookUp(error);
@@ -84,11 +84,11 @@ void KAVOUserFree(struct KAVO_USER* user) {
 }
 
 int KLIBGroupIsAdminGroupMem(const char* user, int /*flags*/) {
-  return AtBoundary([user] { return IsAdmin(user); });
+  return Guarded([user] { return IsAdmin(user); });
 }
 
 int KAVOServiceHomePathGet(const char* user, char* path, size_t bytes) {
-  return AtBoundary([user, path, bytes] {
+  return Guarded([user, path, bytes] {
     Account account;
     if (const int error = kavo::local::FindUser(user, account); error != 0) {
       return FailLookUp(error);

@@ -2,8 +2,9 @@
 // threads.
 //
 // Each writes a NUL-terminated text that is never empty into `buffer` and returns 0; negative with
-// errno when it does not fit or cannot be made up, and the buffer is as it was. What is composed
-// need not exist.
+// errno when it does not fit (ERANGE) or cannot be made up (EINVAL: an empty name, a path that is
+// not absolute; ENAMETOOLONG: a path that makes too long a file name), and the buffer is as it was.
+// What is composed need not exist, and is not made.
 #ifndef KAVO_INDEX_PATH_H_
 #define KAVO_INDEX_PATH_H_
 

@@ -19,7 +19,9 @@ namespace kavo::local {
 struct Share {
   std::string name;              // "name": 1 to 255 bytes without "/", and not "." or "..".
   std::string path;              // "path": absolute, without ".", ".." and doubled or trailing
-                                 // slashes; the last component is the name.
+                                 // slashes; the last component is the name. Its encoded form, by
+                                 // which FILEIDXQueuePathCompose names the queue, has at most 240
+                                 // bytes. Does not hold the queues and indexes, nor lie in them.
   bool encrypted = false;        // "encrypted": locked at present.
   bool encryption = false;       // "encryption": of the encrypted kind.
   bool read_only = false;        // "read_only"
@@ -43,8 +45,11 @@ std::string SharesFile();
 std::vector<Share> ReadShares(const std::string& file);
 
 // Appends a share, or takes one out. The file as it stands must be good, the new list is checked as
-// a file is when it is read, and only then written; the folder is made when it is missing. Throws
-// SharesError and leaves the file as it was, for a name that is there already or is not there, too.
+// a file is when it is read, and only then written, with mode 0644, the owner that it had where
+// that is permitted, and without the comments that it had. The folder is made when it is missing.
+// Throws SharesError and leaves the file as it was, for a name that is there already or is not
+// there, too; only when the folder cannot be synced at last, the change is there but may not
+// outlive a power failure. Blocks while another edits.
 void AddShare(const std::string& file, const Share& share);
 void RemoveShare(const std::string& file, const std::string& name);
 

@@ -1,0 +1,340 @@
+#include "kavo/share.h"
+
+#include <gtest/gtest.h>
+#include <sys/statvfs.h>
+
+#include <atomic>
+#include <climits>
+#include <memory>
+#include <stdexcept>
+#include <thread>
+#include <vector>
+
+#include "kavo/index_path.h"
+#include "kavo/last_error.h"
+#include "kavo/local/shares.h"
+#include "support/faults.h"
+#include "support/syslog_capture.h"
+#include "support/temp_folder.h"
+
+FAULTABLE(ssize_t, read, (int fd, void* buffer, size_t size), (fd, buffer, size))
+
+// One file system is mounted read-only, whatever the machine has.
+INTERPOSED int statvfs(const char* path, struct statvfs* info) {
+  *info = {};
+  info->f_flag = strcmp(path, "/volume2/mounted") == 0 ? ST_RDONLY : 0;
+  return ScopedFault::Fires("statvfs") ? -1 : 0;
+}
+
+namespace {
+
+const TempFolder root;
+const bool is_root_set = setenv("FILEINDEX_ROOT", root.Path().c_str(), 1) == 0;
+
+class Shares : public testing::Test {
+ protected:
+  void SetUp() override {
+    if (kavo::local::Root() != root.Path()) {
+      GTEST_SKIP() << "a build for the system's own root looks nowhere else";
+    }
+    std::filesystem::create_directories(root / "etc/kavo");
+    Replace(R"({"shares": [
+      {"name": "photo", "path": "/volume1/photo", "read_only": true, "ftp_privilege": 7},
+      {"name": "homes", "path": "/volume1/homes", "recycle": true},
+      {"name": "inner", "path": "/volume1/photo/a/inner", "encryption": true},
+      {"name": "mounted", "path": "/volume2/mounted", "encrypted": true, "hide_unreadable": true}
+    ]})");
+  }
+  void TearDown() override { std::filesystem::remove_all(root / "etc"); }
+
+  static void Replace(const std::string& text) {
+    WriteText(file_ + ".new", text);
+    ASSERT_EQ(rename((file_ + ".new").c_str(), file_.c_str()), 0);
+  }
+  static std::string HolderOf(const std::string& path) {
+    char name[256];
+    char folder[4096];
+    return KAVOShareNamePathGet(path.c_str(), name, sizeof(name), folder, sizeof(folder)) == 0
+               ? std::string(name) + " " + folder
+               : "";
+  }
+
+  static inline const std::string file_ = root / "etc/kavo/shares.json";
+};
+
+using Record = std::unique_ptr<KAVO_SHARE, decltype(&KAVOShareFree)>;
+using List = std::unique_ptr<KLIBCSZLIST, decltype(&KLIBCSzListFree)>;
+
+Record Get(const char* name) {
+  KAVO_SHARE* record = nullptr;
+  KAVOShareGet(name, &record);
+  return {record, &KAVOShareFree};
+}
+
+std::vector<std::string> TextsOf(const KLIBCSZLIST* list) {
+  std::vector<std::string> texts;
+  while (const char* const text = KLIBCSzListGet(list, static_cast<int>(texts.size()))) {
+    texts.emplace_back(text);
+  }
+  return texts;
+}
+
+}  // namespace
+
+TEST_F(Shares, PathsFindTheirShare) {
+  struct PathCase {
+    std::string path;
+    const char* holder;
+    int in_recycle_bin;
+    int in_home_recycle_bin;
+  };
+  const std::string photo = "/volume1/photo";
+  const std::string deep = "/volume1/photo/" + std::string(1'000'000, 'x');
+  for (const PathCase& row : std::vector<PathCase>{
+           {photo, "photo /volume1/photo", 0, 0},
+           {photo + "/", "photo /volume1/photo", 0, 0},
+           {photo + "X", "", 0, 0},
+           {photo + "X/#recycle", "", 0, 0},
+           {"/volume1", "", 0, 0},
+           {"/", "", 0, 0},
+           {"", "", 0, 0},
+           {"volume1/photo", "", 0, 0},
+           {deep, "photo /volume1/photo", 0, 0},
+           {deep.substr(15), "", 0, 0},
+           {photo + "/a", "photo /volume1/photo", 0, 0},
+           {photo + "/a/inner", "inner /volume1/photo/a/inner", 0, 0},
+           {photo + "/a/inner/b/c", "inner /volume1/photo/a/inner", 0, 0},
+           {photo + "/a/innermost", "photo /volume1/photo", 0, 0},
+           {photo + "/#recycle", "photo /volume1/photo", 1, 0},
+           {photo + "/#recycle/a/b", "photo /volume1/photo", 1, 0},
+           {photo + "/#recycled", "photo /volume1/photo", 0, 0},
+           {photo + "/b/#recycle", "photo /volume1/photo", 0, 0},
+           {photo + "/a/inner/#recycle/b", "inner /volume1/photo/a/inner", 1, 0},
+           {"/volume1/homes/#recycle/#recycle", "homes /volume1/homes", 1, 1},
+           {"/volume1/homes/ann/#recycle", "homes /volume1/homes", 0, 1},
+           {"/volume1/homes/ann/#recycle/x", "homes /volume1/homes", 0, 1},
+           {"/volume1/homes/ann/x/#recycle", "homes /volume1/homes", 0, 0},
+           {"/volume1/homes//#recycle", "homes /volume1/homes", 0, 0},
+           {"/volume1/homesX/ann/#recycle", "", 0, 0},
+       }) {
+    const std::string shown = row.path.substr(0, 50);
+    EXPECT_EQ(HolderOf(row.path), row.holder) << shown;
+    EXPECT_EQ(KAVOShareIsShareRecycle(row.path.c_str()), row.in_recycle_bin) << shown;
+    EXPECT_EQ(KAVORecycleUserHomePathIsExist(row.path.c_str(), 11), row.in_home_recycle_bin)
+        << shown;
+  }
+  EXPECT_LT(KAVOShareNamePathGet("/elsewhere", nullptr, 0, nullptr, 0), 0);
+  EXPECT_EQ(KLIBCErrGet(), KAVO_ERR_BAD_PARAMETER);
+}
+
+TEST_F(Shares, BuffersAreFilledWholeOrNotAtAll) {
+  struct SizeCase {
+    int name_bytes;
+    int path_bytes;
+    int want;
+  };
+  for (const SizeCase& row : {SizeCase{6, 15, 0},
+                              {5, 15, -1},
+                              {6, 14, -1},
+                              {0, 0, -1},
+                              {-1, 99, -1},
+                              {99, INT_MIN, -1}}) {
+    char name[8] = "before";
+    char path[16] = "before";
+    EXPECT_EQ(KAVOShareNamePathGet("/volume1/photo/x", name, row.name_bytes, path, row.path_bytes),
+              row.want);
+    EXPECT_EQ(std::string(name) + path, row.want == 0 ? "photo/volume1/photo" : "beforebefore");
+    EXPECT_TRUE(row.want == 0 || errno == ERANGE);
+  }
+}
+
+TEST_F(Shares, SettingsAreThoseOfThePresentFile) {
+  const auto settings = [](const KAVO_SHARE* share) {
+    std::string bits;
+    for (const auto ask :
+         {KLIBShareIsEncryptedGet, KLIBShareIsEncryptionGet, KLIBShareIsReadOnlyGet,
+          KLIBShareRecycleStatusGet, KLIBShareHideUnreadableGet}) {
+      int answer = 9;
+      const int result = ask(share, &answer);
+      bits += result == 0 ? std::to_string(answer) : answer == 9 ? "-" : "?";
+    }
+    return bits;
+  };
+  const Record photo = Get("photo");
+  ASSERT_NE(photo, nullptr);
+  EXPECT_STREQ(photo->szName, "photo");
+  EXPECT_STREQ(photo->szPath, "/volume1/photo");
+  EXPECT_EQ(photo->ftpPrivilege, 7U);
+  EXPECT_EQ(settings(photo.get()), "00100");
+  EXPECT_EQ(settings(Get("homes").get()), "00010");
+  EXPECT_EQ(settings(Get("inner").get()), "01000");
+  EXPECT_EQ(settings(Get("mounted").get()), "10101");
+  {
+    const ScopedFault fault("statvfs", ENOENT, 1, /*lasting=*/true);
+    EXPECT_EQ(settings(photo.get()), "00100") << "the flag needs no file system";
+    EXPECT_EQ(settings(Get("homes").get()), "00-10");
+    EXPECT_EQ(KLIBCErrGet(), KAVO_ERR_SYSTEM);
+  }
+  EXPECT_EQ(Get("Photo"), nullptr);
+  EXPECT_EQ(KLIBCErrGet(), KAVO_ERR_NOT_FOUND);
+  EXPECT_EQ(settings(nullptr), "-----");
+  kavo::local::RemoveShare(file_, "photo");
+  kavo::local::AddShare(file_, {.name = "photo", .path = "/volume3/photo", .recycle = true});
+  EXPECT_EQ(settings(photo.get()), "00010");
+  unlink(file_.c_str());
+  EXPECT_EQ(settings(photo.get()), "-----");
+  EXPECT_EQ(KLIBCErrGet(), KAVO_ERR_NOT_FOUND);
+}
+
+TEST_F(Shares, EnumerationAppends) {
+  const List list(KLIBCSzListAlloc(0), &KLIBCSzListFree);
+  std::vector<std::string> want;
+  for (int i = 1; i <= 100; ++i) {
+    want.push_back(std::to_string(i));
+    KLIBCSZLIST* moved = list.get();
+    ASSERT_EQ(KLIBCSzListPush(&moved, want.back().c_str()), i);
+    ASSERT_EQ(moved, list.get()) << "this list stays";
+  }
+  KLIBCSZLIST* into = list.get();
+  const auto enumerate = [&into](int (*filter)(const KAVO_SHARE*)) {
+    const KLIB_SHARE_ENUM which = {filter, 0};
+    return KLIBShareEnum(&into, &which);
+  };
+  EXPECT_EQ(enumerate([](const KAVO_SHARE* share) -> int {
+              return share->szName[0] == 'i' ? throw std::runtime_error("stop") : 0;
+            }),
+            -1);
+  EXPECT_EQ(TextsOf(into), want) << "what was appended before the fault is off again";
+  EXPECT_EQ(enumerate(nullptr), 4);
+  EXPECT_EQ(enumerate([](const KAVO_SHARE* share) {
+              int is_recycling = 0;
+              return KLIBShareRecycleStatusGet(share, &is_recycling) == 0 && is_recycling ? 0 : 1;
+            }),
+            1);
+  want.insert(want.end(), {"photo", "homes", "inner", "mounted", "homes"});
+  EXPECT_EQ(TextsOf(into), want);
+  EXPECT_EQ(KLIBCSzListGet(into, -1), nullptr);
+}
+
+TEST_F(Shares, ChangesAreSeenAtOnce) {
+  const auto only = [](const std::string& path) {
+    return "{\"shares\": [{\"name\": \"x\", \"path\": \"" + path + "/x\"}]}";
+  };
+  for (int i = 0; i < 200; ++i) {
+    // Same size, same inode, often within one tick of the time stamps.
+    WriteText(file_, only("/v" + std::to_string(100 + i)));
+    ASSERT_EQ(HolderOf("/v" + std::to_string(100 + i) + "/x/y"),
+              "x /v" + std::to_string(100 + i) + "/x");
+  }
+  // Once the file is older than a tick, it is not read again until it changes.
+  std::this_thread::sleep_for(std::chrono::milliseconds(2100));
+  EXPECT_EQ(HolderOf("/v299/x"), "x /v299/x");
+  {
+    const ScopedFault fault("read", EIO, 1, /*lasting=*/true);
+    EXPECT_EQ(HolderOf("/v299/x"), "x /v299/x");
+    EXPECT_FALSE(fault.Fired());
+    Replace(only("/v300"));
+    EXPECT_EQ(HolderOf("/v300/x"), "");
+    EXPECT_EQ(KLIBCErrGet(), KAVO_ERR_BAD_CONFIG);
+    EXPECT_EQ(errno, EIO);
+  }
+  EXPECT_EQ(HolderOf("/v300/x"), "x /v300/x") << "a failure to read is not kept";
+}
+
+TEST_F(Shares, ABadFileFailsEveryCallAndIsLoggedOnce) {
+  const Record photo = Get("photo");
+  const List list(KLIBCSzListAlloc(0), &KLIBCSzListFree);
+  const auto fails = [&] {
+    int answer = 9;
+    char text[99] = "before";
+    KLIBCSZLIST* into = list.get();
+    const KLIB_SHARE_ENUM all = {nullptr, 0};
+    const bool all_fail = Get("photo") == nullptr &&
+                          KLIBShareIsEncryptedGet(photo.get(), &answer) < 0 &&
+                          KLIBShareIsReadOnlyGet(photo.get(), &answer) < 0 && answer == 9 &&
+                          KLIBShareEnum(&into, &all) < 0 && into->nItem == 0 &&
+                          KAVOShareNamePathGet("/volume1/photo", text, 99, text, 99) < 0 &&
+                          KAVOShareIsShareRecycle("/volume1/photo") < 0 &&
+                          KAVORecycleUserHomePathIsExist("/volume1/homes", 11) < 0;
+    return all_fail && KLIBCErrGet() == KAVO_ERR_BAD_CONFIG && std::string(text) == "before";
+  };
+  SyslogCapture log;
+  const std::string line = "<3>kavoplatform: " + file_ + ":1: \"shares\" must be a list";
+  Replace("{}");
+  EXPECT_TRUE(fails() && fails());
+  EXPECT_EQ(log.Take(), std::vector<std::string>{line});
+  Replace("{ }");
+  EXPECT_TRUE(fails() && fails());
+  EXPECT_EQ(log.Take(), std::vector<std::string>{line});
+  unlink(file_.c_str());
+  ASSERT_EQ(mkdir(file_.c_str(), 0755), 0);
+  EXPECT_TRUE(fails() && fails());
+  EXPECT_EQ(log.Take().size(), 1U);
+  rmdir(file_.c_str());
+  EXPECT_EQ(KAVOShareIsShareRecycle("/volume1/photo"), 0) << "no file: no shares";
+  EXPECT_TRUE(log.Take().empty());
+}
+
+TEST_F(Shares, ThreadsAskWhileTheFileChanges) {
+  std::atomic<bool> is_done = false;
+  std::atomic<int> wrong = 0;
+  std::vector<std::thread> threads;
+  for (int i = 0; i < 4; ++i) {
+    threads.emplace_back([&] {
+      while (!is_done) {
+        wrong += HolderOf("/volume1/homes/ann") != "homes /volume1/homes" ? 1 : 0;
+      }
+    });
+  }
+  for (int i = 0; i < 20; ++i) {
+    kavo::local::AddShare(file_, {.name = "new", .path = "/volume1/homes/new"});
+    kavo::local::RemoveShare(file_, "new");
+  }
+  is_done = true;
+  for (std::thread& thread : threads) {
+    thread.join();
+  }
+  EXPECT_EQ(wrong, 0);
+}
+
+TEST_F(Shares, QueueAndIndexHaveAPlace) {
+  const std::string at_limit = "/" + std::string(237, 'n');
+  const std::string folder = root / "var/lib/kavo/fileindex/";
+  struct NameCase {
+    std::string path;
+    std::string want;
+    int error;
+  };
+  for (const NameCase& row : std::vector<NameCase>{
+           {"/volume1/photo", "%2Fvolume1%2Fphoto", 0},
+           {"/a%2Fb", "%2Fa%252Fb", 0},
+           {"/caf\xE9 \n\x7f", "%2Fcaf\xE9 %0A%7F", 0},
+           {at_limit, "%2F" + at_limit.substr(1), 0},
+           {at_limit + "n", "", ENAMETOOLONG},
+           {"", "", EINVAL},
+           {"volume1/photo", "", EINVAL},
+       }) {
+    for (const auto& [compose, place] :
+         {std::pair{&FILEIDXQueuePathCompose, "queue/"}, std::pair{&FILEIDXDBPathCompose, "db/"}}) {
+      char buffer[4096] = "before";
+      EXPECT_EQ(compose(row.path.c_str(), buffer, sizeof(buffer)), row.error == 0 ? 0 : -1);
+      EXPECT_TRUE(row.error == 0 || errno == row.error) << row.path << ": " << strerror(errno);
+      const std::string want = row.error == 0 ? folder + place + row.want : "before";
+      EXPECT_EQ(buffer, want);
+      if (row.error == 0) {
+        char small[4096] = "before";
+        EXPECT_EQ(compose(row.path.c_str(), small, want.size()), -1);
+        EXPECT_EQ(errno, ERANGE);
+        EXPECT_STREQ(small, "before");
+        EXPECT_EQ(compose(row.path.c_str(), small, want.size() + 1), 0);
+      }
+    }
+  }
+  char id[16] = "before";
+  EXPECT_EQ(FILEIDXGetIndexID("", id, sizeof(id)), -1);
+  EXPECT_EQ(FILEIDXGetIndexID("photos", id, sizeof(id)), -1);
+  EXPECT_STREQ(id, "before");
+  EXPECT_EQ(FILEIDXGetIndexID("photo", id, sizeof(id)), 0);
+  EXPECT_STREQ(id, "fileindex_photo");
+  EXPECT_FALSE(std::filesystem::exists(root / "var")) << "nothing is made";
+}

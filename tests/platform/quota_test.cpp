@@ -1,0 +1,177 @@
+#include "kavo/quota.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <linux/dqblk_xfs.h>
+#include <sys/quota.h>
+#include <sys/syscall.h>
+
+#include <cstdarg>
+#include <ctime>
+#include <string>
+
+#include "kavo/last_error.h"
+#include "support/faults.h"
+#include "support/private_mounts.h"
+#include "support/temp_folder.h"
+
+namespace {
+
+// What the kernel is made to say of quotas.
+struct Quota {
+  uint64_t hard_kib = 0;
+  uint64_t soft_kib = 0;
+  uint64_t used_bytes = 0;
+  uint64_t grace_end = 0;
+  int state = FS_QUOTA_UDQ_ACCT | FS_QUOTA_UDQ_ENFD;  // Or minus an errno.
+  int error = 0;
+};
+const Quota* given = nullptr;
+bool is_old_kernel = false;  // Without quotactl_fd().
+std::string asked_source;
+
+int Answer(int command, long user, void* answer) {
+  const auto result = [](int error) { return error == 0 ? 0 : (errno = error, -1); };
+  if (given == nullptr) {
+    return result(ENOTBLK);
+  }
+  if (command == static_cast<int>(QCMD(Q_XGETQSTAT, USRQUOTA))) {
+    static_cast<fs_quota_stat*>(answer)->qs_flags = static_cast<uint16_t>(given->state);
+    return result(given->state < 0 ? -given->state : 0);
+  }
+  if (command != static_cast<int>(QCMD(Q_GETQUOTA, USRQUOTA)) || user != 1234) {
+    return result(ESRCH);
+  }
+  auto* quota = static_cast<dqblk*>(answer);
+  quota->dqb_bhardlimit = given->hard_kib;
+  quota->dqb_bsoftlimit = given->soft_kib;
+  quota->dqb_curspace = given->used_bytes;
+  quota->dqb_btime = given->grace_end;
+  return result(given->error);
+}
+
+}  // namespace
+
+// NOLINTBEGIN(readability-identifier-naming): the C library's names.
+INTERPOSED long syscall(long number, ...) noexcept {
+  static const auto real = REAL_FUNCTION(long, syscall, (long, ...));
+  va_list list;
+  va_start(list, number);
+  long a[6];
+  for (long& argument : a) {
+    argument = va_arg(list, long);
+  }
+  va_end(list);
+  if (number != SYS_quotactl_fd || given == nullptr) {
+    return real(number, a[0], a[1], a[2], a[3], a[4], a[5]);
+  }
+  errno = ENOSYS;
+  // NOLINTNEXTLINE(performance-no-int-to-ptr): system calls take all arguments as numbers.
+  return is_old_kernel ? -1 : Answer(static_cast<int>(a[1]), a[2], reinterpret_cast<void*>(a[3]));
+}
+
+INTERPOSED int quotactl(int command, const char* source, int user, caddr_t answer) noexcept {
+  asked_source = source;
+  return Answer(command, user, answer);
+}
+// NOLINTEND(readability-identifier-naming)
+
+namespace {
+
+std::string Ask(uid_t user, const std::string& path, uint64_t bytes) {
+  if (KAVOQuotaIsEnough(user, path.c_str(), bytes) != 0) {
+    return "enough";
+  }
+  const int error = KLIBCErrGet();
+  return error == KAVO_ERR_NO_SPACE ? "no space"
+         : error == KAVO_ERR_QUOTA  ? "quota"
+         : error == KAVO_ERR_SYSTEM ? strerror(errno)
+                                    : std::to_string(error);
+}
+
+TEST(KAVOQuotaIsEnough, ComparesWithTheUsersLimits) {
+  const TempFolder folder;
+  const auto past = static_cast<uint64_t>(time(nullptr)) - 1;
+  const uint64_t future = past + 3600;
+  constexpr int kCounted = FS_QUOTA_UDQ_ACCT;
+  struct {
+    const char* name;
+    uid_t user;
+    uint64_t bytes;
+    Quota quota;
+    const char* want;
+  } const rows[] = {
+      {"NoLimit", 1234, 9999, {0, 0, 5000}, "enough"},
+      {"UpToTheHardLimit", 1234, 1048, {2, 0, 1000}, "enough"},
+      {"OneOverTheHardLimit", 1234, 1049, {2, 0, 1000}, "quota"},
+      {"UsedMoreThanTheLimit", 1234, 1, {2, 0, 5000}, "quota"},
+      {"NothingIsWritten", 1234, 0, {2, 0, 5000}, "enough"},
+      {"LimitBeyond64Bits", 1234, 9999, {UINT64_MAX / 1000, 0, 5000}, "enough"},
+      {"SoftLimitInGrace", 1234, 9, {0, 1, 5000, future}, "enough"},
+      {"SoftLimitAfterGrace", 1234, 9, {0, 1, 5000, past}, "quota"},
+      {"SoftLimitNotReached", 1234, 9999, {0, 1, 1000}, "enough"},
+      {"OnlyCounted", 1234, 9, {1, 0, 5000, 0, kCounted}, "enough"},
+      {"StateNotTold", 1234, 9, {1, 0, 5000, 0, -EINVAL}, "quota"},
+      {"NotOn", 1234, 9, {1, 0, 5000, 0, kCounted, ESRCH}, "enough"},
+      {"NotAllowedToAsk", 1234, 9, {1, 0, 5000, 0, kCounted, EPERM}, "enough"},
+      {"Root", 0, 9, {1, 0, 5000}, "enough"},
+      {"AnotherUser", 1235, 9, {1, 0, 5000}, "enough"},
+  };
+  for (const auto& row : rows) {
+    given = &row.quota;
+    for (const bool is_old : {false, true}) {
+      is_old_kernel = is_old;
+      asked_source.clear();
+      EXPECT_EQ(Ask(row.user, folder.Path(), row.bytes), row.want) << row.name << is_old;
+      EXPECT_EQ(asked_source.empty(), !is_old || row.user == 0 || row.bytes == 0) << row.name;
+    }
+  }
+  given = nullptr;
+}
+
+TEST(KAVOQuotaIsEnough, ComparesWithTheRoomOnTheVolume) {
+  const TempFolder folder;
+  const auto volume = ScopedMount::Tmpfs(folder / "volume", "size=1m");
+  SKIP_IF_REFUSED(volume);
+  const auto endless = ScopedMount::Tmpfs(folder / "endless", "size=0");
+  SKIP_IF_REFUSED(endless);
+  constexpr uint64_t kRoom = 512 << 10;
+  WriteText(volume / "half", std::string(kRoom, 'x'));
+  for (const uid_t user : {0, 1234}) {
+    EXPECT_EQ(Ask(user, volume.Path(), kRoom), "enough");
+    EXPECT_EQ(Ask(user, volume / "half", kRoom + 1), "no space");
+    EXPECT_EQ(Ask(user, volume.Path(), UINT64_MAX), "no space");
+    EXPECT_EQ(Ask(user, endless.Path(), UINT64_MAX), "enough");
+    EXPECT_EQ(Ask(user, volume / "missing", 0), strerror(ENOENT));
+  }
+  WriteText(volume / "rest", std::string(kRoom, 'x'));
+  EXPECT_EQ(Ask(0, volume.Path(), 1), "no space");
+  EXPECT_EQ(Ask(0, volume.Path(), 0), "enough");
+}
+
+TEST(KAVOQuotaIsEnough, AsksARealFileSystem) {
+  const TempFolder folder;
+  const auto volume = ScopedMount::Image("truncate -s 16M $IMAGE; mkfs.ext4 -q -O quota $IMAGE",
+                                         folder / "volume", "usrquota");
+  SKIP_IF_REFUSED(volume);
+  constexpr uint64_t kUsed = 64 << 10;
+  WriteText(volume / "file", std::string(kUsed, 'x'));
+  ASSERT_EQ(chown((volume / "file").c_str(), 1234, 1234), 0);
+  const int fd = open(volume.Path().c_str(), O_RDONLY | O_CLOEXEC);
+  dqblk limits{};
+  limits.dqb_bhardlimit = 1024;
+  limits.dqb_valid = QIF_BLIMITS;
+  const long set = syscall(SYS_quotactl_fd, fd, QCMD(Q_SETQUOTA, USRQUOTA), 1234, &limits);
+  close(fd);
+  if (set != 0 && errno == ENOSYS) {
+    GTEST_SKIP() << "the kernel has no quotactl_fd()";
+  }
+  ASSERT_EQ(set, 0) << strerror(errno);
+  constexpr uint64_t kMetadata = 16 << 10;  // At most; it is counted, too.
+  EXPECT_EQ(Ask(1234, volume.Path(), (1024 << 10) - kUsed - kMetadata), "enough");
+  EXPECT_EQ(Ask(1234, volume / "file", (1024 << 10) - kUsed + 1), "quota");
+  EXPECT_EQ(Ask(1235, volume.Path(), 1024 << 10), "enough");
+  EXPECT_EQ(Ask(0, volume.Path(), 1024 << 10), "enough");
+}
+
+}  // namespace

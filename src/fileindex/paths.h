@@ -1,0 +1,30 @@
+// The fixed paths of the service, in one place.
+#ifndef FILEINDEX_PATHS_H_
+#define FILEINDEX_PATHS_H_
+
+#include <string>
+
+#include "common/export.h"
+
+namespace vexlo::fileindex {
+
+// What stands before every fixed path: "" on a system's own installation. A library that was
+// configured with a root (FILEINDEX_ROOT) takes another one from FILEINDEX_ROOT in the environment,
+// read once; one configured for "" never looks there.
+VEXLO_EXPORT const std::string& GetFileIndexRoot();
+
+class FixedPath {
+ public:
+  constexpr explicit FixedPath(const char* path) : path_(path) {}
+  // With the root before it.
+  std::string Get() const { return GetFileIndexRoot() + path_; }
+
+ private:
+  const char* path_;
+};
+
+inline constexpr FixedPath kNotifyToolPath("/usr/kavo/bin/kavoqpxnotify");
+
+}  // namespace vexlo::fileindex
+
+#endif  // FILEINDEX_PATHS_H_

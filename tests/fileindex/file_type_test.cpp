@@ -1,0 +1,83 @@
+#include "fileindex/util/file_type.h"
+
+#include <gtest/gtest.h>
+
+#include <map>
+#include <random>
+
+#include "common/string.h"
+#include "fileindex/util/file_type_table.h"
+
+using namespace vexlo::fileindex;
+
+namespace {
+
+TEST(FileType, Names) {
+  struct Row {
+    std::string path;
+    FileType want;
+  };
+  for (const Row& row : {
+           Row{"README", FILE_TYPE_DOCUMENT},
+           Row{"/volume1/docs.mp3/a-name-without-a-dot", FILE_TYPE_DOCUMENT},
+           Row{"notes.", FILE_TYPE_DOCUMENT},
+           Row{"", FILE_TYPE_DOCUMENT},
+           Row{"/volume1/photo/", FILE_TYPE_DOCUMENT},
+           Row{"photo.JPEG", FILE_TYPE_PHOTO},
+           Row{"/volume1/video/movie.DVR-MS", FILE_TYPE_VIDEO},
+           Row{"song.Flac", FILE_TYPE_AUDIO},
+           Row{"archive.zip", FILE_TYPE_DOCUMENT},
+           Row{"archive.tar.gz", FILE_TYPE_DOCUMENT},
+           Row{"/volume1/a/odd.tx?", FILE_TYPE_DOCUMENT},
+           Row{"/v/x.emulecollection", FILE_TYPE_DOCUMENT},
+           Row{"/v/x.emulecollections", FILE_TYPE_OTHER},
+           Row{"/v/.jpg", FILE_TYPE_PHOTO},
+           Row{"photo.jpg ", FILE_TYPE_OTHER},
+           Row{std::string("/volume1/photo.jpg\0", 19), FILE_TYPE_OTHER},
+           Row{std::string("a.jpg\0", 6), FILE_TYPE_OTHER},
+           Row{"/volume1/photo/.DS_Store", FILE_TYPE_OTHER},
+           Row{"/volume1/caf\xC3\xA9.caf\xE9", FILE_TYPE_OTHER},
+       }) {
+    EXPECT_EQ(GetFileTypeByFullPath(row.path), row.want) << row.path;
+  }
+  EXPECT_EQ(GetFileTypeName(FILE_TYPE_OTHER), "other");
+  EXPECT_EQ(GetFileTypeName(GetFileTypeByFullPath("a.MTS")), "video");
+}
+
+// Beside a map that is asked with the extension as text.
+TEST(FileType, AgreesWithAMap) {
+  namespace data = file_type_table;
+  std::map<std::string, FileType> map;
+  const auto add = [&map](const auto& extensions, FileType type) {
+    for (const std::string_view extension : extensions) {
+      map.emplace(extension, type);
+    }
+  };
+  add(data::kDocument, FILE_TYPE_DOCUMENT);
+  add(data::kAudio, FILE_TYPE_AUDIO);
+  add(data::kVideo, FILE_TYPE_VIDEO);
+  add(data::kPhoto, FILE_TYPE_PHOTO);
+  ASSERT_EQ(map.size(), 738U);
+  std::vector<std::string> known;
+  for (const auto& [extension, type] : map) {
+    known.push_back(extension);
+  }
+  std::mt19937_64 random(1);
+  for (int i = 0; i < 200000; ++i) {
+    SCOPED_TRACE(i);
+    std::string path;
+    for (uint64_t length = random() % 30; length > 0; --length) {
+      path += "/.aB\xC3"[random() % 5];
+    }
+    path += "." + known[random() % known.size()];
+    for (uint64_t changes = random() % 3; changes > 0; --changes) {
+      char& byte = path[random() % path.size()];
+      byte = random() % 2 == 0 ? static_cast<char>(byte ^ 0x20) : static_cast<char>(random());
+    }
+    const auto found = map.find(vexlo::GetFileExtension(path, /*lower=*/true));
+    ASSERT_EQ(GetFileTypeByFullPath(path), found == map.end() ? FILE_TYPE_OTHER : found->second)
+        << path;
+  }
+}
+
+}  // namespace

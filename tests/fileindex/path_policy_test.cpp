@@ -1,0 +1,217 @@
+#include "fileindex/util/path_policy.h"
+
+#include <gtest/gtest.h>
+
+#include <map>
+#include <optional>
+
+#include "common/error.h"
+#include "fileindex/util/share_path.h"
+#include "kavo/filesystem.h"
+#include "kavo/share.h"
+#include "support/faults.h"
+#include "support/private_mounts.h"
+#include "support/private_root.h"
+#include "support/syslog_capture.h"
+
+using namespace vexlo::fileindex;
+
+namespace {
+
+const PrivateRoot root;
+std::vector<std::string> calls;
+std::map<std::string, int> answers;  // What a function returns instead of the platform's own.
+
+// Notes the call; the answer that is set for it, if one is.
+std::optional<int> Answer(const char* name) {
+  calls.emplace_back(name);
+  const auto answer = answers.find(name);
+  return answer == answers.end() ? std::nullopt : std::optional(answer->second);
+}
+
+}  // namespace
+
+#define RECORDED(name, parameters, arguments)                      \
+  INTERPOSED int name parameters {                                 \
+    static const auto real = REAL_FUNCTION(int, name, parameters); \
+    const std::optional<int> answer = Answer(#name);               \
+    return answer.has_value() ? *answer : real arguments;          \
+  }
+
+RECORDED(KLIBFhsPathInSnapshot, (const char* path, int* is_inside), (path, is_inside))
+RECORDED(KAVOGetFSType, (const char* path, int flags), (path, flags))
+RECORDED(KAVOFSIsRemoteFS, (int type), (type))
+RECORDED(KAVOFSIsImageFS, (int type), (type))
+RECORDED(KAVOShareNamePathGet,
+         (const char* full_path, char* name, int name_bytes, char* path, int path_bytes),
+         (full_path, name, name_bytes, path, path_bytes))
+RECORDED(KLIBShareIsReadOnlyGet, (const KAVO_SHARE* share, int* value), (share, value))
+RECORDED(KAVOShareIsShareRecycle, (const char* path), (path))
+RECORDED(KAVORecycleUserHomePathIsExist, (const char* path, int kind), (path, kind))
+RECORDED(KAVOFSDirIsMntPoint, (const char* path), (path))
+
+namespace {
+
+// A volume with a few shares in it.
+class PathPolicy : public testing::Test {
+ protected:
+  static void SetUpTestSuite() {
+    const std::string volume = root.MakeFolder("volume1");
+    std::string shares;
+    for (const std::string share : {"photo", "homes", "locked", "vault", "fixed", "@eaDir"}) {
+      shares += R"({"name": ")" + share + R"(", "path": ")" + volume + "/" + share + R"(")" +
+                (share == "locked"  ? R"(, "encrypted": true)"
+                 : share == "vault" ? R"(, "encryption": true)"
+                 : share == "fixed" ? R"(, "read_only": true)"
+                                    : "") +
+                (share == "@eaDir" ? "}" : "},");
+      root.MakeFolder("volume1/" + share);
+    }
+    root.SetShares(shares);
+    for (const char* folder : {"photo/a/.git", "photo/#snapshot/.snapshots/1", "photo/#recycle/old",
+                               "photo/x#recycle", "homes/ann/#recycle", "homes/#recycle",
+                               "photo/a/@eaDir", "photo/mounted", "vault/open"}) {
+      root.MakeFolder(std::string("volume1/") + folder);
+    }
+    WriteText(volume + "/photo/Thumbs.db", "");
+    WriteText(volume + "/photo/thumbs.db", "");
+    WriteText(volume + "/photo/caf\xE9 .git", "");
+    std::filesystem::create_symlink("a", volume + "/photo/link");
+    root.MakeFolder("elsewhere");
+  }
+
+  void SetUp() override {
+    calls.clear();
+    answers.clear();
+  }
+
+  static std::string Path(const std::string& name) { return root / "volume1/" + name; }
+
+  // The rule that decides, with a "?" behind it when it cannot tell; "" when the path passes. Both
+  // ways of asking must agree.
+  static std::string Decides(const std::string& path) {
+    SyslogCapture log;
+    std::string decides;
+    for (const RuleVerdict& verdict : ExplainFullPath(path)) {
+      EXPECT_FALSE(verdict.reason.empty()) << verdict.rule;
+      if (decides.empty() && verdict.answer != RuleVerdict::kPasses) {
+        decides = verdict.rule + std::string(verdict.answer == RuleVerdict::kCannotTell ? "?" : "");
+      }
+    }
+    calls.clear();
+    std::string thrown;
+    bool can_be_indexed = false;
+    try {
+      can_be_indexed = CanFullPathBeIndexed(path);
+    } catch (const vexlo::Error& error) {
+      thrown = error.what();
+    }
+    EXPECT_EQ(decides.ends_with("?"), !thrown.empty()) << thrown;
+    EXPECT_EQ(can_be_indexed, decides.empty());
+    return decides;
+  }
+};
+
+TEST_F(PathPolicy, TheFirstRuleThatRefusesDecides) {
+  for (const auto& [name, want] : {
+           std::pair{"photo", ""},
+           std::pair{"photo/thumbs.db", ""},
+           std::pair{"photo/caf\xE9 .git", ""},
+           std::pair{"photo/#snapshot", ""},
+           std::pair{"photo/x#recycle", ""},
+           std::pair{"vault/open", ""},
+           std::pair{"photo/#snapshot/.snapshots/1", "snapshot"},
+           std::pair{"photo/missing", "file_system"},
+           std::pair{"locked", "share"},
+           std::pair{"fixed", "share"},
+           std::pair{"photo/#recycle/old", "recycle_bin"},
+           std::pair{"homes/ann/#recycle", "recycle_bin"},
+           std::pair{"homes/#recycle", "recycle_bin"},
+           std::pair{"photo/Thumbs.db", "name"},
+           std::pair{"photo/a/.git", "name"},
+           std::pair{"photo/a/@eaDir", "name"},
+           std::pair{"@eaDir", "name"},
+           std::pair{"photo/link", "canonical"},
+           std::pair{"photo/a/", "canonical"},
+           std::pair{"photo//a", "canonical"},
+           std::pair{"photo/./a", "canonical"},
+           std::pair{"../elsewhere", "share?"},
+       }) {
+    EXPECT_EQ(Decides(Path(name)), want) << name;
+  }
+  SyslogCapture log;
+  EXPECT_FALSE(CanPathBeIndexed("/photo/link"));
+  EXPECT_TRUE(CanPathBeIndexed("/photo/a"));
+  EXPECT_TRUE(IsFullPathInRecycleBin(Path("homes/ann/#recycle/x")));
+  EXPECT_FALSE(IsFullPathInRecycleBin(Path("photo/ann/#recycle")));
+  EXPECT_THROW(IsFullPathInRecycleBin(root / "elsewhere"), vexlo::Error);
+  EXPECT_THROW(CanPathBeIndexed("/films"), vexlo::Error);
+}
+
+TEST_F(PathPolicy, WhatThePlatformSaysIsReadAsTheRuleWants) {
+  struct Row {
+    const char* function;
+    int result;
+    const char* name;
+    const char* want;
+  };
+  for (const Row& row : {
+           Row{"KLIBFhsPathInSnapshot", -1, "photo/#snapshot/.snapshots/1", ""},
+           Row{"KAVOGetFSType", -1, "photo", "file_system"},
+           Row{"KAVOGetFSType", 12, "photo", "file_system"},
+           Row{"KAVOGetFSType", 11, "photo", ""},
+           Row{"KAVOFSIsRemoteFS", 2, "photo", "file_system"},
+           Row{"KAVOFSIsImageFS", -1, "photo", "file_system"},
+           Row{"KAVOShareNamePathGet", -1, "photo", "share?"},
+           Row{"KLIBShareIsReadOnlyGet", -1, "photo", "share?"},
+           Row{"KAVOShareIsShareRecycle", 2, "photo/#recycle/old", ""},
+           Row{"KAVOShareIsShareRecycle", 1, "photo/a", ""},  // Not asked: no "#recycle" in it.
+           Row{"KAVOShareIsShareRecycle", 1, "photo/x#recycle", "recycle_bin"},
+           Row{"KAVORecycleUserHomePathIsExist", 1, "homes/ann", "recycle_bin"},
+           Row{"KAVORecycleUserHomePathIsExist", 1, "photo/a", ""},
+           Row{"KAVOFSDirIsMntPoint", 1, "photo/a", "mount_point"},
+           Row{"KAVOFSDirIsMntPoint", 2, "photo/a", ""},
+           Row{"KAVOFSDirIsMntPoint", -1, "photo/a", ""},
+           Row{"KAVOFSDirIsMntPoint", 1, "vault/open", ""},
+       }) {
+    answers = {{row.function, row.result}};
+    EXPECT_EQ(Decides(Path(row.name)), row.want) << row.function << row.result;
+  }
+}
+
+TEST_F(PathPolicy, TheRulesAreAskedInTheirOrder) {
+  EXPECT_TRUE(CanFullPathBeIndexed(Path("homes/ann")));
+  EXPECT_EQ(calls,
+            (std::vector<std::string>{"KAVOGetFSType", "KAVOFSIsRemoteFS", "KAVOFSIsImageFS",
+                                      "KAVOShareNamePathGet", "KLIBShareIsReadOnlyGet",
+                                      "KAVORecycleUserHomePathIsExist", "KAVOFSDirIsMntPoint"}));
+  calls.clear();
+  EXPECT_FALSE(CanFullPathBeIndexed(Path("photo/#snapshot/.snapshots/1")));
+  EXPECT_EQ(calls, (std::vector<std::string>{"KLIBFhsPathInSnapshot"}));
+}
+
+TEST_F(PathPolicy, RealMountsAreJudgedByWhatTheyAre) {
+  {
+    const auto bind = ScopedMount::Bind(root / "elsewhere", Path("photo/mounted"));
+    SKIP_IF_REFUSED(bind);
+    EXPECT_EQ(Decides(bind.Path()), "mount_point");
+  }
+  EXPECT_EQ(Decides(Path("photo/mounted")), "");
+  {
+    const auto bind = ScopedMount::Bind(root / "elsewhere", Path("vault/open"));
+    SKIP_IF_REFUSED(bind);
+    EXPECT_EQ(Decides(bind.Path()), "");
+  }
+  {
+    const auto tmpfs = ScopedMount::Tmpfs(Path("photo"), "", MS_RDONLY);
+    SKIP_IF_REFUSED(tmpfs);
+    EXPECT_EQ(Decides(tmpfs.Path()), "share");  // Read-only, whatever the shares file says.
+  }
+  const auto squashfs = ScopedMount::Image(
+      "mksquashfs " + root / "elsewhere" + " $IMAGE -quiet -no-progress -noappend",
+      root / "volume1/photo/mounted", "ro");
+  SKIP_IF_REFUSED(squashfs);
+  EXPECT_EQ(Decides(squashfs.Path()), "file_system");
+}
+
+}  // namespace

@@ -62,7 +62,9 @@ struct Command {
 };
 
 // One a command family.
+std::vector<Command> ExplainCommands();
 std::vector<Command> QueueCommands();
+std::vector<Command> ShareCommands();
 std::vector<Command> WatchCommands();
 
 // Finds the command, reads its arguments and runs it. `words` are the program's arguments without

@@ -7,9 +7,12 @@
 
 int main(int argc, char** argv) {
   std::ios::sync_with_stdio(false);
-  std::vector<vexlo::cli::Command> commands = vexlo::cli::QueueCommands();
-  for (vexlo::cli::Command& command : vexlo::cli::WatchCommands()) {
-    commands.push_back(std::move(command));
+  using vexlo::cli::Command;
+  std::vector<Command> commands;
+  for (auto* const family : {vexlo::cli::WatchCommands, vexlo::cli::QueueCommands,
+                             vexlo::cli::ExplainCommands, vexlo::cli::ShareCommands}) {
+    const std::vector<Command> more = family();
+    commands.insert(commands.end(), more.begin(), more.end());
   }
   const vexlo::cli::Console console = {std::cout, std::cerr, isatty(STDOUT_FILENO) == 1,
                                        isatty(STDERR_FILENO) == 1};

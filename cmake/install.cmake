@@ -36,11 +36,13 @@ endif()
 file(RELATIVE_PATH fileindex_bin_to_lib
   ${CMAKE_INSTALL_FULL_BINDIR} ${CMAKE_INSTALL_FULL_LIBDIR})
 set_property(TARGET ${fileindex_libraries} PROPERTY INSTALL_RPATH "$ORIGIN")
-set_property(TARGET fileindex_cli PROPERTY INSTALL_RPATH "$ORIGIN/${fileindex_bin_to_lib}")
+if(TARGET fileindex_cli)
+  set_property(TARGET fileindex_cli PROPERTY INSTALL_RPATH "$ORIGIN/${fileindex_bin_to_lib}")
+  install(TARGETS fileindex_cli RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+endif()
 
 install(TARGETS ${fileindex_libraries} EXPORT fileindexTargets
   LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
-install(TARGETS fileindex_cli RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
 install(EXPORT fileindexTargets NAMESPACE fileindex:: DESTINATION ${fileindex_package})
 
 write_basic_package_version_file(${CMAKE_BINARY_DIR}/fileindexConfigVersion.cmake

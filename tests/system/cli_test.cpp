@@ -40,6 +40,24 @@ const CliCase kCases[] = {
     {"Reindex", "queue has-reindex /v/s/photo/a/ --queue queue", 0, "*pending: /v/s/photo/a", ""},
     {"BadLine", "queue pending /w --queue bad", 3, "", "Malformed event_raw: \\033["},
     {"WatchFile", "watch queue", 3, "", "is no folder"},
+    {"NoShares", "share list", 1, "", "there are no shares in '"},
+    {"AddShare", "share add vol/photo --recycle --ftp-privilege 7", 0, "*added: photo (/", ""},
+    {"AddShareByLink", "share add link", 0, "*added: films (/", ""},
+    {"AddShareTwice", "share add vol/photo", 3, "", "photo"},
+    {"AddShareNoFolder", "share add queue", 3, "", "'queue' is no folder"},
+    {"AddShareBadPrivilege", "share add vol --ftp-privilege -1", 2, "", "'-1' is no FTP"},
+    {"ListShares", "share list", 0, "*vol/photo  recycle\n", ""},
+    {"ListSharesJson", "share list --json", 0, "*\"ftp_privilege\":7,", ""},
+    {"ExplainYes", "explain vol/photo/a.JPG", 0, "*type: photo\nshare: photo (", ""},
+    {"ExplainNo", "explain --json vol/photo/.git", 1, "*{\"can_be_indexed\":false,", ""},
+    {"ExplainNoShare", "explain vol", 1, "*share: none holds the path\n", ""},
+    {"RemoveShare", "share remove films", 0, "*removed: films", ""},
+    {"RemoveShareTwice", "share remove films", 3, "", "films"},
+};
+
+const CliCase kBadSharesCases[] = {
+    {"BadShares", "share list", 3, "", "shares.json:2: "},
+    {"ExplainBadShares", "explain vol/photo", 3, "", "shares.json:2: "},
 };
 
 // A run of the program, ended by timeout(1) if it would never end.
@@ -47,7 +65,8 @@ class Cli : public testing::Test {
  protected:
   // Runs it in the folder.
   void Start(const std::string& line) {
-    const std::string all = "cd " + files_.Path() + "; echo $$; exec timeout 20 " +
+    const std::string all = "cd " + files_.Path() +
+                            "; export FILEINDEX_ROOT=$PWD/root; echo $$; exec timeout 20 " +
                             FILEINDEX_PROGRAM " " + line + " 2> err";
     output_ = popen(all.c_str(), "re");
     out_.clear();
@@ -76,6 +95,15 @@ class Cli : public testing::Test {
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
   }
 
+  void Check(const CliCase& row) {
+    SCOPED_TRACE(row.name);
+    Start(row.line);
+    EXPECT_EQ(End(), row.status);
+    EXPECT_TRUE(out_ == row.out || (row.out[0] == '*' && out_.find(&row.out[1]) < out_.size()))
+        << out_;
+    EXPECT_NE(err_.find(row.err), std::string::npos) << err_;
+  }
+
   const TempFolder files_;
   std::string out_;
   std::string err_;
@@ -92,13 +120,16 @@ TEST_F(Cli, AnswersEveryCommandLine) {
   WriteText(files_ / "crashed", R"({"event":512,"path":"/v/s"})");
   WriteText(files_ / "bad", "\033[1m\n");
   WriteText(files_ / "old.tmp", R"({"event":8,"path":"/v/t/x"})");
+  std::filesystem::create_directories(files_ / "vol/photo/.git");
+  std::filesystem::create_directories(files_ / "films");
+  std::filesystem::create_symlink("films", files_ / "link");
+  WriteText(files_ / "vol/photo/a.JPG", "");
   for (const CliCase& row : kCases) {
-    SCOPED_TRACE(row.name);
-    Start(row.line);
-    EXPECT_EQ(End(), row.status);
-    EXPECT_TRUE(out_ == row.out || (row.out[0] == '*' && out_.find(&row.out[1]) < out_.size()))
-        << out_;
-    EXPECT_NE(err_.find(row.err), std::string::npos) << err_;
+    Check(row);
+  }
+  WriteText(files_ / "root/etc/kavo/shares.json", "{\"shares\": [\n{\"name\": \"a\"}]}");
+  for (const CliCase& row : kBadSharesCases) {
+    Check(row);
   }
 }
 

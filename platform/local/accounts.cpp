@@ -43,7 +43,9 @@ int LookUp(Find find, Take take) {
 template <typename Find>
 int LookUpUser(Find find, Account& account) {
   return LookUp<struct passwd>(find, [&account](const struct passwd& entry) {
-    account = {entry.pw_name, entry.pw_uid, entry.pw_gid, entry.pw_dir};
+    // Not every name service fills in what its users do without.
+    account = {entry.pw_name, entry.pw_uid, entry.pw_gid,
+               entry.pw_dir == nullptr ? "" : entry.pw_dir};
   });
 }
 

@@ -22,9 +22,8 @@
 FAULTABLE(pid_t, waitpid, (pid_t child, int* status, int options), (child, status, options))
 
 std::string root;
+std::string systemctl;  // What is run in its place.
 bool has_systemd = false;
-int systemctl_status = 0;
-std::string systemctl_arguments;
 
 // Stands before the platform's own.
 __attribute__((visibility("default"))) const std::string& kavo::local::Root() { return root; }
@@ -35,24 +34,13 @@ INTERPOSED int stat(const char* path, struct stat* info) noexcept {
   return real(!is_asked ? path : has_systemd ? "/" : "/dev/null", info);
 }
 
-// In place of systemctl a shell ends as the test says.
 INTERPOSED int posix_spawn(pid_t* pid, const char* path, const posix_spawn_file_actions_t* actions,
                            const posix_spawnattr_t* attributes, char* const* arguments,
                            char* const* environment) {
   static const auto real =
-      REAL_FUNCTION(int, posix_spawn,
-                    (decltype(pid), decltype(path), decltype(actions), decltype(attributes),
-                     decltype(arguments), decltype(environment)));
-  std::string command = "exit " + std::to_string(systemctl_status);
-  char shell[] = "/bin/sh";
-  char option[] = "-c";
-  char* const replaced[] = {shell, option, command.data(), nullptr};
-  const bool is_systemctl = std::string(path) == "/bin/systemctl";
-  for (char* const* each = arguments; is_systemctl && *each != nullptr; ++each) {
-    systemctl_arguments += *each + std::string(" ");
-  }
-  return real(pid, is_systemctl ? shell : path, actions, attributes,
-              is_systemctl ? replaced : arguments, environment);
+      reinterpret_cast<decltype(&posix_spawn)>(dlsym(RTLD_NEXT, "posix_spawn"));
+  return real(pid, std::string(path) == "/bin/systemctl" ? systemctl.c_str() : path, actions,
+              attributes, arguments, environment);
 }
 
 // What a run writes to its standard output.
@@ -122,6 +110,7 @@ TEST(KLIBCExec, WaitsForItsOwnChildAlone) {
   {
     const ScopedFault fault("waitpid", EINTR);
     std::vector<std::jthread> threads;
+    threads.reserve(80);
     for (int i = 0; i < 80; ++i) {
       threads.emplace_back([i] {
         const std::string script = "exit " + std::to_string(i);
@@ -135,25 +124,29 @@ TEST(KLIBCExec, WaitsForItsOwnChildAlone) {
 }
 
 TEST(KLIBService, TellsTheServiceManagerWhereThereIsOne) {
-  const std::string told = "/bin/systemctl --no-ask-password --no-block ";
+  const TempFolder folder;
+  systemctl = folder / "systemctl";
   const auto search = [](const char* share) { return KAVOSMBSetSpotlight(share, 1); };
-  using Case = std::tuple<int (*)(const char*), bool, const char*, int, int, std::string>;
-  for (const auto& [call, has_manager, folder, status, error, want] : {
-           Case{KLIBServicectlStart, true, "", 0, 0, told + "start -- -a.service "},
-           Case{KLIBServicectlStop, true, "", 0, 0, told + "stop -- -a.service "},
-           Case{KLIBServiceStart, true, "", 5, ENOENT, told + "start -- -a.service "},
-           Case{KLIBServiceRestart, true, "", 4, EACCES, told + "restart -- -a.service "},
-           Case{KLIBServiceRestart, true, "", 1, EIO, told + "restart -- -a.service "},
-           Case{KLIBServicectlStart, false, "", 0, 0, ""},
-           Case{KLIBServicectlStart, true, "/private", 0, 0, ""},
-           Case{search, true, "", 0, 0, ""},
+  using Case = std::tuple<int (*)(const char*), bool, const char*, const char*, int, std::string>;
+  for (const auto& [call, has_manager, own_root, status, error, want] : {
+           Case{KLIBServicectlStart, true, "", "0", 0, "start -- -a.service"},
+           Case{KLIBServicectlStop, true, "", "0", 0, "stop -- -a.service"},
+           Case{KLIBServiceStart, true, "", "5", ENOENT, "start -- -a.service"},
+           Case{KLIBServiceRestart, true, "", "4", EACCES, "restart -- -a.service"},
+           Case{KLIBServiceRestart, true, "", "1", EIO, "restart -- -a.service"},
+           Case{KLIBServicectlStart, false, "", "1", 0, ""},
+           Case{KLIBServicectlStart, true, "/private", "1", 0, ""},
+           Case{search, true, "", "1", 0, ""},
        }) {
-    std::tie(has_systemd, root, systemctl_status) = std::tie(has_manager, folder, status);
-    systemctl_arguments.clear();
+    std::tie(has_systemd, root) = std::tie(has_manager, own_root);
+    const std::string told = folder / "told";
+    WriteText(told, "");
+    WriteText(systemctl, "#!/bin/sh\nprintf '%s ' \"$@\" >" + told + "; exit " + status);
+    ASSERT_EQ(chmod(systemctl.c_str(), 0755), 0);
     SyslogCapture log;
     EXPECT_EQ(call("-a"), error == 0 ? 0 : -1) << want;
     EXPECT_TRUE(error == 0 || errno == error) << want;
-    EXPECT_EQ(systemctl_arguments, want);
-    EXPECT_EQ(log.Take().size(), want.empty() ? 1U : 0U) << want << folder;
+    EXPECT_EQ(ReadText(told), want.empty() ? "" : "--no-ask-password --no-block " + want + " ");
+    EXPECT_EQ(log.Take().size(), want.empty() ? 1U : 0U) << want << own_root;
   }
 }

@@ -23,6 +23,7 @@ struct TestUser {
 inline std::vector<TestUser> test_users;
 inline std::map<std::string, gid_t> test_groups;
 
+// NOLINTBEGIN(misc-definitions-in-headers): a program includes this once.
 #define TEST_USER_LOOK_UP(function, key, member)                                                   \
   INTERPOSED int function(key wanted, passwd* entry, char* buffer, size_t size, passwd** found) {  \
     for (TestUser & user : test_users) {                                                           \
@@ -55,5 +56,6 @@ INTERPOSED int getgrouplist(const char* name, gid_t, gid_t* groups, int* count) 
   }
   return -1;  // Memory is short; the count stays.
 }
+// NOLINTEND(misc-definitions-in-headers)
 
 #endif  // SUPPORT_ACCOUNTS_H_

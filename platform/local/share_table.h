@@ -16,6 +16,7 @@ namespace kavo::local {
 class ShareTable {
  public:
   explicit ShareTable(std::vector<Share> shares);
+  ~ShareTable() = default;
   ShareTable(const ShareTable&) = delete;
   ShareTable& operator=(const ShareTable&) = delete;
 

@@ -20,6 +20,20 @@
 
 FAULTABLE(ssize_t, read, (int fd, void* buffer, size_t size), (fd, buffer, size))
 
+// A file system whose time stamps tell seconds, as a few do.
+template <typename File>
+int CoarseStat(int (*real)(File, struct stat*), File file, struct stat* info) {
+  const int result = real(file, info);
+  info->st_mtim.tv_nsec = info->st_ctim.tv_nsec = 0;
+  return result;
+}
+INTERPOSED int stat(const char* path, struct stat* info) noexcept {
+  return CoarseStat(REAL_FUNCTION(int, stat, (const char*, struct stat*)), path, info);
+}
+INTERPOSED int fstat(int fd, struct stat* info) noexcept {
+  return CoarseStat(REAL_FUNCTION(int, fstat, (int, struct stat*)), fd, info);
+}
+
 // One file system is mounted read-only, whatever the machine has.
 INTERPOSED int statvfs(const char* path, struct statvfs* info) {
   *info = {};
@@ -29,16 +43,16 @@ INTERPOSED int statvfs(const char* path, struct statvfs* info) {
 
 namespace {
 
-const TempFolder root;
-const bool is_root_set = setenv("FILEINDEX_ROOT", root.Path().c_str(), 1) == 0;
+const TempFolder kRoot;
+const bool kIsRootSet = setenv("FILEINDEX_ROOT", kRoot.Path().c_str(), 1) == 0;
 
 class Shares : public testing::Test {
  protected:
   void SetUp() override {
-    if (kavo::local::Root() != root.Path()) {
+    if (kavo::local::Root() != kRoot.Path()) {
       GTEST_SKIP() << "a build for the system's own root looks nowhere else";
     }
-    std::filesystem::create_directories(root / "etc/kavo");
+    std::filesystem::create_directories(kRoot / "etc/kavo");
     Replace(R"({"shares": [
       {"name": "photo", "path": "/volume1/photo", "read_only": true, "ftp_privilege": 7},
       {"name": "homes", "path": "/volume1/homes", "recycle": true},
@@ -46,11 +60,11 @@ class Shares : public testing::Test {
       {"name": "mounted", "path": "/volume2/mounted", "encrypted": true, "hide_unreadable": true}
     ]})");
   }
-  void TearDown() override { std::filesystem::remove_all(root / "etc"); }
+  void TearDown() override { std::filesystem::remove_all(kRoot / "etc"); }
 
   static void Replace(const std::string& text) {
-    WriteText(file_ + ".new", text);
-    ASSERT_EQ(rename((file_ + ".new").c_str(), file_.c_str()), 0);
+    WriteText(kFile + ".new", text);
+    ASSERT_EQ(rename((kFile + ".new").c_str(), kFile.c_str()), 0);
   }
   static std::string HolderOf(const std::string& path) {
     char name[256];
@@ -60,7 +74,7 @@ class Shares : public testing::Test {
                : "";
   }
 
-  static inline const std::string file_ = root / "etc/kavo/shares.json";
+  static inline const std::string kFile = kRoot / "etc/kavo/shares.json";
 };
 
 using Record = std::unique_ptr<KAVO_SHARE, decltype(&KAVOShareFree)>;
@@ -139,10 +153,10 @@ TEST_F(Shares, SettingsAreThoseOfThePresentFile) {
   }
   EXPECT_EQ(Get("Photo"), nullptr);
   EXPECT_EQ(KLIBCErrGet(), KAVO_ERR_NOT_FOUND);
-  kavo::local::RemoveShare(file_, "photo");
-  kavo::local::AddShare(file_, {.name = "photo", .path = "/volume3/photo", .recycle = true});
+  kavo::local::RemoveShare(kFile, "photo");
+  kavo::local::AddShare(kFile, {.name = "photo", .path = "/volume3/photo", .recycle = true});
   EXPECT_EQ(settings(photo.get()), "00010");
-  unlink(file_.c_str());
+  unlink(kFile.c_str());
   EXPECT_EQ(settings(photo.get()), "-----");
   EXPECT_EQ(KLIBCErrGet(), KAVO_ERR_NOT_FOUND);
 }
@@ -178,9 +192,9 @@ TEST_F(Shares, ChangesAreSeenAtOnce) {
     return "{\"shares\": [{\"name\": \"x\", \"path\": \"" + path + "\"}]}";
   };
   for (int i = 100; i < 300; ++i) {
-    // Same size, same inode, often within one tick of the time stamps.
+    // Same size, same inode, and mostly the same time stamps.
     const std::string path = "/v" + std::to_string(i) + "/x";
-    WriteText(file_, only(path));
+    WriteText(kFile, only(path));
     ASSERT_EQ(HolderOf(path), "x " + path);
   }
   // Once the file is older than a tick, it is not read again until it changes.
@@ -216,34 +230,34 @@ TEST_F(Shares, ABadFileFailsEveryCallAndIsLoggedOnce) {
     return all_fail && KLIBCErrGet() == KAVO_ERR_BAD_CONFIG && std::string(text) == "before";
   };
   SyslogCapture log;
-  const std::string line = "<3>kavoplatform: " + file_ + ":1: \"shares\" must be a list";
+  const std::string line = "<3>kavoplatform: " + kFile + ":1: \"shares\" must be a list";
   for (const char* const bad : {"{}", "{ }"}) {
     Replace(bad);
     EXPECT_TRUE(fails() && fails());
     EXPECT_EQ(log.Take(), std::vector<std::string>{line});
   }
-  unlink(file_.c_str());
-  ASSERT_EQ(mkdir(file_.c_str(), 0755), 0);
+  unlink(kFile.c_str());
+  ASSERT_EQ(mkdir(kFile.c_str(), 0755), 0);
   EXPECT_TRUE(fails() && fails());
   EXPECT_EQ(log.Take().size(), 1U);
-  rmdir(file_.c_str());
+  rmdir(kFile.c_str());
   EXPECT_EQ(KAVOShareIsShareRecycle("/volume1/photo"), 0) << "no file: no shares";
   EXPECT_TRUE(log.Take().empty());
 }
 
 TEST_F(Shares, ThreadsAskWhileTheFileChanges) {
   std::atomic<bool> is_done = false;
-  std::vector<std::jthread> threads;
-  for (int i = 0; i < 4; ++i) {
-    threads.emplace_back([&is_done] {
+  std::jthread threads[4];
+  for (std::jthread& thread : threads) {
+    thread = std::jthread([&is_done] {
       while (!is_done) {
         EXPECT_EQ(HolderOf("/volume1/homes/ann"), "homes /volume1/homes");
       }
     });
   }
   for (int i = 0; i < 20; ++i) {
-    kavo::local::AddShare(file_, {.name = "new", .path = "/volume1/homes/new"});
-    kavo::local::RemoveShare(file_, "new");
+    kavo::local::AddShare(kFile, {.name = "new", .path = "/volume1/homes/new"});
+    kavo::local::RemoveShare(kFile, "new");
   }
   is_done = true;
 }
@@ -261,7 +275,7 @@ TEST_F(Shares, QueueAndIndexHaveAPlace) {
        }) {
     for (const auto& [compose, place] :
          {std::pair{&FILEIDXQueuePathCompose, "queue/"}, std::pair{&FILEIDXDBPathCompose, "db/"}}) {
-      const std::string want = root / "var/lib/kavo/fileindex/" + place + name;
+      const std::string want = kRoot / "var/lib/kavo/fileindex/" + place + name;
       char buffer[4096] = "before";
       EXPECT_EQ(compose(path.c_str(), buffer, want.size()), -1);
       EXPECT_EQ(errno, error == 0 ? ERANGE : error) << path;
@@ -276,5 +290,5 @@ TEST_F(Shares, QueueAndIndexHaveAPlace) {
   EXPECT_STREQ(id, "before");
   EXPECT_EQ(FILEIDXGetIndexID("photo", id, sizeof(id)), 0);
   EXPECT_STREQ(id, "fileindex_photo");
-  EXPECT_FALSE(std::filesystem::exists(root / "var")) << "nothing is made";
+  EXPECT_FALSE(std::filesystem::exists(kRoot / "var")) << "nothing is made";
 }

@@ -229,6 +229,7 @@ int main(int argc, char** argv) {
   const std::string photo = Volume() + "/photo";
   const std::vector<std::string> paths = MakePaths();
   std::vector<std::string> extensions;
+  extensions.reserve(paths.size());
   for (const std::string& path : paths) {
     extensions.push_back(vexlo::GetFileExtension(path, /*lower=*/true));
   }

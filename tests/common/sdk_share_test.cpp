@@ -20,7 +20,7 @@ using vexlo::sdk::SDKShare;
 
 namespace {
 
-const PrivateRoot root;
+const PrivateRoot kRoot;
 std::vector<std::string> calls;
 std::map<std::string, int> answers;  // What a question answers instead of the platform's own.
 int last_error = KAVO_ERR_NONE;
@@ -79,7 +79,7 @@ class Share : public testing::Test {
   void SetUp() override {
     calls.clear();
     answers.clear();
-    root.SetShares(R"({"name": "photo", "path": "/volume1/photo", "ftp_privilege": 4000000000},
+    kRoot.SetShares(R"({"name": "photo", "path": "/volume1/photo", "ftp_privilege": 4000000000},
                       {"name": "music", "path": "/volume2/music", "encrypted": true})");
   }
 };
@@ -198,12 +198,12 @@ TEST_F(Share, WhatIsCachedStaysWhenTheShareIsGone) {
   share.emplace("photo");
   const std::string queue = share->GetQueuePath();
   const std::string database = share->GetDBPath();
-  EXPECT_EQ(queue, root / "var/lib/kavo/fileindex/queue/%2Fvolume1%2Fphoto");
-  EXPECT_EQ(database, root / "var/lib/kavo/fileindex/db/%2Fvolume1%2Fphoto");
+  EXPECT_EQ(queue, kRoot / "var/lib/kavo/fileindex/queue/%2Fvolume1%2Fphoto");
+  EXPECT_EQ(database, kRoot / "var/lib/kavo/fileindex/db/%2Fvolume1%2Fphoto");
   EXPECT_EQ(share->GetDBName(), "fileindex_photo");
   EXPECT_EQ(share->GetFTPPrivilege(), 4000000000U);
   EXPECT_EQ(share->GetPrivilege("ann"), -7);
-  root.SetShares("");
+  kRoot.SetShares("");
   const ScopedFault fault("FILEIDXQueuePathCompose", EIO);
   EXPECT_EQ(share->GetQueuePath(), queue);
   EXPECT_EQ(share->GetPath() + share->GetName(), "/volume1/photophoto");

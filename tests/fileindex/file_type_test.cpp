@@ -8,8 +8,7 @@
 #include "common/string.h"
 #include "fileindex/util/file_type_table.h"
 
-using namespace vexlo::fileindex;
-
+namespace vexlo::fileindex {
 namespace {
 
 TEST(FileType, Names) {
@@ -59,6 +58,7 @@ TEST(FileType, AgreesWithAMap) {
   add(data::kPhoto, FILE_TYPE_PHOTO);
   ASSERT_EQ(map.size(), 738U);
   std::vector<std::string> known;
+  known.reserve(map.size());
   for (const auto& [extension, type] : map) {
     known.push_back(extension);
   }
@@ -81,3 +81,4 @@ TEST(FileType, AgreesWithAMap) {
 }
 
 }  // namespace
+}  // namespace vexlo::fileindex

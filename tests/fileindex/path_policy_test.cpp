@@ -14,11 +14,15 @@
 #include "support/private_root.h"
 #include "support/syslog_capture.h"
 
-using namespace vexlo::fileindex;
+using vexlo::fileindex::CanFullPathBeIndexed;
+using vexlo::fileindex::CanPathBeIndexed;
+using vexlo::fileindex::ExplainFullPath;
+using vexlo::fileindex::IsFullPathInRecycleBin;
+using vexlo::fileindex::RuleVerdict;
 
 namespace {
 
-const PrivateRoot root;
+const PrivateRoot kRoot;
 std::vector<std::string> calls;
 std::map<std::string, int> answers;  // What a function returns instead of the platform's own.
 
@@ -56,7 +60,7 @@ namespace {
 class PathPolicy : public testing::Test {
  protected:
   static void SetUpTestSuite() {
-    const std::string volume = root.MakeFolder("volume1");
+    const std::string volume = kRoot.MakeFolder("volume1");
     std::string shares;
     for (const std::string share : {"photo", "homes", "locked", "vault", "fixed", "@eaDir"}) {
       shares += R"({"name": ")" + share + R"(", "path": ")" + volume + "/" + share + R"(")" +
@@ -65,19 +69,19 @@ class PathPolicy : public testing::Test {
                  : share == "fixed" ? R"(, "read_only": true)"
                                     : "") +
                 (share == "@eaDir" ? "}" : "},");
-      root.MakeFolder("volume1/" + share);
+      kRoot.MakeFolder("volume1/" + share);
     }
-    root.SetShares(shares);
+    kRoot.SetShares(shares);
     for (const char* folder : {"photo/a/.git", "photo/#snapshot/.snapshots/1", "photo/#recycle/old",
                                "photo/x#recycle", "homes/ann/#recycle", "homes/#recycle",
                                "photo/a/@eaDir", "photo/mounted", "vault/open"}) {
-      root.MakeFolder(std::string("volume1/") + folder);
+      kRoot.MakeFolder(std::string("volume1/") + folder);
     }
     WriteText(volume + "/photo/Thumbs.db", "");
     WriteText(volume + "/photo/thumbs.db", "");
     WriteText(volume + "/photo/caf\xE9 .git", "");
     std::filesystem::create_symlink("a", volume + "/photo/link");
-    root.MakeFolder("elsewhere");
+    kRoot.MakeFolder("elsewhere");
   }
 
   void SetUp() override {
@@ -85,7 +89,7 @@ class PathPolicy : public testing::Test {
     answers.clear();
   }
 
-  static std::string Path(const std::string& name) { return root / "volume1/" + name; }
+  static std::string Path(const std::string& name) { return kRoot / "volume1/" + name; }
 
   // The rule that decides, with a "?" behind it when it cannot tell; "" when the path passes. Both
   // ways of asking must agree.
@@ -144,7 +148,7 @@ TEST_F(PathPolicy, TheFirstRuleThatRefusesDecides) {
   EXPECT_TRUE(CanPathBeIndexed("/photo/a"));
   EXPECT_TRUE(IsFullPathInRecycleBin(Path("homes/ann/#recycle/x")));
   EXPECT_FALSE(IsFullPathInRecycleBin(Path("photo/ann/#recycle")));
-  EXPECT_THROW(IsFullPathInRecycleBin(root / "elsewhere"), vexlo::Error);
+  EXPECT_THROW(IsFullPathInRecycleBin(kRoot / "elsewhere"), vexlo::Error);
   EXPECT_THROW(CanPathBeIndexed("/films"), vexlo::Error);
 }
 
@@ -192,13 +196,13 @@ TEST_F(PathPolicy, TheRulesAreAskedInTheirOrder) {
 
 TEST_F(PathPolicy, RealMountsAreJudgedByWhatTheyAre) {
   {
-    const auto bind = ScopedMount::Bind(root / "elsewhere", Path("photo/mounted"));
+    const auto bind = ScopedMount::Bind(kRoot / "elsewhere", Path("photo/mounted"));
     SKIP_IF_REFUSED(bind);
     EXPECT_EQ(Decides(bind.Path()), "mount_point");
   }
   EXPECT_EQ(Decides(Path("photo/mounted")), "");
   {
-    const auto bind = ScopedMount::Bind(root / "elsewhere", Path("vault/open"));
+    const auto bind = ScopedMount::Bind(kRoot / "elsewhere", Path("vault/open"));
     SKIP_IF_REFUSED(bind);
     EXPECT_EQ(Decides(bind.Path()), "");
   }
@@ -208,8 +212,8 @@ TEST_F(PathPolicy, RealMountsAreJudgedByWhatTheyAre) {
     EXPECT_EQ(Decides(tmpfs.Path()), "share");  // Read-only, whatever the shares file says.
   }
   const auto squashfs = ScopedMount::Image(
-      "mksquashfs " + root / "elsewhere" + " $IMAGE -quiet -no-progress -noappend",
-      root / "volume1/photo/mounted", "ro");
+      "mksquashfs " + kRoot / "elsewhere" + " $IMAGE -quiet -no-progress -noappend",
+      kRoot / "volume1/photo/mounted", "ro");
   SKIP_IF_REFUSED(squashfs);
   EXPECT_EQ(Decides(squashfs.Path()), "file_system");
 }

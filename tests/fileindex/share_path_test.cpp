@@ -8,11 +8,14 @@
 #include "support/private_root.h"
 #include "support/syslog_capture.h"
 
-using namespace vexlo::fileindex;
+using vexlo::fileindex::GetFullPath;
+using vexlo::fileindex::GetShareNameByPath;
+using vexlo::fileindex::GetShareNamePathByFullPath;
+using vexlo::fileindex::ReplacePathShare;
 
 namespace {
 
-const PrivateRoot root;
+const PrivateRoot kRoot;
 
 std::string ShareOf(const std::string& full_path) {
   std::string name;
@@ -56,7 +59,7 @@ const Row kRows[] = {
 };
 
 TEST(SharePath, Answers) {
-  root.SetShares(R"({"name": "music", "path": "/volume2/music"},
+  kRoot.SetShares(R"({"name": "music", "path": "/volume2/music"},
                     {"name": "photo", "path": "/photo"})");
   for (size_t i = 0; i < std::size(kRows); ++i) {
     SCOPED_TRACE(i);

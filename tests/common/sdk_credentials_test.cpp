@@ -137,7 +137,8 @@ TEST(SDKCredentials, TheReasonBeginsAtTheErrorNumber) {
   effective = 4242;
   for (const auto& [number, reason] :
        {std::pair{0, "KAVOUserGetByUID failed, err="}, std::pair{5, "serGetByUID failed, err="},
-        std::pair{28, "="}, std::pair{29, ""}, std::pair{0x2900, ""}, std::pair{-1, ""}}) {
+        std::pair{28, "="}, std::pair{29, ""}, std::pair{30, ""}, std::pair{0x2900, ""},
+        std::pair{-1, ""}}) {
     last_error = number;
     SyslogCapture log;
     try {

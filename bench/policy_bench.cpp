@@ -29,14 +29,15 @@
 
 #include "common/string.h"
 #include "fileindex/util/file_type.h"
-#include "fileindex/util/file_type_table.h"
 #include "fileindex/util/path_policy.h"
 #include "kavo/local/shares.h"
 
 namespace {
 
 using vexlo::fileindex::CanFullPathBeIndexed;
+using vexlo::fileindex::FileType;
 using vexlo::fileindex::GetFileTypeByFullPath;
+using vexlo::fileindex::GetFileTypeExtensions;
 
 constexpr int kShares = 3000;
 constexpr size_t kPaths = 4096;
@@ -111,12 +112,12 @@ void Decide(benchmark::State& state, const std::string& path, bool want) {
 
 // Half of them with an extension of the table, the rest with others, none and in upper case.
 std::vector<std::string> MakePaths() {
-  namespace data = vexlo::fileindex::file_type_table;
+  const auto documents = GetFileTypeExtensions(vexlo::fileindex::FILE_TYPE_DOCUMENT);
   std::mt19937_64 random(1);
   std::vector<std::string> paths;
   for (size_t i = 0; i < kPaths; ++i) {
     std::string path = "/volume1/photo/2019/summer/file" + std::to_string(random() % 100000);
-    const std::string_view known = data::kDocument[random() % std::size(data::kDocument)];
+    const std::string_view known = documents[random() % documents.size()];
     switch (random() % 8) {
       case 0:
         break;
@@ -138,17 +139,12 @@ std::vector<std::string> MakePaths() {
 }
 
 std::map<std::string, int> MakeMap() {
-  namespace data = vexlo::fileindex::file_type_table;
   std::map<std::string, int> map;
-  const auto add = [&map](const auto& extensions, int type) {
-    for (const std::string_view extension : extensions) {
+  for (int type = 0; type < 4; ++type) {
+    for (const std::string_view extension : GetFileTypeExtensions(static_cast<FileType>(type))) {
       map.emplace(extension, type);
     }
-  };
-  add(data::kDocument, 0);
-  add(data::kAudio, 1);
-  add(data::kVideo, 2);
-  add(data::kPhoto, 3);
+  }
   return map;
 }
 

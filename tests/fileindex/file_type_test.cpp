@@ -6,7 +6,6 @@
 #include <random>
 
 #include "common/string.h"
-#include "fileindex/util/file_type_table.h"
 
 namespace vexlo::fileindex {
 namespace {
@@ -45,17 +44,13 @@ TEST(FileType, Names) {
 
 // Beside a map that is asked with the extension as text.
 TEST(FileType, AgreesWithAMap) {
-  namespace data = file_type_table;
   std::map<std::string, FileType> map;
-  const auto add = [&map](const auto& extensions, FileType type) {
-    for (const std::string_view extension : extensions) {
+  for (const FileType type :
+       {FILE_TYPE_DOCUMENT, FILE_TYPE_AUDIO, FILE_TYPE_VIDEO, FILE_TYPE_PHOTO}) {
+    for (const std::string_view extension : GetFileTypeExtensions(type)) {
       map.emplace(extension, type);
     }
-  };
-  add(data::kDocument, FILE_TYPE_DOCUMENT);
-  add(data::kAudio, FILE_TYPE_AUDIO);
-  add(data::kVideo, FILE_TYPE_VIDEO);
-  add(data::kPhoto, FILE_TYPE_PHOTO);
+  }
   ASSERT_EQ(map.size(), 738U);
   std::vector<std::string> known;
   known.reserve(map.size());

@@ -65,9 +65,9 @@ constexpr size_t SlotOf(Key key) {
   return static_cast<size_t>(mixed >> (64 - kSlotBits));
 }
 
-constexpr void Fill(Table& table, const std::string_view* extensions, size_t count, FileType type) {
-  for (size_t i = 0; i < count; ++i) {
-    const Key key = MakeKey(extensions[i]);
+constexpr void Fill(Table& table, std::span<const std::string_view> extensions, FileType type) {
+  for (const std::string_view extension : extensions) {
+    const Key key = MakeKey(extension);
     size_t slot = SlotOf(key);
     while (table.types[slot] != kEmpty && table.keys[slot] != key) {
       slot = (slot + 1) % kSlots;
@@ -78,14 +78,28 @@ constexpr void Fill(Table& table, const std::string_view* extensions, size_t cou
   }
 }
 
+constexpr std::span<const std::string_view> ExtensionsOfType(FileType type) {
+  switch (type) {
+    case FILE_TYPE_DOCUMENT:
+      return file_type_table::kDocument;
+    case FILE_TYPE_AUDIO:
+      return file_type_table::kAudio;
+    case FILE_TYPE_VIDEO:
+      return file_type_table::kVideo;
+    case FILE_TYPE_PHOTO:
+      return file_type_table::kPhoto;
+    default:
+      return {};
+  }
+}
+
 constexpr Table MakeTable() {
-  namespace data = file_type_table;
   Table table;
   table.types.fill(kEmpty);
-  Fill(table, std::data(data::kDocument), std::size(data::kDocument), FILE_TYPE_DOCUMENT);
-  Fill(table, std::data(data::kAudio), std::size(data::kAudio), FILE_TYPE_AUDIO);
-  Fill(table, std::data(data::kVideo), std::size(data::kVideo), FILE_TYPE_VIDEO);
-  Fill(table, std::data(data::kPhoto), std::size(data::kPhoto), FILE_TYPE_PHOTO);
+  for (const FileType type :
+       {FILE_TYPE_DOCUMENT, FILE_TYPE_AUDIO, FILE_TYPE_VIDEO, FILE_TYPE_PHOTO}) {
+    Fill(table, ExtensionsOfType(type), type);
+  }
   return table;
 }
 
@@ -138,6 +152,10 @@ FileType GetFileTypeByFullPath(const std::string& full_path) {
     }
   }
   return FILE_TYPE_OTHER;
+}
+
+std::span<const std::string_view> GetFileTypeExtensions(FileType type) {
+  return ExtensionsOfType(type);
 }
 
 std::string_view GetFileTypeName(FileType type) {

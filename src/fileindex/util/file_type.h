@@ -3,6 +3,7 @@
 #define FILEINDEX_UTIL_FILE_TYPE_H_
 
 #include <cstdint>
+#include <span>
 #include <string>
 #include <string_view>
 
@@ -23,6 +24,10 @@ enum FileType : int32_t {
 // ends in a dot are documents; what is in no group is FILE_TYPE_OTHER. Looks at the text of the
 // path alone and allocates nothing.
 VEXLO_EXPORT FileType GetFileTypeByFullPath(const std::string& full_path);
+
+// The extensions of a group, in lower case and without the dot; "" among those of documents. None
+// for FILE_TYPE_OTHER.
+VEXLO_EXPORT std::span<const std::string_view> GetFileTypeExtensions(FileType type);
 
 // "document", "audio", "video", "photo" or "other".
 VEXLO_EXPORT std::string_view GetFileTypeName(FileType type);

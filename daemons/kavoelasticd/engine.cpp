@@ -149,10 +149,13 @@ Json::Value Engine::Compound(const Json::Value& list) {
   Json::Value results(Json::arrayValue);
   results.resize(list.size());
   const auto id_of = [&](Json::ArrayIndex i) -> std::string {
-    const bool known = list[i].isObject() && list[i]["data"].isObject() &&
-                       list[i]["data"]["id"].isString() && list[i]["command"].isString() &&
-                       IsWrite(list[i]["command"].asString());
-    return known ? list[i]["data"]["id"].asString() : "";
+    const Json::Value& item = list[i];
+    if (!item.isObject() || !item["command"].isString() || !IsWrite(item["command"].asString()) ||
+        !item["data"].isObject()) {
+      return "";
+    }
+    const Json::Value& id = item["data"]["id"];
+    return id.isString() ? id.asString() : "";
   };
   // What stands together for one index is done together.
   for (Json::ArrayIndex from = 0; from < list.size();) {
@@ -177,8 +180,9 @@ void Engine::CompoundRun(const Json::Value& list, Json::ArrayIndex from, Json::A
                          const std::string& id, Json::Value* results) {
   const auto run_item = [&](Writer& writer, size_t i) {
     const auto at = from + static_cast<Json::ArrayIndex>(i);
+    const Json::Value& request = list[at];
     try {
-      RunWrite(writer, list[at]["command"].asString(), list[at]["data"]);
+      RunWrite(writer, request["command"].asString(), request["data"]);
       (*results)[at] = Success();
     } catch (const SqlError&) {
       throw;

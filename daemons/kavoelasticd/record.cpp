@@ -81,6 +81,14 @@ std::string Record::Encode() const {
   return out;
 }
 
+bool Record::SameStored(const Record& other) const {
+  return std::equal(items_.begin(), items_.end(), other.items_.begin(), other.items_.end(),
+                    [](const Item& a, const Item& b) {
+                      return a.field == b.field && a.kind == b.kind &&
+                             (!HasBytes(a.kind) || a.bytes == b.bytes);
+                    });
+}
+
 namespace {
 bool Before(const Item& item, uint32_t field) { return item.field < field; }
 }  // namespace

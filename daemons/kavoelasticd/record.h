@@ -45,6 +45,9 @@ class Record {
   // One byte run of field, kind and length with the bytes behind them; texts of kBody are left out.
   std::string Encode() const;
 
+  // Whether Encode() gives the same for both.
+  bool SameStored(const Record& other) const;
+
   const std::vector<Item>& Items() const { return items_; }
   const Item* Find(uint32_t field) const;
   // Sets a field's value, instead of another one.

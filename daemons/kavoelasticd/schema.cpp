@@ -4,6 +4,7 @@
 #include <string_view>
 
 #include "daemons/kavoelasticd/failure.h"
+#include "daemons/kavoelasticd/fields.h"
 #include "daemons/kavoelasticd/fold.h"
 
 namespace vexlo::elasticd {
@@ -96,6 +97,10 @@ Lookup LookupOf(const Field& field, bool listed) {
   return listed && field.type == FieldType::kText ? Lookup::kText : Lookup::kWords;
 }
 
+bool IsFilter(std::string_view name) {
+  return name == kExtensionField || name == kSizeField || name == kModifiedField;
+}
+
 constexpr std::string_view kSpace = " \t\n\r\v\f";
 
 std::vector<std::string> SplitAtSpace(std::string_view text, bool escaped) {
@@ -144,6 +149,7 @@ Schema::Schema(const Json::Value& mappings) {
     Field field = default_;
     field.name = name;
     field = Apply(field, properties[name]);
+    field.filter = IsFilter(name);
     field.lookup = name == key_ ? Lookup::kKey : LookupOf(field, /*listed=*/true);
     if (field.lookup == Lookup::kText) {
       field.column = static_cast<int>(text_columns_.size());
@@ -169,6 +175,7 @@ Field Schema::Rules(const std::string& name) const {
   }
   Field field = default_;
   field.name = name;
+  field.filter = IsFilter(name);
   return field;
 }
 

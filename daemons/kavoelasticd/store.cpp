@@ -14,7 +14,7 @@
 namespace vexlo::elasticd {
 namespace {
 
-constexpr size_t kCommitAfter = 10'000;
+constexpr size_t kCommitAfter = 20'000;
 constexpr size_t kIdleReaders = 8;
 
 [[noreturn]] void Damaged(const std::string& what) { throw Failure(Code::kIndexDamaged, what); }

@@ -38,7 +38,7 @@ class Store {
   Store& operator=(const Store&) = delete;
 
   // Calls `change` with the writer, while nobody else has it. When the database fails in it,
-  // everything since the last commit is lost (see Writer). Commits after 10,000 changes.
+  // everything since the last commit is lost (see Writer). Commits after 20,000 changes.
   void Write(const std::function<void(Writer&, Session&)>& change);
   // Calls `read` with a session that sees all that was written, committed or not.
   void Read(const std::function<void(Session&)>& read);

@@ -17,13 +17,20 @@ namespace {
 
 constexpr size_t kDeleteSlice = 1000;
 
-enum Table : unsigned { kTexts = 1, kWordTable = 2, kGramTable = 4, kExactTable = 8 };
+enum Table : unsigned {
+  kTexts = 1,
+  kWordTable = 2,
+  kGramTable = 4,
+  kExactTable = 8,
+  kDocsTable = 16,  // Its columns beside the path.
+};
 
 using Row = std::vector<std::string>;
 using ExactRows = std::set<std::pair<uint32_t, std::string>>;
 
 unsigned TablesOf(const Field& field) {
-  const unsigned all = field.all ? static_cast<unsigned>(kWordTable) : 0;
+  const unsigned filter = field.filter ? static_cast<unsigned>(kDocsTable) : 0;
+  const unsigned all = filter | (field.all ? static_cast<unsigned>(kWordTable) : 0);
   switch (field.lookup) {
     case Lookup::kKey:
       return 0;
@@ -35,9 +42,9 @@ unsigned TablesOf(const Field& field) {
     case Lookup::kGrams:
       return all | kGramTable;
     case Lookup::kText:
-      return kTexts;
+      return filter | kTexts;
     case Lookup::kWords:
-      return kWordTable;
+      return filter | kWordTable;
   }
   return 0;
 }
@@ -89,7 +96,6 @@ struct DocsRow {
   std::optional<std::string> extension;
   std::optional<int64_t> size;
   std::optional<int64_t> modified;
-  bool operator==(const DocsRow&) const = default;
 };
 
 DocsRow DocsRowOf(Session& session, const StoredDocument& document) {
@@ -180,9 +186,8 @@ void Writer::CheckRequired(const Json::Value& data, bool whole) const {
     throw Failure(Code::kBadDocument, "the document is no object");
   }
   for (const auto& [name, field] : session_.schema.Listed()) {
-    const bool missing = whole ? !data.isMember(name) : false;
     if (field.required && name != session_.schema.Key() &&
-        (missing || (data.isMember(name) && data[name].isNull()))) {
+        (whole || data.isMember(name)) && data[name].isNull()) {
       throw Failure(Code::kBadDocument, name + " is required");
     }
   }
@@ -308,9 +313,19 @@ unsigned Writer::ChangedTables(Change& change) {
   unsigned tables = 0;
   for (const Item& before : change.before.record.Items()) {
     const Item* const after = change.after.record.Find(before.field);
-    if (after == nullptr || !Same(change, before, *after)) {
-      tables |= TablesOf(session_.FieldOf(before.field));
+    const Field& field = session_.FieldOf(before.field);
+    const unsigned all = TablesOf(field);
+    unsigned changed = after != nullptr && Same(change, before, *after) ? 0U : all;
+    if (after != nullptr && FoundByPath(field)) {
+      // A value that follows from the path has no entry; one that ceases to needs one.
+      const bool by_path = before.kind == Kind::kParent;
+      if (by_path != (after->kind == Kind::kParent)) {
+        changed |= all & kExactTable;
+      } else if (by_path) {
+        changed &= ~static_cast<unsigned>(kExactTable);
+      }
     }
+    tables |= changed;
   }
   for (const Item& after : change.after.record.Items()) {
     if (change.before.record.Find(after.field) == nullptr) {
@@ -391,7 +406,7 @@ void Writer::MakeRoom(const std::string& path) {
   }
 }
 
-void Writer::WriteRows(Change& change) {
+void Writer::WriteRows(Change& change, bool filters_differ) {
   Connection& db = session_.db;
   const bool exists = !change.before.path.empty();
   if (change.after.path.empty()) {
@@ -399,9 +414,8 @@ void Writer::WriteRows(Change& change) {
     Sql(db, "DELETE FROM records WHERE id = ?").Int(change.after.id).Run();
     return;
   }
-  const DocsRow row = DocsRowOf(session_, change.after);
-  const std::string record = change.after.record.Encode();
   if (!exists) {
+    const DocsRow row = DocsRowOf(session_, change.after);
     Sql docs(db, "INSERT INTO docs(path, ext, size, mtime) VALUES(?,?,?,?)");
     docs.Blob(change.after.path);
     Bind(docs, row.extension);
@@ -409,14 +423,17 @@ void Writer::WriteRows(Change& change) {
     Bind(docs, row.modified);
     docs.Run();
     change.after.id = db.LastInsertId();
+    const std::string record = change.after.record.Encode();
     Sql(db, "INSERT INTO records VALUES(?,?)").Int(change.after.id).Blob(record).Run();
     return;
   }
-  if (record != change.before.record.Encode()) {
+  if (!change.after.record.SameStored(change.before.record)) {
+    const std::string record = change.after.record.Encode();
     Sql(db, "UPDATE records SET record = ? WHERE id = ?").Blob(record).Int(change.after.id).Run();
   }
   const bool moved = change.before.path != change.after.path;
-  if (row != DocsRowOf(session_, change.before)) {
+  if (filters_differ) {
+    const DocsRow row = DocsRowOf(session_, change.after);
     Sql docs(db, "UPDATE docs SET ext = ?, size = ?, mtime = ? WHERE id = ?");
     Bind(docs, row.extension);
     Bind(docs, row.size);
@@ -447,8 +464,9 @@ void Writer::Apply(Change& change) {
   }
   const unsigned tables = ChangedTables(change);
   const bool exists = !change.before.path.empty();
+  const bool filters_differ = (tables & kDocsTable) != 0;
   if (!exists) {
-    WriteRows(change);
+    WriteRows(change, filters_differ);
   }
   const size_t texts = std::max<size_t>(1, session_.schema.TextColumns().size());
   const size_t grams = std::max<size_t>(1, session_.schema.GramColumns().size());
@@ -473,7 +491,7 @@ void Writer::Apply(Change& change) {
     WriteExact(change);
   }
   if (exists) {
-    WriteRows(change);
+    WriteRows(change, filters_differ);
   }
   WriteBodies(change);
   ++changes_;

@@ -61,7 +61,7 @@ class Writer {
   bool Same(Change& change, const Item& before, const Item& after);
   void WriteBodies(Change& change);
   void WriteExact(Change& change);
-  void WriteRows(Change& change);
+  void WriteRows(Change& change, bool filters_differ);
   void MakeRoom(const std::string& path);
   void CheckRequired(const Json::Value& data, bool whole) const;
 

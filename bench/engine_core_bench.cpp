@@ -91,8 +91,9 @@ class Corpus {
     for (size_t depth = (i / 40) % 6; depth > 0; --depth) {
       folder += "/level " + std::to_string((i / 40) % (10 + depth * 7));
     }
-    return i % 500 == 0 ? folder + std::string(900, 'd').insert(250, "/").insert(500, "/").insert(750, "/")
-                        : folder;
+    return i % 500 == 0
+               ? folder + std::string(900, 'd').insert(250, "/").insert(500, "/").insert(750, "/")
+               : folder;
   }
 
   Json::Value Document(size_t i) {
@@ -239,15 +240,17 @@ void Run(size_t documents, const std::string& folder) {
   Json::Value filtered = With("words", common);
   filtered["below"] = to;
   filtered["types"].append("txt");
-  Queries(engine, {{"word", With("words", common)},
-                   {"two words", With("words", common + " " + same.Word())},
-                   {"phrase", With("words", "\"" + made[0]["KAVOMDTextContent"].asString().substr(0, 14) + "\"")},
-                   {"beginning of a word", With("words", common.substr(0, 3) + "*")},
-                   {"word, folder and type", filtered},
-                   {"part of a name, 5 letters", With("name", name.substr(1, 5))},
-                   {"part of a name, 2 ideographs", With("name", "\u65c5\u884c")},
-                   {"part of a name, 1 letter", With("name", "q")},
-                   {"below a folder", With("below", to)}});
+  Queries(engine,
+          {{"word", With("words", common)},
+           {"two words", With("words", common + " " + same.Word())},
+           {"phrase",
+            With("words", "\"" + made[0]["KAVOMDTextContent"].asString().substr(0, 14) + "\"")},
+           {"beginning of a word", With("words", common.substr(0, 3) + "*")},
+           {"word, folder and type", filtered},
+           {"part of a name, 5 letters", With("name", name.substr(1, 5))},
+           {"part of a name, 2 ideographs", With("name", "\u65c5\u884c")},
+           {"part of a name, 1 letter", With("name", "q")},
+           {"below a folder", With("below", to)}});
 
   Json::Value remove = Command("document_del_by_query");
   remove["data"]["query"]["qsl"]["prefix"]["KAVOMDPath"] = to + "/";

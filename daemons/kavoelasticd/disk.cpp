@@ -102,7 +102,7 @@ void RemoveIndexFolder(const std::string& folder) {
     }
   }
   for (const std::string& path : aside) {
-    Remove(path);
+    std::filesystem::remove_all(path, error);  // What was set aside may be anything.
   }
   rmdir(folder.c_str());  // It may hold what others put there.
 }

@@ -44,8 +44,8 @@ uint64_t TakeNumber(std::string_view* in) {
 
 Record Record::Decode(std::string bytes) {
   Record record;
-  record.owned_.push_back(std::move(bytes));
-  std::string_view in = record.owned_.back();
+  record.owned_.push_front(std::move(bytes));
+  std::string_view in = record.owned_.front();
   record.items_.reserve(32);
   while (!in.empty()) {
     const auto field = static_cast<uint32_t>(TakeNumber(&in));
@@ -108,8 +108,8 @@ void Record::Insert(const Item& item) {
 }
 
 void Record::Put(uint32_t field, Kind kind, std::string bytes) {
-  owned_.push_back(std::move(bytes));
-  Insert({field, kind, owned_.back()});
+  owned_.push_front(std::move(bytes));
+  Insert({field, kind, owned_.front()});
 }
 
 void Record::PutInt(uint32_t field, int64_t value) {
@@ -137,8 +137,8 @@ void Record::Remove(uint32_t field) {
 }
 
 void Record::Fill(uint32_t field, std::string text) {
-  owned_.push_back(std::move(text));
-  Insert({field, Kind::kBody, owned_.back()});
+  owned_.push_front(std::move(text));
+  Insert({field, Kind::kBody, owned_.front()});
 }
 
 Record Record::Copy() const {
@@ -149,7 +149,7 @@ Record Record::Copy() const {
   for (const Item& item : items_) {
     size += item.bytes.size();
   }
-  std::string& block = copy.owned_.emplace_back();
+  std::string& block = copy.owned_.emplace_front();
   block.reserve(size + 1);
   for (Item& item : copy.items_) {
     if (item.bytes.data() != nullptr) {

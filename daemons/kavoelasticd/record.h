@@ -3,7 +3,7 @@
 #define DAEMONS_KAVOELASTICD_RECORD_H_
 
 #include <cstdint>
-#include <deque>
+#include <forward_list>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -65,7 +65,7 @@ class Record {
   void Insert(const Item& item);
 
   std::vector<Item> items_;
-  std::deque<std::string> owned_;
+  std::forward_list<std::string> owned_;
 };
 
 int64_t IntOf(const Item& item);

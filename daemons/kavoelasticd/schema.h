@@ -35,7 +35,7 @@ struct Field {
   bool ngram = false;
   bool list_ancestor = false;
   Lookup lookup = Lookup::kWords;
-  int column = -1;    // Of the table for kText or kGrams.
+  int column = -1;      // Of the table for kText or kGrams.
   bool filter = false;  // Searches filter and sort by it.
 };
 

@@ -78,40 +78,36 @@ void Connection::Run(const std::string& sql) {
 bool Connection::InTransaction() const { return sqlite3_get_autocommit(db_.get()) == 0; }
 int64_t Connection::LastInsertId() const { return sqlite3_last_insert_rowid(db_.get()); }
 
-StatementPtr Connection::Take(const std::string& sql) {
-  std::vector<StatementPtr>& idle = idle_[sql];
+Connection::Idle::value_type& Connection::IdleOf(std::string_view sql) {
+  const auto found = idle_.find(sql);
+  return found != idle_.end() ? *found : *idle_.try_emplace(std::string(sql)).first;
+}
+
+Sql::Sql(Connection& db, std::string_view sql) : db_(db), kept_(db.IdleOf(sql)) {
+  std::vector<StatementPtr>& idle = kept_.second;
   if (!idle.empty()) {
-    StatementPtr statement = std::move(idle.back());
+    statement_ = std::move(idle.back());
     idle.pop_back();
-    return statement;
+    return;
   }
   sqlite3_stmt* statement = nullptr;
-  const int result = sqlite3_prepare_v3(db_.get(), sql.c_str(), static_cast<int>(sql.size()),
-                                        SQLITE_PREPARE_PERSISTENT, &statement, nullptr);
-  if (result != SQLITE_OK) {
-    Fail(result, sql);
-  }
-  return StatementPtr(statement);
+  Check(sqlite3_prepare_v3(db_.db_.get(), kept_.first.c_str(), static_cast<int>(sql.size()),
+                           SQLITE_PREPARE_PERSISTENT, &statement, nullptr));
+  statement_.reset(statement);
 }
-
-void Connection::Give(const std::string& sql, StatementPtr statement) {
-  idle_[sql].push_back(std::move(statement));
-}
-
-Sql::Sql(Connection& db, const std::string& sql) : db_(db), sql_(sql), statement_(db.Take(sql)) {}
 
 Sql::~Sql() {
   sqlite3_reset(statement_.get());
   sqlite3_clear_bindings(statement_.get());
   try {
-    db_.Give(sql_, std::move(statement_));
+    kept_.second.push_back(std::move(statement_));
   } catch (...) {  // No memory to keep it: it is finalized instead.
   }
 }
 
 void Sql::Check(int result) const {
   if (result != SQLITE_OK) {
-    db_.Fail(result, sql_);
+    db_.Fail(result, kept_.first);
   }
 }
 

@@ -3,7 +3,9 @@
 #ifndef DAEMONS_KAVOELASTICD_SQLITE_H_
 #define DAEMONS_KAVOELASTICD_SQLITE_H_
 
+#include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <string>
 #include <string_view>
@@ -60,13 +62,19 @@ class Connection {
  private:
   friend class Sql;
   [[noreturn]] void Fail(int result, std::string_view sql) const;
-  StatementPtr Take(const std::string& sql);
-  void Give(const std::string& sql, StatementPtr statement);
+
+  struct TextHash {
+    using is_transparent = void;  // NOLINT(readability-identifier-naming): the library's name.
+    size_t operator()(std::string_view text) const { return std::hash<std::string_view>()(text); }
+  };
+  // Statements that are not in use, by their text.
+  using Idle =
+      std::unordered_map<std::string, std::vector<StatementPtr>, TextHash, std::equal_to<>>;
+  Idle::value_type& IdleOf(std::string_view sql);
 
   std::unique_ptr<const std::vector<bool>*> members_;  // Its address is known to SQLite.
   std::unique_ptr<sqlite3, ConnectionDelete> db_;
-  // Statements that are not in use, by their text.
-  std::unordered_map<std::string, std::vector<StatementPtr>> idle_;
+  Idle idle_;
 };
 
 // One use of a statement, from binding to the last row; the connection keeps the statement for the
@@ -74,7 +82,7 @@ class Connection {
 // that columns give, must not, and do not, outlive the use and the row. All throw SqlError.
 class Sql {
  public:
-  Sql(Connection& db, const std::string& sql);
+  Sql(Connection& db, std::string_view sql);
   ~Sql();
   Sql(const Sql&) = delete;
   Sql& operator=(const Sql&) = delete;
@@ -102,7 +110,7 @@ class Sql {
   void Check(int result) const;
 
   Connection& db_;
-  const std::string sql_;
+  Connection::Idle::value_type& kept_;
   StatementPtr statement_;
   int parameter_ = 0;
 };

@@ -186,8 +186,8 @@ void Writer::CheckRequired(const Json::Value& data, bool whole) const {
     throw Failure(Code::kBadDocument, "the document is no object");
   }
   for (const auto& [name, field] : session_.schema.Listed()) {
-    if (field.required && name != session_.schema.Key() &&
-        (whole || data.isMember(name)) && data[name].isNull()) {
+    if (field.required && name != session_.schema.Key() && (whole || data.isMember(name)) &&
+        data[name].isNull()) {
       throw Failure(Code::kBadDocument, name + " is required");
     }
   }

@@ -84,8 +84,8 @@ TEST(Engine, AnswersEveryRequest) {
       {"SizeIsNoNumber", R"({"command":"document_upsert_by_id","data":{"id":"i","doc_id":"/v/b",
         "data":{"KAVOMDFSSize":"big"}}})",
        "2007"},
-      {"DeleteMissingIsDone", R"({"command":"document_del_by_id","data":{"id":"i","doc_id":"/v/b"}})",
-       "ok"},
+      {"DeleteMissingIsDone",
+       R"({"command":"document_del_by_id","data":{"id":"i","doc_id":"/v/b"}})", "ok"},
       {"CompoundIsNoList", R"({"compound":{}})", "2000"},
       {"EmptyCompound", R"({"compound":[]})", "ok"},
       {"DocIdStandsForThePath", R"({"command":"document_upsert_by_id","more":1,
@@ -136,8 +136,7 @@ TEST(Engine, MappingsDecideHowAFieldIsFound) {
          {"GramBeginning", R"({"prefix":{"KAVOMDSearchFileName":"berg"}})", doc},
          {"GramNotBeginning", R"({"prefix":{"KAVOMDSearchFileName":"blu"}})", ""},
          {"Ancestor", R"({"term":{"KAVOMDSearchAncestor":"/v/d"}})", doc},
-         {"AncestorAbove", R"({"term":{"KAVOMDSearchAncestor":"/v"}})",
-          "/v/d " + doc + " /v/dd/x"},
+         {"AncestorAbove", R"({"term":{"KAVOMDSearchAncestor":"/v"}})", "/v/d " + doc + " /v/dd/x"},
          {"AncestorIsWhole", R"({"term":{"KAVOMDSearchAncestor":"/v/"}})", ""},
          {"Parent", R"({"term":{"KAVOMDParent":"/v"}})", "/v/d"},
          {"Both", R"({"term":{"KAVOMDIsDir":false},"prefix":{"KAVOMDPath":"/v/d/"}})", doc},
@@ -212,11 +211,13 @@ TEST(Engine, PathsAreBytes) {
   for (int i = 0; i < 100; ++i) {
     deep += "/" + std::string(39, 'a' + static_cast<char>(i % 26));
   }
-  const std::string paths[] = {
-      "/v/\xff\xfe\x80",       "/v/caf\u00e9",
-      "/v/cafe\u0301",         "/v/new\nline \"quoted\" \\",
-      "/v/" + std::string(255, 'n'), deep + "/" + std::string(4095 - deep.size() - 1, 'z'),
-      std::string("/v/nul\0x", 8)};
+  const std::string paths[] = {"/v/\xff\xfe\x80",
+                               "/v/caf\u00e9",
+                               "/v/cafe\u0301",
+                               "/v/new\nline \"quoted\" \\",
+                               "/v/" + std::string(255, 'n'),
+                               deep + "/" + std::string(4095 - deep.size() - 1, 'z'),
+                               std::string("/v/nul\0x", 8)};
   for (const std::string& path : paths) {
     EXPECT_EQ(engine.Add(path), "ok");
   }
@@ -258,8 +259,10 @@ TEST(Engine, ItemsOfACompoundFailAlone) {
   Json::Value& list = request["compound"];
   list.append(EngineFixture::Rename("/v/a", "/v/b"));
   list.append(EngineFixture::Rename("/v/a", "/v/c"));  // It is gone from there.
-  list.append(Parsed(R"({"command":"document_upsert_by_id","data":{"id":"j","doc_id":"/j","data":{}}})"));
-  list.append(Parsed(R"({"command":"document_upsert_by_id","data":{"id":"k","doc_id":"/k","data":{}}})"));
+  list.append(
+      Parsed(R"({"command":"document_upsert_by_id","data":{"id":"j","doc_id":"/j","data":{}}})"));
+  list.append(
+      Parsed(R"({"command":"document_upsert_by_id","data":{"id":"k","doc_id":"/k","data":{}}})"));
   list.append(Parsed(R"({"command":"commit","data":{"id":"i"}})"));
   list.append(7);
   list.append(EngineFixture::Rename("/v/b", "/v/c"));
@@ -310,9 +313,9 @@ TEST(Engine, IndexesArePausedMovedRenamedAndDeleted) {
   EXPECT_EQ(engine.Do("index_config_set", R"({"data":{"id":"j"}})"), "2003");
   EXPECT_EQ(engine.Do("index_config_set", R"({"data":{"path":")" + (folder / "j") + "\"}}"),
             "2003");
-  EXPECT_EQ(engine.Do("index_config_set",
-                      R"({"data":{"id":"k","path":")" + (folder / "k/") + "\"}}"),
-            "ok");
+  EXPECT_EQ(
+      engine.Do("index_config_set", R"({"data":{"id":"k","path":")" + (folder / "k/") + "\"}}"),
+      "ok");
   EXPECT_EQ(state(), "j=active@/j k=active@/k ");
   EXPECT_EQ(engine.Do("commit"), "2002");
   EXPECT_EQ(EngineFixture::Paths(engine.Send("search", Parsed(R"({"words":"kept"})"), "k")["data"],
@@ -321,9 +324,9 @@ TEST(Engine, IndexesArePausedMovedRenamedAndDeleted) {
   // Whoever moved the folder itself only tells where it is now.
   EXPECT_EQ(engine.Do("index_pause", "{}", "k"), "ok");
   std::filesystem::rename(folder / "k", folder / "by hand");
-  EXPECT_EQ(engine.Do("index_config_set", R"({"data":{"path":")" + (folder / "by hand") + "\"}}",
-                      "k"),
-            "ok");
+  EXPECT_EQ(
+      engine.Do("index_config_set", R"({"data":{"path":")" + (folder / "by hand") + "\"}}", "k"),
+      "ok");
   EXPECT_EQ(engine.Do("index_resume", "{}", "k"), "ok");
   WriteText(folder / "j/others", "");
   EXPECT_EQ(engine.Do("index_delete", "{}", "j"), "ok");

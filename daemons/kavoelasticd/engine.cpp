@@ -45,6 +45,16 @@ std::string NewToken() {
   return token;
 }
 
+// The index that an item of a compound writes to, "" when it is no such item.
+std::string WriteTarget(const Json::Value& item) {
+  if (!item.isObject() || !item["command"].isString() || !IsWrite(item["command"].asString()) ||
+      !item["data"].isObject()) {
+    return "";
+  }
+  const Json::Value& id = item["data"]["id"];
+  return id.isString() ? id.asString() : "";
+}
+
 Json::Value WithData(Json::Value data) {
   Json::Value reply = Success();
   reply["data"] = std::move(data);
@@ -146,48 +156,49 @@ Json::Value Engine::Compound(const Json::Value& list) {
   if (!list.isArray()) {
     throw Failure(Code::kBadRequest, "compound is no list");
   }
-  Json::Value results(Json::arrayValue);
-  results.resize(list.size());
-  const auto id_of = [&](Json::ArrayIndex i) -> std::string {
-    const Json::Value& item = list[i];
-    if (!item.isObject() || !item["command"].isString() || !IsWrite(item["command"].asString()) ||
-        !item["data"].isObject()) {
-      return "";
-    }
-    const Json::Value& id = item["data"]["id"];
-    return id.isString() ? id.asString() : "";
-  };
+  // By pointer, as the library looks up the place of every element anew.
+  std::vector<const Json::Value*> items;
+  for (const Json::Value& item : list) {
+    items.push_back(&item);
+  }
+  std::vector<Json::Value> results(items.size());
   // What stands together for one index is done together.
-  for (Json::ArrayIndex from = 0; from < list.size();) {
-    const std::string id = id_of(from);
-    Json::ArrayIndex to = from + 1;
-    while (to < list.size() && id_of(to) == id) {
+  for (size_t from = 0; from < items.size();) {
+    const std::string id = WriteTarget(*items[from]);
+    size_t to = from + 1;
+    while (to < items.size() && WriteTarget(*items[to]) == id) {
       ++to;
     }
-    CompoundRun(list, from, to, id, &results);
+    CompoundRun(id, std::span(items).subspan(from, to - from),
+                std::span(results).subspan(from, to - from));
     from = to;
   }
+  Json::Value data(Json::arrayValue);
   bool has_fail = false;
-  for (const Json::Value& result : results) {
+  for (Json::Value& result : results) {
     has_fail = has_fail || !result["success"].asBool();
+    data.append(std::move(result));
   }
-  Json::Value reply = WithData(std::move(results));
+  Json::Value reply = WithData(std::move(data));
   reply["has_fail"] = has_fail;
   return reply;
 }
 
-void Engine::CompoundRun(const Json::Value& list, Json::ArrayIndex from, Json::ArrayIndex to,
-                         const std::string& id, Json::Value* results) {
+void Engine::CompoundRun(const std::string& id, std::span<const Json::Value* const> items,
+                         std::span<Json::Value> results) {
+  const auto refused = [&](size_t i, const Failure& failure) {
+    results[i] = Refusal(failure.code(), failure.what());
+  };
   const auto run_item = [&](Writer& writer, size_t i) {
-    const auto at = from + static_cast<Json::ArrayIndex>(i);
-    const Json::Value& request = list[at];
+    const Json::Value& request = *items[i];
     try {
       RunWrite(writer, request["command"].asString(), request["data"]);
-      (*results)[at] = Success();
-    } catch (const SqlError&) {
-      throw;
+      results[i] = Success();
     } catch (const Failure& failure) {
-      (*results)[at] = Refusal(failure.code(), failure.what());
+      if (!failure.IsAnswer()) {
+        throw;
+      }
+      refused(i, failure);
     }
   };
   try {
@@ -197,16 +208,12 @@ void Engine::CompoundRun(const Json::Value& list, Json::ArrayIndex from, Json::A
     WithStore(id, [&](Store& store) {
       store.Write([&](Writer& writer, Session& /*session*/) {
         writer.List(
-            to - from, [&](size_t i) { run_item(writer, i); },
-            [&](size_t i, const Failure& failure) {
-              (*results)[from + static_cast<Json::ArrayIndex>(i)] =
-                  Refusal(failure.code(), failure.what());
-            });
+            items.size(), [&](size_t i) { run_item(writer, i); }, refused);
       });
     });
   } catch (const Failure& failure) {
-    for (Json::ArrayIndex i = from; i < to; ++i) {
-      (*results)[i] = Refusal(failure.code(), failure.what());
+    for (size_t i = 0; i < items.size(); ++i) {
+      refused(i, failure);
     }
   }
 }

@@ -10,6 +10,7 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <span>
 #include <string>
 
 #include "daemons/kavoelasticd/gate.h"
@@ -52,8 +53,9 @@ class Engine {
 
   Json::Value Dispatch(const Json::Value& request);
   Json::Value Compound(const Json::Value& list);
-  void CompoundRun(const Json::Value& list, Json::ArrayIndex from, Json::ArrayIndex to,
-                   const std::string& id, Json::Value* results);
+  // Items of one index, all with that id, or any without one. `results` has a place for each.
+  void CompoundRun(const std::string& id, std::span<const Json::Value* const> items,
+                   std::span<Json::Value> results);
 
   void IndexCreate(const Json::Value& data);
   void IndexDelete(const Json::Value& data);

@@ -127,16 +127,26 @@ void Store::Write(const std::function<void(Writer&, Session&)>& change) {
   last_change_ = std::chrono::steady_clock::now();
   try {
     change(*writer_, *write_session_);
-  } catch (const SqlError& error) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            "changes are rolled back, index=" + folder_ + ", reason=" + error.what());
-    writer_->Lose(error.what());
-    uncommitted_ = false;
+  } catch (const Failure& failure) {
+    if (!failure.IsAnswer()) {
+      RollBack(failure.what());
+    }
+    throw;
+  } catch (const std::exception& error) {
+    RollBack(error.what());
     throw;
   }
   if (writer_->Uncommitted() >= kCommitAfter) {
     CommitQuietly();
   }
+}
+
+// The write lock is held. The next Commit() tells what is lost.
+void Store::RollBack(const char* reason) {
+  LogLine(VEXLO_SOURCE, __LINE__,
+          "changes are rolled back, index=" + folder_ + ", reason=" + reason);
+  writer_->Lose(reason);
+  uncommitted_ = false;
 }
 
 void Store::Read(const std::function<void(Session&)>& read) {
@@ -194,16 +204,14 @@ void Store::Commit() {
   uncommitted_ = false;
 }
 
-// The write lock is held. What is lost is told by the next Commit().
+// The write lock is held.
 void Store::CommitQuietly() {
   try {
     writer_->CommitChanges();
+    uncommitted_ = false;
   } catch (const SqlError& error) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            "changes are rolled back, index=" + folder_ + ", reason=" + error.what());
-    writer_->Lose(error.what());
+    RollBack(error.what());
   }
-  uncommitted_ = false;
 }
 
 void Store::CommitIdle(std::chrono::steady_clock::duration idle) {

@@ -58,6 +58,7 @@ class Store {
   void OpenWriter(const std::string& token);
   void CheckDatabase(Connection& db, const std::string& token);
   void CommitQuietly();
+  void RollBack(const char* reason);
   std::unique_ptr<Session> TakeReader();
 
   const std::string folder_;

@@ -15,7 +15,7 @@
 namespace vexlo::elasticd {
 namespace {
 
-constexpr size_t kDeleteSlice = 1000;
+constexpr size_t kDeleteSlice = 10'000;
 
 enum Table : unsigned {
   kTexts = 1,
@@ -272,7 +272,9 @@ size_t Writer::DeleteWhere(const Conditions& conditions) {
   size_t deleted = 0;
   for (;;) {
     // What is deleted is found no more, so every slice begins at the front.
-    const std::vector<int64_t> ids = Find(session_, conditions, 0, kDeleteSlice);
+    std::vector<int64_t> ids = Find(session_, conditions, 0, kDeleteSlice);
+    // FTS5 writes out what it has gathered whenever a lower number follows a higher one.
+    std::sort(ids.begin(), ids.end());
     for (const int64_t id : ids) {
       if (auto found = session_.Load(id)) {
         Begin();
@@ -313,9 +315,13 @@ unsigned Writer::ChangedTables(Change& change) {
   unsigned tables = 0;
   for (const Item& before : change.before.record.Items()) {
     const Item* const after = change.after.record.Find(before.field);
+    const bool same = after != nullptr && Same(change, before, *after);
+    if (same && before.kind == after->kind) {
+      continue;
+    }
     const Field& field = session_.FieldOf(before.field);
     const unsigned all = TablesOf(field);
-    unsigned changed = after != nullptr && Same(change, before, *after) ? 0U : all;
+    unsigned changed = same ? 0U : all;
     if (after != nullptr && FoundByPath(field)) {
       // A value that follows from the path has no entry; one that ceases to needs one.
       const bool by_path = before.kind == Kind::kParent;

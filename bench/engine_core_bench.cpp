@@ -220,7 +220,6 @@ void Run(size_t documents, const std::string& folder) {
   printf("%-32s %8.3f s + commit %.3f s for %zu: %.1f times as fast as upserting\n", "rename",
          renamed, committed, folder_size, again / (renamed + committed));
 
-  Json::Value words = With("words", made[0]["KAVOMDTextContent"].asString().substr(0, 7) + "*");
   const std::string name = made[1]["KAVOMDFSName"].asString();
   Json::Value page = Command("document_get_by_query");
   page["data"]["query"]["qsl"]["prefix"]["KAVOMDPath"] = to + "/";
@@ -233,10 +232,6 @@ void Run(size_t documents, const std::string& folder) {
 
   Corpus same;
   const std::string common = same.Word();
-  std::string rare = "";
-  for (const char* const wanted : {"a"}) {
-    rare = wanted;
-  }
   Json::Value filtered = With("words", common);
   filtered["below"] = to;
   filtered["types"].append("txt");

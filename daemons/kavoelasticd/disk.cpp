@@ -47,6 +47,7 @@ void Sync(const std::string& path, int flags) {
 void CopyDatabase(const std::string& from, const std::string& to) {
   const std::string copy = Database(to) + ".copy";
   Remove(copy);
+  MakePrivateFile(copy);
   {
     Connection db(Database(from), Connection::Use::kWrite);
     Sql(db, "VACUUM INTO ?").Text(copy).Run();
@@ -81,6 +82,14 @@ void MakeFolders(const std::string& path) {
       return;
     }
   }
+}
+
+void MakePrivateFile(const std::string& path) {
+  const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600);
+  if (fd < 0) {
+    Fail("making a file failed", path);
+  }
+  close(fd);
 }
 
 void SyncFolder(const std::string& path) { Sync(path, O_DIRECTORY); }

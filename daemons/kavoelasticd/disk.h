@@ -14,6 +14,10 @@ bool Exists(const std::string& path);
 // Makes the folder with those above it. Throws Failure kStorage.
 void MakeFolders(const std::string& path);
 
+// Makes an empty file that only its owner may read: an index holds the text of everybody's files.
+// SQLite gives the files beside it the same mode. Throws Failure kStorage.
+void MakePrivateFile(const std::string& path);
+
 // Syncs what a folder holds. Throws Failure kStorage.
 void SyncFolder(const std::string& path);
 

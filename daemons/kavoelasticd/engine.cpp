@@ -487,8 +487,13 @@ void Engine::CommitIdle(std::chrono::steady_clock::duration idle) {
   }
   for (const SlotPtr& slot : slots) {
     const Gate::Visit visit(slot->gate);
-    if (slot->store != nullptr) {
-      slot->store->CommitIdle(idle);
+    try {
+      if (slot->store != nullptr) {
+        slot->store->CommitIdle(idle);
+      }
+    } catch (const std::exception& error) {
+      LogLine(VEXLO_SOURCE, __LINE__,
+              "committing failed, id=" + slot->id + ", reason=" + error.what());
     }
   }
 }

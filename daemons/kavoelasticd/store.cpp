@@ -42,6 +42,7 @@ std::string DatabaseFile(const std::string& folder) { return folder + "/index.db
 void Store::Create(const std::string& folder, const IndexInfo& info) {
   MakeFolders(folder);
   RemoveDatabase(folder);
+  MakePrivateFile(DatabaseFile(folder));
   const Schema schema(info.mappings);
   {
     Session session(DatabaseFile(folder), Connection::Use::kCreate, schema,

@@ -159,12 +159,12 @@ void Writer::Begin() {
 }
 
 void Writer::Lose(const std::string& reason) {
+  lost_ = reason;
+  changes_ = 0;
+  session_.ForgetFields();
   if (session_.db.InTransaction()) {
     session_.db.Run("ROLLBACK");
   }
-  session_.ForgetFields();
-  lost_ = reason;
-  changes_ = 0;
 }
 
 void Writer::CommitChanges() {

@@ -297,7 +297,10 @@ TEST(Engine, IndexesArePausedMovedRenamedAndDeleted) {
   // Paused: everything in one file, no work, also after a restart.
   EXPECT_EQ(engine.Do("index_pause"), "ok");
   EXPECT_EQ(engine.Do("index_pause"), "ok");
-  EXPECT_EQ(std::filesystem::exists(folder / "i/index.db-wal"), false);
+  EXPECT_FALSE(std::filesystem::exists(folder / "i/index.db-wal"));
+  struct stat status;
+  ASSERT_EQ(stat((folder / "i/index.db").c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 0777, 0600U) << "the text of everybody's files";
   engine.Restart();
   for (const char* command : {"commit", "document_get_by_query", "document_upsert_by_id"}) {
     EXPECT_EQ(engine.Do(command, R"({"doc_id":"/x","data":{}})"), "2004") << command;
@@ -353,6 +356,9 @@ TEST(Engine, MovesToAnotherDisk) {
   EXPECT_EQ(engine.Do("index_config_set", R"({"data":{"path":")" + (other / "x") + "\"}}"), "ok");
   EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
   EXPECT_FALSE(std::filesystem::exists(engine.Folder() / "i"));
+  struct stat status;
+  ASSERT_EQ(stat((other / "x/index.db").c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 0777, 0600U) << "the text of everybody's files";
   engine.Restart();
   EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
   EXPECT_EQ(engine.Do("index_delete"), "ok");

@@ -1,0 +1,152 @@
+#include "daemons/kavoelasticd/disk.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <filesystem>
+#include <system_error>
+#include <vector>
+
+#include "daemons/kavoelasticd/failure.h"
+#include "daemons/kavoelasticd/sqlite.h"
+
+namespace vexlo::elasticd {
+namespace {
+
+constexpr const char* kSuffixes[] = {"", "-wal", "-shm", "-journal"};
+
+[[noreturn]] void Fail(const std::string& what, const std::string& path) {
+  throw Failure(errno == ENOSPC ? Code::kNoSpace : Code::kStorage, ErrnoText(what, path));
+}
+
+std::string Database(const std::string& folder) { return folder + "/index.db"; }
+
+void Remove(const std::string& path) {
+  if (unlink(path.c_str()) != 0 && errno != ENOENT && errno != ENOTDIR) {
+    Fail("removing failed", path);
+  }
+}
+
+void Sync(const std::string& path, int flags) {
+  const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | flags);
+  if (fd < 0) {
+    Fail("opening to sync failed", path);
+  }
+  const bool synced = fsync(fd) == 0;
+  const int error = errno;
+  close(fd);
+  if (!synced) {
+    errno = error;
+    Fail("syncing failed", path);
+  }
+}
+
+void CopyDatabase(const std::string& from, const std::string& to) {
+  const std::string copy = Database(to) + ".copy";
+  Remove(copy);
+  MakePrivateFile(copy);
+  {
+    Connection db(Database(from), Connection::Use::kWrite);
+    Sql(db, "VACUUM INTO ?").Text(copy).Run();
+  }
+  Sync(copy, 0);
+  if (rename(copy.c_str(), Database(to).c_str()) != 0) {
+    Fail("renaming failed", copy);
+  }
+}
+
+}  // namespace
+
+std::string ErrnoText(const std::string& what, const std::string& path) {
+  return what + ", path=" + path + ", reason=" + std::generic_category().message(errno);
+}
+
+bool Exists(const std::string& path) {
+  struct stat status;
+  return lstat(path.c_str(), &status) == 0;
+}
+
+void MakeFolders(const std::string& path) {
+  for (size_t slash = path.find('/', 1);; slash = path.find('/', slash + 1)) {
+    const std::string folder = path.substr(0, slash);
+    if (mkdir(folder.c_str(), 0755) == 0) {
+      const size_t above = folder.rfind('/');
+      SyncFolder(above == 0 || above == std::string::npos ? "/" : folder.substr(0, above));
+    } else if (errno != EEXIST) {
+      Fail("making a folder failed", folder);
+    }
+    if (slash == std::string::npos) {
+      return;
+    }
+  }
+}
+
+void MakePrivateFile(const std::string& path) {
+  const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600);
+  if (fd < 0) {
+    Fail("making a file failed", path);
+  }
+  close(fd);
+}
+
+void SyncFolder(const std::string& path) { Sync(path, O_DIRECTORY); }
+
+void RemoveDatabase(const std::string& folder) {
+  // The file itself last: as long as it stands, its log belongs to it.
+  for (const char* suffix : {"-shm", "-wal", "-journal", ".copy", ""}) {
+    Remove(Database(folder) + suffix);
+  }
+}
+
+void RemoveIndexFolder(const std::string& folder) {
+  RemoveDatabase(folder);
+  std::error_code error;
+  std::vector<std::string> aside;
+  for (const auto& entry : std::filesystem::directory_iterator(folder, error)) {
+    if (entry.path().filename().string().starts_with("index.db.damaged-")) {
+      aside.push_back(entry.path().string());
+    }
+  }
+  for (const std::string& path : aside) {
+    std::filesystem::remove_all(path, error);  // What was set aside may be anything.
+  }
+  rmdir(folder.c_str());  // It may hold what others put there.
+}
+
+void MoveDatabase(const std::string& from, const std::string& to) {
+  MakeFolders(to);
+  if (rename(Database(from).c_str(), Database(to).c_str()) != 0) {
+    if (errno != EXDEV) {
+      Fail("moving the database failed", Database(from));
+    }
+    CopyDatabase(from, to);
+    SyncFolder(to);
+    RemoveDatabase(from);
+  }
+  SyncFolder(to);
+  SyncFolder(from);
+  rmdir(from.c_str());
+}
+
+std::string SetAside(const std::string& folder) {
+  if (!Exists(Database(folder))) {
+    return "";
+  }
+  std::string aside;
+  for (int n = 1; aside.empty() || Exists(aside); ++n) {
+    aside = Database(folder) + ".damaged-" + std::to_string(n);
+  }
+  for (const char* suffix : kSuffixes) {
+    const std::string file = Database(folder) + suffix;
+    if (rename(file.c_str(), (aside + suffix).c_str()) != 0 && errno != ENOENT) {
+      Fail("setting aside failed", file);
+    }
+  }
+  SyncFolder(folder);
+  return aside;
+}
+
+}  // namespace vexlo::elasticd

@@ -1,0 +1,40 @@
+// The files of an index as files: made, moved, set aside, removed.
+#ifndef DAEMONS_KAVOELASTICD_DISK_H_
+#define DAEMONS_KAVOELASTICD_DISK_H_
+
+#include <string>
+
+namespace vexlo::elasticd {
+
+// "WHAT, path=PATH, reason=..." with the meaning of errno.
+std::string ErrnoText(const std::string& what, const std::string& path);
+
+bool Exists(const std::string& path);
+
+// Makes the folder with those above it. Throws Failure kStorage.
+void MakeFolders(const std::string& path);
+
+// Makes an empty file that only its owner may read: an index holds the text of everybody's files.
+// SQLite gives the files beside it the same mode. Throws Failure kStorage.
+void MakePrivateFile(const std::string& path);
+
+// Syncs what a folder holds. Throws Failure kStorage.
+void SyncFolder(const std::string& path);
+
+// Removes the database in `folder`. Throws Failure kStorage when it stays.
+void RemoveDatabase(const std::string& folder);
+
+// Removes also what was set aside, and the folder when nothing else is in it.
+void RemoveIndexFolder(const std::string& folder);
+
+// Moves the database, which is closed and whole in its one file, to another folder, instead of what
+// is there; across disks as a copy that stands whole before the old one goes. Throws Failure.
+void MoveDatabase(const std::string& from, const std::string& to);
+
+// Renames the database to "index.db.damaged-N" with a new N; the name, or "" when there was
+// nothing. Throws Failure kStorage.
+std::string SetAside(const std::string& folder);
+
+}  // namespace vexlo::elasticd
+
+#endif  // DAEMONS_KAVOELASTICD_DISK_H_

@@ -1,0 +1,86 @@
+// The full-text engine: the indexes that there are, and the commands that clients send. Knows
+// nothing of sockets and starts no threads.
+#ifndef DAEMONS_KAVOELASTICD_ENGINE_H_
+#define DAEMONS_KAVOELASTICD_ENGINE_H_
+
+#include <json/value.h>
+
+#include <chrono>
+#include <functional>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <span>
+#include <string>
+
+#include "daemons/kavoelasticd/gate.h"
+#include "daemons/kavoelasticd/registry.h"
+#include "daemons/kavoelasticd/store.h"
+
+namespace vexlo::elasticd {
+
+// Commands and replies are described in docs/engine.md.
+//
+// - Each index has one writer at a time; searches run beside it and see the last commit. Commands
+//   that pause, move, rename or delete an index wait until nobody uses it, and run one at a time.
+// - Locks, outermost first: admin_mutex_, an index's gate, registry_mutex_. Nothing is waited for,
+//   and no index's database is touched, under the last.
+// - Indexes are opened when they are first used, with a check of every page. A damaged one is
+//   renamed to "index.db.damaged-N" and answers kIndexDamaged until it is made anew.
+class Engine {
+ public:
+  // `registry_path` is the file that keeps the ids and folders of the indexes; it is made with the
+  // first one. Throws Failure when it cannot be read (see Registry). At most one engine may use a
+  // registry and its indexes.
+  explicit Engine(std::string registry_path);
+  // Commits and closes what is open; logs what fails. No call is running.
+  ~Engine();
+  Engine(const Engine&) = delete;
+  Engine& operator=(const Engine&) = delete;
+
+  // Carries out one request. Any thread; never throws. The reply is {"success": true, ...} or
+  // {"success": false, "error": {"code", "msg"}}.
+  Json::Value Handle(const Json::Value& request);
+
+  // Commits what was written longer ago than `idle` to any index. To be called now and then by
+  // whoever runs the engine; never throws.
+  void CommitIdle(std::chrono::steady_clock::duration idle);
+
+ private:
+  struct Slot;
+  using SlotPtr = std::shared_ptr<Slot>;
+  using StoreUse = std::function<void(Store&)>;
+
+  Json::Value Dispatch(const Json::Value& request);
+  Json::Value Compound(const Json::Value& list);
+  // Items of one index, all with that id, or any without one. `results` has a place for each.
+  void CompoundRun(const std::string& id, std::span<const Json::Value* const> items,
+                   std::span<Json::Value> results);
+
+  void IndexCreate(const Json::Value& data);
+  void IndexDelete(const Json::Value& data);
+  void IndexPause(const Json::Value& data);
+  void IndexResume(const Json::Value& data);
+  void IndexConfigSet(const Json::Value& data);
+  Json::Value IndexList();
+  Json::Value Search(const Json::Value& data);
+
+  // Calls `use` with the open store. Throws kIndexMissing, kIndexPaused, kIndexDamaged, and what
+  // `use` throws.
+  void WithStore(const std::string& id, const StoreUse& use);
+  SlotPtr Find(const std::string& id);
+  // With the slot's gate closed for others.
+  void Open(Slot& slot);
+  void CloseCleanly(Slot& slot);
+  void MarkDamaged(Slot& slot, const std::string& reason);
+  void SetState(Slot& slot, State state);
+
+  std::mutex admin_mutex_;     // One command on the indexes themselves at a time.
+  std::mutex registry_mutex_;  // Guards the two below.
+  Registry registry_;
+  std::map<std::string, SlotPtr> slots_;  // By id, as in the registry.
+};
+
+}  // namespace vexlo::elasticd
+
+#endif  // DAEMONS_KAVOELASTICD_ENGINE_H_

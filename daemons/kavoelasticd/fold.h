@@ -1,0 +1,24 @@
+// One spelling for texts that people hold for the same: case, accents, composed and decomposed
+// forms, full and half width. Pure.
+#ifndef DAEMONS_KAVOELASTICD_FOLD_H_
+#define DAEMONS_KAVOELASTICD_FOLD_H_
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+namespace vexlo::elasticd {
+
+// What stands at `*at`, which is moved behind it: a code point, or -1 for one byte that is no
+// UTF-8.
+int32_t NextCodePoint(std::string_view text, size_t* at);
+
+// NFKC with case folding, without the accents of Latin, Greek, Cyrillic and Arabic letters. The
+// voice marks of kana and the vowel signs of Indic scripts tell words apart and stay. Bytes that
+// are no UTF-8 stay as they are.
+std::string Fold(std::string_view text);
+
+}  // namespace vexlo::elasticd
+
+#endif  // DAEMONS_KAVOELASTICD_FOLD_H_

@@ -1,0 +1,545 @@
+#include "daemons/kavoelasticd/writer.h"
+
+#include <algorithm>
+#include <array>
+#include <optional>
+#include <set>
+#include <utility>
+#include <vector>
+
+#include "common/string.h"
+#include "daemons/kavoelasticd/failure.h"
+#include "daemons/kavoelasticd/fields.h"
+#include "daemons/kavoelasticd/fold.h"
+
+namespace vexlo::elasticd {
+namespace {
+
+constexpr size_t kDeleteSlice = 10'000;
+
+enum Table : unsigned {
+  kTexts = 1,
+  kWordTable = 2,
+  kGramTable = 4,
+  kExactTable = 8,
+  kDocsTable = 16,  // Its columns beside the path.
+};
+
+using Row = std::vector<std::string>;
+using ExactRows = std::set<std::pair<uint32_t, std::string>>;
+
+unsigned TablesOf(const Field& field) {
+  const unsigned filter = field.filter ? static_cast<unsigned>(kDocsTable) : 0;
+  const unsigned all = filter | (field.all ? static_cast<unsigned>(kWordTable) : 0);
+  switch (field.lookup) {
+    case Lookup::kKey:
+      return 0;
+    case Lookup::kNumber:
+      return all;
+    case Lookup::kAncestor:
+    case Lookup::kExact:
+      return all | kExactTable;
+    case Lookup::kGrams:
+      return all | kGramTable;
+    case Lookup::kText:
+      return filter | kTexts;
+    case Lookup::kWords:
+      return filter | kWordTable;
+  }
+  return 0;
+}
+
+void Append(std::string* column, const std::string& text) {
+  *column += column->empty() ? "" : "\n";
+  *column += text;
+}
+
+// What the three text tables hold of a document; bodies must be known.
+Row RowOf(Session& session, const StoredDocument& document, Table table) {
+  const Schema& schema = session.schema;
+  Row row(table == kTexts       ? std::max<size_t>(1, schema.TextColumns().size())
+          : table == kGramTable ? std::max<size_t>(1, schema.GramColumns().size())
+                                : 3);
+  for (const Item& item : document.record.Items()) {
+    const Field& field = session.FieldOf(item.field);
+    if ((TablesOf(field) & table) == 0) {
+      continue;
+    }
+    size_t column = static_cast<size_t>(std::max(0, field.column));
+    if (table == kWordTable) {
+      column = field.lookup == Lookup::kGrams ? 0 : field.all ? 1 : 2;
+    }
+    Append(&row[column], JoinedTexts(item, document.path));
+  }
+  return row;
+}
+
+ExactRows ExactRowsOf(Session& session, const StoredDocument& document) {
+  ExactRows rows;
+  for (const Item& item : document.record.Items()) {
+    const Field& field = session.FieldOf(item.field);
+    if ((TablesOf(field) & kExactTable) == 0 ||
+        (item.kind == Kind::kParent && FoundByPath(field))) {
+      continue;
+    }
+    for (const std::string& text : TextsOf(item, document.path)) {
+      for (std::string& value : ExactValues(field, text)) {
+        rows.emplace(item.field, std::move(value));
+      }
+    }
+  }
+  return rows;
+}
+
+// What docs holds of the fields, for the filters and orders of a search.
+struct DocsRow {
+  std::optional<std::string> extension;
+  std::optional<int64_t> size;
+  std::optional<int64_t> modified;
+};
+
+DocsRow DocsRowOf(Session& session, const StoredDocument& document) {
+  DocsRow row;
+  const auto find = [&](const char* name) -> const Item* {
+    const auto id = session.IdOf(name);
+    return id ? document.record.Find(*id) : nullptr;
+  };
+  if (const Item* item = find(kExtensionField); item != nullptr && IsText(*item)) {
+    row.extension = Fold(TextOf(*item, document.path));
+  }
+  if (const Item* item = find(kSizeField); item != nullptr && item->kind == Kind::kInt) {
+    row.size = IntOf(*item);
+  }
+  if (const Item* item = find(kModifiedField); item != nullptr && item->kind == Kind::kInt) {
+    row.modified = IntOf(*item);
+  }
+  return row;
+}
+
+template <typename T>
+void Bind(Sql& sql, const std::optional<T>& value) {
+  if (!value) {
+    sql.Null();
+  } else if constexpr (std::is_same_v<T, std::string>) {
+    sql.Blob(*value);
+  } else {
+    sql.Int(*value);
+  }
+}
+
+std::string TextSql(const std::string& table, const std::string& columns, size_t count,
+                    bool forget) {
+  std::string names;
+  std::string marks;
+  for (size_t i = 0; i < count; ++i) {
+    names += columns.size() == 1 ? "," + columns + std::to_string(i) : "";
+    marks += ",?";
+  }
+  names = columns.size() == 1 ? names : "," + columns;
+  return forget ? "INSERT INTO " + table + "(" + table + ",rowid" + names + ") VALUES('delete',?" +
+                      marks + ")"
+                : "INSERT INTO " + table + "(rowid" + names + ") VALUES(?" + marks + ")";
+}
+
+}  // namespace
+
+// `before` and `after` are the same document; a record without a path is none.
+struct Writer::Change {
+  StoredDocument before;
+  StoredDocument after;
+  std::vector<uint32_t> new_bodies = {};
+};
+
+Writer::Writer(Session& session) : session_(session) {}
+
+void Writer::Begin() {
+  if (!session_.db.InTransaction()) {
+    session_.db.Run("BEGIN IMMEDIATE");
+  }
+}
+
+void Writer::Lose(const std::string& reason) {
+  lost_ = reason;
+  changes_ = 0;
+  session_.ForgetFields();
+  if (session_.db.InTransaction()) {
+    session_.db.Run("ROLLBACK");
+  }
+}
+
+void Writer::CommitChanges() {
+  if (session_.db.InTransaction()) {
+    session_.db.Run("COMMIT");
+  }
+  changes_ = 0;
+}
+
+void Writer::Commit() {
+  CommitChanges();
+  if (!lost_.empty()) {
+    throw Failure(Code::kLost, "changes were lost before: " + std::exchange(lost_, {}));
+  }
+}
+
+void Writer::CheckRequired(const Json::Value& data, bool whole) const {
+  if (!data.isObject()) {
+    throw Failure(Code::kBadDocument, "the document is no object");
+  }
+  for (const auto& [name, field] : session_.schema.Listed()) {
+    if (field.required && name != session_.schema.Key() && (whole || data.isMember(name)) &&
+        data[name].isNull()) {
+      throw Failure(Code::kBadDocument, name + " is required");
+    }
+  }
+  const Json::Value& key = data[session_.schema.Key()];
+  if (!key.isNull() && (!key.isString() || key.asString().empty())) {
+    throw Failure(Code::kBadDocument, session_.schema.Key() + " is no path");
+  }
+}
+
+void Writer::Upsert(const std::string& doc_id, const Json::Value& data) {
+  CheckRequired(data, /*whole=*/true);
+  const Json::Value& key = data[session_.schema.Key()];
+  const std::string path = key.isString() ? key.asString() : doc_id;
+  if (path.empty()) {
+    throw Failure(Code::kBadDocument, "the document has no path");
+  }
+  // Values are converted before anything changes; fields are numbered in the transaction.
+  Begin();
+  Change change;
+  change.after.path = path;
+  for (auto member = data.begin(); member != data.end(); ++member) {
+    const std::string name = member.name();
+    if (name != session_.schema.Key() && !member->isNull()) {
+      const uint32_t id = session_.Intern(name);
+      SetField(&change.after.record, id, session_.FieldOf(id), *member, path);
+    }
+  }
+  if (auto found = session_.LoadByPath(path)) {
+    change.after.id = found->id;
+    change.before = std::move(*found);
+  }
+  Apply(change);
+}
+
+void Writer::Set(const std::string& doc_id, const Json::Value& data) {
+  CheckRequired(data, /*whole=*/false);
+  auto found = session_.LoadByPath(doc_id);
+  if (!found) {
+    throw Failure(Code::kDocumentMissing, "no document at " + doc_id);
+  }
+  const Json::Value& key = data[session_.schema.Key()];
+  Begin();
+  Change change;
+  change.after.id = found->id;
+  change.after.path = key.isString() ? key.asString() : found->path;
+  change.after.record = found->record.Copy();
+  change.before = std::move(*found);
+  Record* const record = &change.after.record;
+  const bool folder_differs = Dirname(change.before.path) != Dirname(change.after.path);
+  const bool name_differs = Basename(change.before.path) != Basename(change.after.path);
+  for (const Item& item : change.before.record.Items()) {
+    if ((item.kind == Kind::kParent && folder_differs) ||
+        (item.kind == Kind::kName && name_differs)) {
+      // The value stays what it was, unless the data says otherwise.
+      const Field& field = session_.FieldOf(item.field);
+      SetField(record, item.field, field, TextOf(item, change.before.path), change.after.path);
+    }
+  }
+  for (auto member = data.begin(); member != data.end(); ++member) {
+    const std::string name = member.name();
+    if (name == session_.schema.Key()) {
+      continue;
+    }
+    const uint32_t id = session_.Intern(name);
+    if (member->isNull()) {
+      record->Remove(id);
+    } else {
+      SetField(record, id, session_.FieldOf(id), *member, change.after.path);
+    }
+  }
+  Apply(change);
+}
+
+void Writer::Delete(const std::string& doc_id) {
+  if (auto found = session_.LoadByPath(doc_id)) {
+    Begin();
+    RemoveDocument(std::move(*found));
+  }
+}
+
+size_t Writer::DeleteWhere(const Conditions& conditions) {
+  size_t deleted = 0;
+  for (;;) {
+    // What is deleted is found no more, so every slice begins at the front.
+    std::vector<int64_t> ids = Find(session_, conditions, 0, kDeleteSlice);
+    // FTS5 writes out what it has gathered whenever a lower number follows a higher one.
+    std::sort(ids.begin(), ids.end());
+    for (const int64_t id : ids) {
+      if (auto found = session_.Load(id)) {
+        Begin();
+        RemoveDocument(std::move(*found));
+        ++deleted;
+      }
+    }
+    if (ids.size() < kDeleteSlice) {
+      return deleted;
+    }
+  }
+}
+
+void Writer::RemoveDocument(StoredDocument document) {
+  Change change;
+  change.after.id = document.id;
+  change.before = std::move(document);
+  Apply(change);
+}
+
+bool Writer::Same(Change& change, const Item& before, const Item& after) {
+  if (IsText(before) != IsText(after) || (!IsText(before) && before.kind != after.kind)) {
+    return false;
+  }
+  if (!IsText(before)) {
+    return before.bytes == after.bytes;
+  }
+  if (after.kind == Kind::kBody && after.bytes.data() == nullptr) {
+    return true;
+  }
+  session_.FillBody(change.before.id, &change.before.record, before.field);
+  return TextOf(*change.before.record.Find(before.field), change.before.path) ==
+         TextOf(after, change.after.path);
+}
+
+// The tables that hold a field whose value differs.
+unsigned Writer::ChangedTables(Change& change) {
+  unsigned tables = 0;
+  for (const Item& before : change.before.record.Items()) {
+    const Item* const after = change.after.record.Find(before.field);
+    const bool same = after != nullptr && Same(change, before, *after);
+    if (same && before.kind == after->kind) {
+      continue;
+    }
+    const Field& field = session_.FieldOf(before.field);
+    const unsigned all = TablesOf(field);
+    unsigned changed = same ? 0U : all;
+    if (after != nullptr && FoundByPath(field)) {
+      // A value that follows from the path has no entry; one that ceases to needs one.
+      const bool by_path = before.kind == Kind::kParent;
+      if (by_path != (after->kind == Kind::kParent)) {
+        changed |= all & kExactTable;
+      } else if (by_path) {
+        changed &= ~static_cast<unsigned>(kExactTable);
+      }
+    }
+    tables |= changed;
+  }
+  for (const Item& after : change.after.record.Items()) {
+    if (change.before.record.Find(after.field) == nullptr) {
+      tables |= TablesOf(session_.FieldOf(after.field));
+    }
+  }
+  return tables;
+}
+
+void Writer::Reindex(Change& change, StoredDocument& document, const std::string& table,
+                     const std::string& insert, const std::string& remove, bool before) {
+  const Table which = table == "texts" ? kTexts : table == "grams" ? kGramTable : kWordTable;
+  const std::vector<Item> items = document.record.Items();
+  for (const Item& item : items) {
+    if ((TablesOf(session_.FieldOf(item.field)) & which) != 0) {
+      session_.FillBody(change.after.id, &document.record, item.field);
+    }
+  }
+  const Row row = RowOf(session_, document, which);
+  if (std::all_of(row.begin(), row.end(), [](const std::string& text) { return text.empty(); })) {
+    return;
+  }
+  Sql sql(session_.db, before ? remove : insert);
+  sql.Int(change.after.id);
+  for (const std::string& text : row) {
+    sql.Text(text);
+  }
+  sql.Run();
+}
+
+void Writer::WriteBodies(Change& change) {
+  const auto is_body = [](const Item* item) {
+    return item != nullptr && item->kind == Kind::kBody;
+  };
+  for (const Item& item : change.before.record.Items()) {
+    if (is_body(&item) && !is_body(change.after.record.Find(item.field))) {
+      Sql(session_.db, "DELETE FROM bodies WHERE id = ? AND field = ?")
+          .Int(change.after.id)
+          .Int(item.field)
+          .Run();
+    }
+  }
+  for (const uint32_t field : change.new_bodies) {
+    Sql(session_.db, "INSERT OR REPLACE INTO bodies VALUES(?,?,?)")
+        .Int(change.after.id)
+        .Int(field)
+        .Blob(change.after.record.Find(field)->bytes)
+        .Run();
+  }
+}
+
+void Writer::WriteExact(Change& change) {
+  for (StoredDocument* document : {&change.before, &change.after}) {
+    const std::vector<Item> items = document->record.Items();
+    for (const Item& item : items) {
+      if ((TablesOf(session_.FieldOf(item.field)) & kExactTable) != 0) {
+        session_.FillBody(change.after.id, &document->record, item.field);
+      }
+    }
+  }
+  const ExactRows before = ExactRowsOf(session_, change.before);
+  const ExactRows after = ExactRowsOf(session_, change.after);
+  const auto write = [&](const ExactRows& rows, const ExactRows& kept, const char* text) {
+    for (const auto& row : rows) {
+      if (!kept.contains(row)) {
+        Sql(session_.db, text).Int(row.first).Blob(row.second).Int(change.after.id).Run();
+      }
+    }
+  };
+  write(before, after, "DELETE FROM exact WHERE field = ? AND value = ? AND id = ?");
+  write(after, before, "INSERT INTO exact VALUES(?,?,?)");
+}
+
+// Removes the document that stands where another one is to stand.
+void Writer::MakeRoom(const std::string& path) {
+  if (auto found = session_.LoadByPath(path)) {
+    RemoveDocument(std::move(*found));
+  }
+}
+
+void Writer::WriteRows(Change& change, bool filters_differ) {
+  Connection& db = session_.db;
+  const bool exists = !change.before.path.empty();
+  if (change.after.path.empty()) {
+    Sql(db, "DELETE FROM docs WHERE id = ?").Int(change.after.id).Run();
+    Sql(db, "DELETE FROM records WHERE id = ?").Int(change.after.id).Run();
+    return;
+  }
+  if (!exists) {
+    const DocsRow row = DocsRowOf(session_, change.after);
+    Sql docs(db, "INSERT INTO docs(path, ext, size, mtime) VALUES(?,?,?,?)");
+    docs.Blob(change.after.path);
+    Bind(docs, row.extension);
+    Bind(docs, row.size);
+    Bind(docs, row.modified);
+    docs.Run();
+    change.after.id = db.LastInsertId();
+    const std::string record = change.after.record.Encode();
+    Sql(db, "INSERT INTO records VALUES(?,?)").Int(change.after.id).Blob(record).Run();
+    return;
+  }
+  if (!change.after.record.SameStored(change.before.record)) {
+    const std::string record = change.after.record.Encode();
+    Sql(db, "UPDATE records SET record = ? WHERE id = ?").Blob(record).Int(change.after.id).Run();
+  }
+  const bool moved = change.before.path != change.after.path;
+  if (filters_differ) {
+    const DocsRow row = DocsRowOf(session_, change.after);
+    Sql docs(db, "UPDATE docs SET ext = ?, size = ?, mtime = ? WHERE id = ?");
+    Bind(docs, row.extension);
+    Bind(docs, row.size);
+    Bind(docs, row.modified);
+    docs.Int(change.after.id).Run();
+  }
+  if (moved) {
+    const auto move = [&] {
+      return Sql(db, "UPDATE docs SET path = ? WHERE id = ?")
+          .Blob(change.after.path)
+          .Int(change.after.id)
+          .RunUnlessTaken();
+    };
+    if (!move()) {
+      MakeRoom(change.after.path);
+      if (!move()) {
+        throw Failure(Code::kInternal, "a path is taken by no document: " + change.after.path);
+      }
+    }
+  }
+}
+
+void Writer::Apply(Change& change) {
+  for (const Item& item : change.after.record.Items()) {
+    if (item.kind == Kind::kBody && item.bytes.data() != nullptr) {
+      change.new_bodies.push_back(item.field);
+    }
+  }
+  const unsigned tables = ChangedTables(change);
+  const bool exists = !change.before.path.empty();
+  const bool filters_differ = (tables & kDocsTable) != 0;
+  if (!exists) {
+    WriteRows(change, filters_differ);
+  }
+  const size_t texts = std::max<size_t>(1, session_.schema.TextColumns().size());
+  const size_t grams = std::max<size_t>(1, session_.schema.GramColumns().size());
+  struct Part {
+    unsigned table;
+    const char* name;
+    const char* columns;
+    size_t count;
+  };
+  const std::array<Part, 3> parts = {{{kTexts, "texts", "t", texts},
+                                      {kWordTable, "words", "name,rest,other", 3},
+                                      {kGramTable, "grams", "g", grams}}};
+  for (const Part& part : parts) {
+    if ((tables & part.table) != 0) {
+      const std::string insert = TextSql(part.name, part.columns, part.count, /*forget=*/false);
+      const std::string remove = TextSql(part.name, part.columns, part.count, /*forget=*/true);
+      Reindex(change, change.before, part.name, insert, remove, /*before=*/true);
+      Reindex(change, change.after, part.name, insert, remove, /*before=*/false);
+    }
+  }
+  if ((tables & kExactTable) != 0) {
+    WriteExact(change);
+  }
+  if (exists) {
+    WriteRows(change, filters_differ);
+  }
+  WriteBodies(change);
+  ++changes_;
+}
+
+void Writer::List(size_t count, const std::function<void(size_t)>& item,
+                  const std::function<void(size_t, const Failure&)>& refused) {
+  Begin();
+  const size_t changes = changes_;
+  session_.db.Run("SAVEPOINT list");
+  try {
+    for (size_t i = 0; i < count; ++i) {
+      item(i);
+    }
+  } catch (const SqlError& error) {
+    if (!error.OfStatement() || !session_.db.InTransaction()) {
+      throw;
+    }
+    session_.db.Run("ROLLBACK TO list");
+    session_.ForgetFields();
+    changes_ = changes;
+    ListOneByOne(count, item, refused);
+  }
+  session_.db.Run("RELEASE list");
+}
+
+void Writer::ListOneByOne(size_t count, const std::function<void(size_t)>& item,
+                          const std::function<void(size_t, const Failure&)>& refused) {
+  for (size_t i = 0; i < count; ++i) {
+    session_.db.Run("SAVEPOINT item");
+    try {
+      item(i);
+    } catch (const SqlError& error) {
+      if (!error.OfStatement() || !session_.db.InTransaction()) {
+        throw;
+      }
+      session_.db.Run("ROLLBACK TO item");
+      session_.ForgetFields();
+      refused(i, error);
+    }
+    session_.db.Run("RELEASE item");
+  }
+}
+
+}  // namespace vexlo::elasticd

@@ -1,0 +1,75 @@
+// Changes to the documents of one index. For one thread at a time.
+#ifndef DAEMONS_KAVOELASTICD_WRITER_H_
+#define DAEMONS_KAVOELASTICD_WRITER_H_
+
+#include <json/value.h>
+
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <string>
+
+#include "daemons/kavoelasticd/query.h"
+#include "daemons/kavoelasticd/session.h"
+
+namespace vexlo::elasticd {
+
+// - Changes gather in one transaction until Commit(). What was committed is on disk: the log is
+//   synced before Commit() returns. What was not is gone after a crash.
+// - A change that a rule refuses changes nothing. One that the database refuses (a full disk) rolls
+//   back everything since the last commit, and the next Commit() fails with kLost, once.
+class Writer {
+ public:
+  // The session may write. `session` outlives the writer.
+  explicit Writer(Session& session);
+
+  // Each throws Failure: kBadDocument, kDocumentMissing, or what the database answers.
+  void Upsert(const std::string& doc_id, const Json::Value& data);
+  // Merges `data` into the document; null removes a field. With another path in it the document
+  // moves there, instead of one that is there.
+  void Set(const std::string& doc_id, const Json::Value& data);
+  void Delete(const std::string& doc_id);
+  size_t DeleteWhere(const Conditions& conditions);
+
+  // Throws kLost when changes were rolled back before, once; what is left is committed even so.
+  void Commit();
+  // The same, and leaves it to the next Commit() to tell of what was lost.
+  void CommitChanges();
+
+  // Carries out `item` for 0 to count - 1, all under one savepoint. `item` answers for its own
+  // Failures. Where the database refuses one, the list is rolled back and done again with a
+  // savepoint for each item, and `refused` gets the items that fail then.
+  void List(size_t count, const std::function<void(size_t)>& item,
+            const std::function<void(size_t, const Failure&)>& refused);
+
+  // Changes since the last commit.
+  size_t Uncommitted() const { return changes_; }
+  // Rolls back what is not committed after the database failed; see the class.
+  void Lose(const std::string& reason);
+  void LossIsTold() { lost_.clear(); }
+
+ private:
+  struct Change;
+  void Begin();
+  void ListOneByOne(size_t count, const std::function<void(size_t)>& item,
+                    const std::function<void(size_t, const Failure&)>& refused);
+  void RemoveDocument(StoredDocument document);
+  void Apply(Change& change);
+  void Reindex(Change& change, StoredDocument& document, const std::string& table,
+               const std::string& insert, const std::string& remove, bool before);
+  unsigned ChangedTables(Change& change);
+  bool Same(Change& change, const Item& before, const Item& after);
+  void WriteBodies(Change& change);
+  void WriteExact(Change& change);
+  void WriteRows(Change& change, bool filters_differ);
+  void MakeRoom(const std::string& path);
+  void CheckRequired(const Json::Value& data, bool whole) const;
+
+  Session& session_;
+  size_t changes_ = 0;
+  std::string lost_;  // Why changes were rolled back, until it is told.
+};
+
+}  // namespace vexlo::elasticd
+
+#endif  // DAEMONS_KAVOELASTICD_WRITER_H_

@@ -1,0 +1,231 @@
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sqlite3.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <fstream>
+#include <functional>
+#include <string>
+
+#include "daemons/kavoelasticd/engine_fixture.h"
+#include "support/faults.h"
+#include "support/syslog_capture.h"
+
+namespace {
+
+FAULTABLE(int, rename, (const char* from, const char* to), (from, to))
+FAULTABLE(int, fsync, (int fd), (fd))
+
+// A process of its own that runs `work` and never cleans up. Its status.
+int InChild(const std::function<void()>& work) {
+  const pid_t child = fork();
+  if (child == 0) {
+    work();
+    _exit(0);
+  }
+  int status = -1;
+  waitpid(child, &status, 0);
+  return status;
+}
+
+TEST(Crash, WhatWasCommittedIsThere) {
+  for (const int killed_after : {1, 4, 15, 40, 90}) {
+    SCOPED_TRACE(killed_after);
+    EngineFixture engine;
+    engine.Add("/v/seed");
+    engine.Restart();
+    int pipes[2];
+    ASSERT_EQ(pipe2(pipes, O_CLOEXEC), 0);
+    const pid_t child = fork();
+    if (child == 0) {
+      engine.Restart();
+      for (int i = 0;; ++i) {
+        const std::string path = "/v/" + std::to_string(i);
+        engine.Add(path, R"({"KAVOMDTextContent":"word)" + std::to_string(i) + "\"}");
+        if (i > 0) {
+          engine.Send(EngineFixture::Rename("/v/" + std::to_string(i - 1),
+                                            "/moved/" + std::to_string(i - 1)));
+        }
+        if (engine.Do("commit") != "ok" || write(pipes[1], "c", 1) != 1) {
+          _exit(1);
+        }
+      }
+    }
+    close(pipes[1]);
+    for (int i = 0; i < killed_after; ++i) {
+      char byte = 0;
+      ASSERT_EQ(read(pipes[0], &byte, 1), 1);
+    }
+    kill(child, SIGKILL);
+    waitpid(child, nullptr, 0);
+    close(pipes[0]);
+    engine.Restart();
+    // At least as many rounds as were told of; the last path says how many.
+    const Json::Value left = engine.Documents(R"({"prefix":{"KAVOMDPath":"/v/"}})");
+    ASSERT_EQ(left.size(), 2U);
+    const int last = std::stoi(left[0]["KAVOMDFSName"].asString());
+    EXPECT_GE(last, killed_after - 1);
+    EXPECT_EQ(engine.Documents(R"({"prefix":{"KAVOMDPath":"/moved/"}})", R"({"size":1000})").size(),
+              static_cast<unsigned>(last));
+    for (int i = 0; i <= last; ++i) {
+      EXPECT_EQ(engine.Search(R"({"words":"word)" + std::to_string(i) + "\"}"),
+                (i < last ? "/moved/" : "/v/") + std::to_string(i));
+    }
+  }
+}
+
+TEST(Crash, AMoveCutShortIsSettledAtTheNextStart) {
+  for (const int nth : {1, 2, 3, 4}) {
+    SCOPED_TRACE(nth);
+    EngineFixture engine;
+    engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");
+    engine.Restart();
+    const int status = InChild([&] {
+      engine.Restart();
+      // Die at the nth rename: of the registry, the database, or the registry again.
+      const ScopedFault fault("rename", EIO, nth, /*lasting=*/true);
+      const std::string data = R"({"data":{"path":")" + (engine.Folder() / "new") + "\"}}";
+      _exit(engine.Do("index_config_set", data) == "ok" ? 0 : 1);
+    });
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), nth <= 3 ? 1 : 0);
+    engine.Restart();
+    EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
+  }
+}
+
+TEST(Crash, ADamagedIndexIsSetAsideUntilItIsMadeAnew) {
+  struct Case {
+    const char* name;
+    std::function<void(const std::string&)> damage;
+  };
+  const auto overwrite = [](off_t at, size_t count) {
+    return [at, count](const std::string& file) {
+      const int fd = open(file.c_str(), O_WRONLY | O_CLOEXEC);
+      EXPECT_EQ(pwrite(fd, std::string(count, '\x5a').data(), count, at),
+                static_cast<ssize_t>(count));
+      close(fd);
+    };
+  };
+  const auto sql = [](const char* text) {
+    return [text](const std::string& file) {
+      sqlite3* db = nullptr;
+      EXPECT_EQ(sqlite3_open(file.c_str(), &db), SQLITE_OK);
+      EXPECT_EQ(sqlite3_exec(db, text, nullptr, nullptr, nullptr), SQLITE_OK);
+      sqlite3_close(db);
+    };
+  };
+  const Case cases[] = {
+      {"Header", overwrite(0, 100)},
+      {"APage", overwrite(8192 * 3, 8192)},
+      {"Empty", [](const std::string& f) { std::ofstream(f, std::ios::trunc); }},
+      {"CutShort", [](const std::string& f) { EXPECT_EQ(truncate(f.c_str(), 8192 * 9), 0); }},
+      {"Gone", [](const std::string& f) { unlink(f.c_str()); }},
+      {"AFolder", [](const std::string& f) { unlink(f.c_str()), mkdir(f.c_str(), 0755); }},
+      {"AnotherDatabase", sql("DROP TABLE records")},
+      {"AnotherIndex", sql("UPDATE meta SET v = 'x' WHERE k = 'token'")},
+      {"AnotherVersion", sql("UPDATE meta SET v = '0' WHERE k = 'version'")},
+      {"ARecord", sql("UPDATE records SET record = x'ff'")},
+      {"ATextIndex", sql("UPDATE texts_data SET block = x'00' WHERE id > 10")},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    EngineFixture engine;
+    SyslogCapture log;
+    for (int i = 0; i < 200; ++i) {
+      engine.Add("/v/" + std::to_string(i), R"({"KAVOMDTitle":"a title"})");
+    }
+    engine.Do("index_pause");
+    const std::string file = engine.Folder() / "i/index.db";
+    c.damage(file);
+    engine.Do("index_resume");
+    engine.Restart();
+    const std::string query = R"({"query":{"qsl":{"term":{"KAVOMDTitle":"title"}}}})";
+    for (int i = 0; i < 2; ++i) {
+      EXPECT_EQ(engine.Do("document_get_by_query", query), "2005");
+      EXPECT_EQ(engine.Do("document_upsert_by_id", R"({"doc_id":"/x","data":{}})"), "2005");
+      EXPECT_EQ(engine.Do("index_pause"), "2005");
+      engine.Restart();
+    }
+    EXPECT_EQ(std::filesystem::exists(file + ".damaged-1"), std::string(c.name) != "Gone");
+    EXPECT_FALSE(std::filesystem::exists(file + ".damaged-2"));
+    EXPECT_FALSE(log.Take().empty());
+    EXPECT_EQ(engine.Create("i", engine.Folder() / "i"), "ok");
+    EXPECT_EQ(engine.Add("/v/new"), "ok");
+    EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/"}})"), "/v/new");
+    EXPECT_EQ(engine.Do("index_delete"), "ok");
+    EXPECT_EQ(engine.Folder().Names(), std::set<std::string>({"registry.json"}));
+  }
+}
+
+TEST(Crash, ADamagedRegistryIsSetAside) {
+  EngineFixture engine;
+  const SyslogCapture log;
+  for (const std::string text : {"", "{\"indexes\":", "[]", "{\"indexes\":{\"i\":{\"path\":1}}}"}) {
+    WriteText(engine.Folder() / "registry.json", text);
+    engine.Restart();
+    EXPECT_EQ(engine.Do("commit"), "2002") << text;
+    EXPECT_EQ(engine.Create("i", engine.Folder() / "i"), "ok") << text;
+  }
+  EXPECT_EQ(ReadText(engine.Folder() / "registry.json.damaged-3"), "[]");
+}
+
+TEST(Crash, WhatTheDatabaseRefusesIsToldAtTheCommit) {
+  EngineFixture engine;
+  SyslogCapture log;
+  engine.Add("/v/before");
+  engine.Do("index_pause");
+  // Stands for whatever one statement may be refused for.
+  sqlite3* db = nullptr;
+  ASSERT_EQ(sqlite3_open((engine.Folder() / "i/index.db").c_str(), &db), SQLITE_OK);
+  ASSERT_EQ(sqlite3_exec(db,
+                         "CREATE TRIGGER refuse BEFORE INSERT ON bodies WHEN instr(new.text, 'bad')"
+                         " BEGIN SELECT RAISE(ABORT, 'refused'); END",
+                         nullptr, nullptr, nullptr),
+            SQLITE_OK);
+  sqlite3_close(db);
+  engine.Do("index_resume");
+  const auto document = [](const std::string& path, const std::string& text) {
+    return EngineFixture::Write("document_upsert_by_id", path,
+                                EngineFixture::Document(path, R"({"KAVOMDTextContent":")" + text +
+                                                                  std::string(500, 'x') + "\"}"));
+  };
+  // In a compound it fails alone, and leaves no part of it behind.
+  Json::Value request;
+  request["compound"].append(document("/v/1", "good "));
+  request["compound"].append(document("/v/2", "bad "));
+  request["compound"].append(document("/v/3", "good "));
+  const Json::Value reply = engine.Send(request);
+  EXPECT_TRUE(reply["has_fail"].asBool());
+  EXPECT_EQ(EngineFixture::Answer(reply["data"][1]), "2009");
+  EXPECT_EQ(engine.Search(R"({"words":"good","sort":"path"})"), "/v/1 /v/3");
+  EXPECT_EQ(engine.Search(R"({"words":"bad"})"), "");
+  // Alone it takes what was not committed with it, and the commit says so.
+  EXPECT_EQ(engine.Add("/v/4"), "ok");
+  EXPECT_EQ(EngineFixture::Answer(engine.Send(document("/v/5", "bad "))), "2009");
+  EXPECT_EQ(engine.Add("/v/6"), "ok");
+  EXPECT_EQ(engine.Do("commit"), "2011");
+  EXPECT_EQ(engine.Do("commit"), "ok");
+  EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/v"}})"), "/v/1 /v/3 /v/6 /v/before");
+}
+
+TEST(Crash, AChangeOfTheRegistryThatCannotBeWrittenChangesNothing) {
+  EngineFixture engine;
+  const SyslogCapture log;
+  engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");
+  for (const char* command : {"index_delete", "index_pause", "index_create"}) {
+    const ScopedFault fault("fsync", EIO, 1, /*lasting=*/true);
+    const std::string path = engine.Folder() / "j";
+    EXPECT_EQ(
+        std::string(command) == "index_create" ? engine.Create("j", path) : engine.Do(command),
+        "2009")
+        << command;
+  }
+  EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
+  engine.Restart();
+  EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
+}
+
+}  // namespace

@@ -1,0 +1,162 @@
+// An engine over one small index, spoken to as clients do.
+#ifndef DAEMONS_KAVOELASTICD_ENGINE_FIXTURE_H_
+#define DAEMONS_KAVOELASTICD_ENGINE_FIXTURE_H_
+
+#include <gtest/gtest.h>
+#include <json/writer.h>
+
+#include <chrono>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "common/json.h"
+#include "daemons/kavoelasticd/engine.h"
+#include "support/temp_folder.h"
+
+inline Json::Value Parsed(const std::string& text) {
+  Json::Value value;
+  EXPECT_TRUE(vexlo::JsonFromString(value, text)) << text;
+  return value;
+}
+
+// The mappings that the library sends, less most of the fields that are like others.
+constexpr char kMappings[] = R"({"property_id":"KAVOMDPath",
+ "default":{"type":"string","analyzer":"kavostandard","required":false,"stored":true,"_all":true},
+ "properties":{
+  "KAVOMDPath":{"analyzer":"keyword","required":true,"_all":false},
+  "KAVOMDFSName":{"analyzer":"keyword","_all":false},
+  "KAVOMDParent":{"analyzer":"keyword","_all":false},
+  "KAVOMDExtension":{"analyzer":"keyword","_all":false},
+  "KAVOMDIsDir":{"type":"bool","_all":false},
+  "KAVOMDFSSize":{"type":"int"},"KAVOMDFSContentChangeDate":{"type":"int"},
+  "KAVOMDAuthors":{"type":"text","analyzer":"white space"},
+  "KAVOMDTitle":{"type":"text"},"KAVOMDTextContent":{"type":"text"},
+  "KAVOMDIdentifier":{"type":"text","analyzer":"keyword","_all":false},
+  "KAVOMDDurationSecond":{"type":"double"},
+  "KAVOMDSearchFileName":{"type":"text","analyzer":"white space","preprocess":["tolower","ngram"]},
+  "KAVOMDSearchAncestor":{"type":"text","analyzer":"white space escaped",
+                          "preprocess":["list_ancestor"],"_all":false},
+  "Hidden":{"stored":false},
+  "Quiet":{"_all":false},
+  "Quiet text":{"type":"text","_all":false},
+  "Lower":{"analyzer":"keyword","preprocess":["tolower"]},
+  "Escaped":{"type":"text","analyzer":"white space escaped"}}})";
+
+class EngineFixture {
+ public:
+  explicit EngineFixture(const std::string& mappings = kMappings) {
+    Restart();
+    EXPECT_EQ(Create("i", folder_ / "i", mappings), "ok");
+  }
+
+  void Restart() {
+    engine_.reset();
+    engine_ = std::make_unique<vexlo::elasticd::Engine>(folder_ / "registry.json");
+  }
+
+  Json::Value Send(const Json::Value& request) { return engine_->Handle(request); }
+  Json::Value Send(const std::string& command, Json::Value data, const std::string& id = "i") {
+    Json::Value request;
+    request["command"] = command;
+    request["data"] = std::move(data);
+    if (!request["data"].isMember("id")) {
+      request["data"]["id"] = id;
+    }
+    return Send(request);
+  }
+
+  // "ok", or the code.
+  static std::string Answer(const Json::Value& reply) {
+    return reply["success"].asBool() ? "ok" : std::to_string(reply["error"]["code"].asInt());
+  }
+  std::string Do(const std::string& command, const std::string& data = "{}",
+                 const std::string& id = "i") {
+    return Answer(Send(command, Parsed(data), id));
+  }
+
+  std::string Create(const std::string& id, const std::string& path,
+                     const std::string& mappings = kMappings) {
+    Json::Value data;
+    data["id"] = id;
+    data["path"] = path;
+    data["settings"] = Json::objectValue;
+    data["mappings"] = Parsed(mappings);
+    const Json::Value reply = Send("index_create", data);
+    return Answer(reply);
+  }
+
+  // A document with the fields that follow from its path, and those of `more`.
+  static Json::Value Document(const std::string& path, const std::string& more = "{}") {
+    Json::Value data = Parsed(more);
+    const size_t slash = path.rfind('/');
+    data["KAVOMDPath"] = path;
+    for (const char* field : {"KAVOMDParent", "KAVOMDSearchAncestor"}) {
+      data[field] = path.substr(0, slash);
+    }
+    for (const char* field : {"KAVOMDFSName", "KAVOMDSearchFileName", "KAVOMDDisplayName"}) {
+      data[field] = path.substr(slash + 1);
+    }
+    const size_t dot = path.rfind('.');
+    data["KAVOMDExtension"] = dot == std::string::npos ? "" : path.substr(dot + 1);
+    return data;
+  }
+
+  static Json::Value Write(const std::string& command, const std::string& doc_id,
+                           const Json::Value& data) {
+    Json::Value request;
+    request["command"] = command;
+    request["data"]["id"] = "i";
+    request["data"]["doc_id"] = doc_id;
+    request["data"]["data"] = data;
+    return request;
+  }
+
+  std::string Add(const std::string& path, const std::string& more = "{}") {
+    return Answer(Send(Write("document_upsert_by_id", path, Document(path, more))));
+  }
+
+  // What the library sends for a document that moves from `from`.
+  static Json::Value Rename(const std::string& from, const std::string& to) {
+    return Write("document_set_by_id", from, Document(to));
+  }
+
+  // The documents that a query finds, as it gives them.
+  Json::Value Documents(const std::string& qsl, const std::string& rest = "{}") {
+    Json::Value data;
+    data["query"] = Parsed(rest);
+    data["query"]["qsl"] = Parsed(qsl);
+    const Json::Value reply = Send("document_get_by_query", data);
+    EXPECT_TRUE(reply["data"].isArray()) << reply;
+    return reply["data"];
+  }
+
+  static std::string Paths(const Json::Value& list, const char* field) {
+    std::string paths;
+    for (const Json::Value& item : list) {
+      paths += (paths.empty() ? "" : " ") + item[field].asString();
+    }
+    return paths;
+  }
+
+  // Their paths.
+  std::string Query(const std::string& qsl, const std::string& rest = "{}") {
+    return Paths(Documents(qsl, rest), "KAVOMDPath");
+  }
+  // The paths of a committed search.
+  std::string Search(const std::string& data) {
+    EXPECT_EQ(Do("commit"), "ok");
+    const Json::Value reply = Send("search", Parsed(data));
+    EXPECT_TRUE(reply["success"].asBool()) << reply;
+    return Paths(reply["data"], "path");
+  }
+
+  TempFolder& Folder() { return folder_; }
+  vexlo::elasticd::Engine& Engine() { return *engine_; }
+
+ private:
+  TempFolder folder_;
+  std::unique_ptr<vexlo::elasticd::Engine> engine_;
+};
+
+#endif  // DAEMONS_KAVOELASTICD_ENGINE_FIXTURE_H_

@@ -1,0 +1,367 @@
+#include "daemons/kavoelasticd/engine.h"
+
+#include <gtest/gtest.h>
+
+#include <string>
+#include <vector>
+
+#include "daemons/kavoelasticd/engine_fixture.h"
+#include "support/syslog_capture.h"
+
+namespace {
+
+struct QueryCase {
+  const char* name;
+  std::string qsl;
+  std::string want;  // Paths, or the code of a refusal.
+};
+
+void Check(EngineFixture& engine, const std::vector<QueryCase>& cases) {
+  for (const QueryCase& c : cases) {
+    EXPECT_EQ(engine.Query(c.qsl), c.want) << c.name;
+  }
+}
+
+TEST(Engine, AnswersEveryRequest) {
+  EngineFixture engine;
+  engine.Add("/v/a");
+  struct Case {
+    const char* name;
+    std::string request;
+    std::string want;
+  };
+  const Case cases[] = {
+      {"NoObject", "[]", "2000"},
+      {"Null", "null", "2000"},
+      {"NoCommand", R"({"data":{"id":"i"}})", "2000"},
+      {"UnknownCommand", R"({"command":"dance","data":{"id":"i"}})", "2000"},
+      {"DataIsNoObject", R"({"command":"commit","data":7})", "2000"},
+      {"NoId", R"({"command":"commit"})", "2000"},
+      {"MissingIndex", R"({"command":"commit","data":{"id":"j"}})", "2002"},
+      {"DeleteMissingIndex", R"({"command":"index_delete","data":{"id":"j"}})", "2002"},
+      {"PauseMissingIndex", R"({"command":"index_pause","data":{"id":"j"}})", "2002"},
+      {"CreateAgain",
+       R"({"command":"index_create","data":{"id":"i","path":"/x","mappings":{"property_id":"P"}}})",
+       "2003"},
+      {"RelativePath",
+       R"({"command":"index_create","data":{"id":"j","path":"x","mappings":{"property_id":"P"}}})",
+       "2000"},
+      {"NoMappings", R"({"command":"index_create","data":{"id":"j","path":"/x"}})", "2008"},
+      {"UnknownAnalyzer", R"({"command":"index_create","data":{"id":"j","path":"/x","mappings":
+        {"property_id":"P","properties":{"f":{"analyzer":"magic"}}}}})",
+       "2008"},
+      {"UnknownStep", R"({"command":"index_create","data":{"id":"j","path":"/x","mappings":
+        {"property_id":"P","default":{"preprocess":["cook"]}}}})",
+       "2008"},
+      {"UnknownLanguage", R"({"command":"index_create","data":{"id":"j","path":"/x",
+        "settings":{"language":"x' y"},"mappings":{"property_id":"P"}}})",
+       "2008"},
+      {"FolderIsAFile", R"({"command":"index_create","data":{"id":"j","path":"/dev/null/x",
+        "mappings":{"property_id":"P"}}})",
+       "2009"},
+      {"NoQuery", R"({"command":"document_get_by_query","data":{"id":"i"}})", "2000"},
+      {"UnknownQuery",
+       R"({"command":"document_get_by_query","data":{"id":"i","query":{"qsl":{"near":{}}}}})",
+       "2001"},
+      {"EmptyQuery", R"({"command":"document_del_by_query","data":{"id":"i","query":{"qsl":{}}}})",
+       "2001"},
+      {"EmptyTerm",
+       R"({"command":"document_del_by_query","data":{"id":"i","query":{"qsl":{"term":{}}}}})",
+       "2001"},
+      {"PrefixNumber",
+       R"({"command":"document_del_by_query","data":{"id":"i","query":{"qsl":{"prefix":{"a":1}}}}})",
+       "2001"},
+      {"PageIsText", R"({"command":"document_get_by_query","data":{"id":"i",
+        "query":{"qsl":{"term":{"KAVOMDPath":"/v/a"}},"size":"all"}}})",
+       "2000"},
+      {"SetMissing",
+       R"({"command":"document_set_by_id","data":{"id":"i","doc_id":"/v/b","data":{}}})", "2006"},
+      {"SetPathToNothing",
+       R"({"command":"document_set_by_id","data":{"id":"i","doc_id":"/v/a","data":{"KAVOMDPath":""}}})",
+       "2007"},
+      {"NoDocument", R"({"command":"document_upsert_by_id","data":{"id":"i","doc_id":"/v/b"}})",
+       "2007"},
+      {"SizeIsNoNumber", R"({"command":"document_upsert_by_id","data":{"id":"i","doc_id":"/v/b",
+        "data":{"KAVOMDFSSize":"big"}}})",
+       "2007"},
+      {"DeleteMissingIsDone",
+       R"({"command":"document_del_by_id","data":{"id":"i","doc_id":"/v/b"}})", "ok"},
+      {"CompoundIsNoList", R"({"compound":{}})", "2000"},
+      {"EmptyCompound", R"({"compound":[]})", "ok"},
+      {"DocIdStandsForThePath", R"({"command":"document_upsert_by_id","more":1,
+        "data":{"id":"i","doc_id":"/v/only id","data":{"x":"y"},"query":{}}})",
+       "ok"},
+  };
+  for (const Case& c : cases) {
+    const Json::Value reply = engine.Send(Parsed(c.request));
+    EXPECT_EQ(EngineFixture::Answer(reply), c.want) << c.name;
+    EXPECT_EQ(reply["error"]["msg"].isString(), c.want != "ok") << c.name;
+  }
+  EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/"}})"), "/v/a /v/only id");
+}
+
+TEST(Engine, MappingsDecideHowAFieldIsFound) {
+  EngineFixture engine;
+  engine.Add("/v/d/Bergbl\u00fcte.txt", R"({"KAVOMDTitle":"Running Waters deep",
+    "KAVOMDAuthors":["Ann Lee","B\u00e9la"],"KAVOMDIdentifier":"id 7","KAVOMDDurationSecond":2.5,
+    "KAVOMDIsDir":false,"KAVOMDFSSize":"12","Hidden":"found","Quiet":"night train",
+    "Lower":"MiXed \u00c9","Escaped":"one\\ two three","Free":"some words","KAVOMDTextContent":null})");
+  engine.Add("/v/d");
+  engine.Add("/v/dd/x");
+  const std::string doc = "/v/d/Bergbl\u00fcte.txt";
+  Check(engine,
+        {{"KeywordIsWhole", R"({"term":{"KAVOMDIdentifier":"id 7"}})", doc},
+         {"KeywordIsNoWord", R"({"term":{"KAVOMDIdentifier":"id"}})", ""},
+         {"KeywordBeginning", R"({"prefix":{"KAVOMDIdentifier":"id"}})", doc},
+         {"WhiteSpace", R"({"term":{"KAVOMDAuthors":"Lee"}})", doc},
+         {"WhiteSpaceKeepsCase", R"({"term":{"KAVOMDAuthors":"lee"}})", ""},
+         {"ListElement", "{\"term\":{\"KAVOMDAuthors\":\"B\u00e9la\"}}", doc},
+         {"Escaped", R"({"term":{"Escaped":"one two"}})", doc},
+         {"EscapedPart", R"({"term":{"Escaped":"one"}})", ""},
+         {"Lower", "{\"term\":{\"Lower\":\"mixed E\u0301\"}}", doc},
+         {"TextWord", R"({"term":{"KAVOMDTitle":"run"}})", doc},
+         {"TextPhrase", R"({"term":{"KAVOMDTitle":"water deep"}})", doc},
+         {"TextNoPhrase", R"({"term":{"KAVOMDTitle":"deep water"}})", ""},
+         {"TextBeginning", R"({"prefix":{"KAVOMDTitle":"wat"}})", doc},
+         {"OtherField", R"({"term":{"KAVOMDTextContent":"run"}})", ""},
+         {"StringWord", R"({"term":{"Quiet":"train"}})", doc},
+         {"NotListed", R"({"term":{"Free":"words"}})", doc},
+         {"NotListedOtherField", R"({"term":{"Quiet":"words"}})", ""},
+         {"NotStored", R"({"term":{"Hidden":"found"}})", doc},
+         {"Int", R"({"term":{"KAVOMDFSSize":12}})", doc},
+         {"IntAsText", R"({"term":{"KAVOMDFSSize":"12"}})", doc},
+         {"Double", R"({"term":{"KAVOMDDurationSecond":2.5}})", doc},
+         {"Bool", R"({"term":{"KAVOMDIsDir":false}})", doc},
+         {"Gram", R"({"term":{"KAVOMDSearchFileName":"GBLU"}})", doc},
+         {"GramBeginning", R"({"prefix":{"KAVOMDSearchFileName":"berg"}})", doc},
+         {"GramNotBeginning", R"({"prefix":{"KAVOMDSearchFileName":"blu"}})", ""},
+         {"Ancestor", R"({"term":{"KAVOMDSearchAncestor":"/v/d"}})", doc},
+         {"AncestorAbove", R"({"term":{"KAVOMDSearchAncestor":"/v"}})", "/v/d " + doc + " /v/dd/x"},
+         {"AncestorIsWhole", R"({"term":{"KAVOMDSearchAncestor":"/v/"}})", ""},
+         {"Parent", R"({"term":{"KAVOMDParent":"/v"}})", "/v/d"},
+         {"Both", R"({"term":{"KAVOMDIsDir":false},"prefix":{"KAVOMDPath":"/v/d/"}})", doc},
+         {"And", R"({"and":[{"term":{"Free":"some"}},{"term":{"KAVOMDPath":"/v/dd/x"}}]})", ""},
+         {"UnknownField", R"({"term":{"No such":"x"}})", ""},
+         {"PathTerm", R"({"term":{"KAVOMDPath":"/v/d"}})", "/v/d"},
+         {"PathPrefix", R"({"prefix":{"KAVOMDPath":"/v/d"}})", "/v/d " + doc + " /v/dd/x"}});
+  Json::Value shown = engine.Documents(R"({"term":{"Free":"some"}})")[0];
+  Json::Value want = EngineFixture::Document(doc, R"({"KAVOMDTitle":"Running Waters deep",
+    "KAVOMDAuthors":["Ann Lee","B\u00e9la"],"KAVOMDIdentifier":"id 7","KAVOMDDurationSecond":2.5,
+    "KAVOMDIsDir":false,"KAVOMDFSSize":12,"Quiet":"night train",
+    "Lower":"MiXed \u00c9","Escaped":"one\\ two three","Free":"some words"})");
+  EXPECT_EQ(shown, want);
+  EXPECT_EQ(engine.Documents(R"({"term":{"Free":"some"}})",
+                             R"({"load_field":["Free","Hidden","none","Free"]})"),
+            Parsed(R"([{"Free":"some words"}])"));
+  const std::string required = R"({"property_id":"P","properties":{"Must":{"required":true}}})";
+  EXPECT_EQ(engine.Create("j", engine.Folder() / "j", required), "ok");
+  EXPECT_EQ(engine.Do("document_upsert_by_id", R"({"doc_id":"/a","data":{"Other":1}})", "j"),
+            "2007");
+  EXPECT_EQ(engine.Do("document_upsert_by_id", R"({"doc_id":"/a","data":{"Must":1}})", "j"), "ok");
+  EXPECT_EQ(engine.Do("document_set_by_id", R"({"doc_id":"/a","data":{"Must":null}})", "j"),
+            "2007");
+}
+
+TEST(Engine, RenamesReplaceAndMerge) {
+  EngineFixture engine;
+  const std::string text(2000, 'x');
+  engine.Add("/v/a", R"({"KAVOMDTextContent":"first )" + text + R"(","Note":"one","Old":"gone"})");
+  engine.Add("/v/b", R"({"KAVOMDTextContent":"second"})");
+  EXPECT_EQ(EngineFixture::Answer(engine.Send(EngineFixture::Rename("/v/a", "/v/b"))), "ok");
+  // The document that stood there is replaced, its words with it; the old path is free.
+  EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/"}})"), "/v/b");
+  Check(engine, {{"Moved", R"({"term":{"KAVOMDTextContent":"first"}})", "/v/b"},
+                 {"Replaced", R"({"term":{"KAVOMDTextContent":"second"}})", ""},
+                 {"NewName", R"({"term":{"KAVOMDFSName":"b"}})", "/v/b"},
+                 {"OldName", R"({"term":{"KAVOMDFSName":"a"}})", ""}});
+  EXPECT_EQ(engine.Search(R"({"name":"a"})"), "");
+  EXPECT_EQ(engine.Search(R"({"words":"first","name":"b"})"), "/v/b");
+  // A document is known by its path, never by the one that it came with.
+  EXPECT_EQ(engine.Do("document_set_by_id", R"({"doc_id":"/v/a","data":{"Note":"x"}})"), "2006");
+  EXPECT_EQ(engine.Do("document_set_by_id",
+                      R"({"doc_id":"/v/b","data":{"Note":["two",2],"Old":null,"New":{"k":1}}})"),
+            "ok");
+  const Json::Value now = engine.Documents(R"({"term":{"KAVOMDPath":"/v/b"}})",
+                                           R"({"load_field":["Note","Old","New"]})");
+  EXPECT_EQ(now, Parsed(R"([{"Note":["two",2],"New":{"k":1}}])"));
+  Check(engine, {{"NewNote", R"({"term":{"Note":"two"}})", "/v/b"},
+                 {"OldNote", R"({"term":{"Note":"one"}})", ""},
+                 {"Removed", R"({"term":{"Old":"gone"}})", ""}});
+  // Only the path: what is not told keeps its value, also what was the folder or the name.
+  EXPECT_EQ(engine.Do("document_set_by_id", R"({"doc_id":"/v/b","data":{"KAVOMDPath":"/w/c"}})"),
+            "ok");
+  Check(engine, {{"Parent", R"({"term":{"KAVOMDParent":"/v"}})", "/w/c"},
+                 {"NoParent", R"({"term":{"KAVOMDParent":"/w"}})", ""},
+                 {"Ancestor", R"({"term":{"KAVOMDSearchAncestor":"/v"}})", "/w/c"},
+                 {"Name", R"({"term":{"KAVOMDFSName":"b"}})", "/w/c"},
+                 {"Text", R"({"term":{"KAVOMDTextContent":"first"}})", "/w/c"}});
+  // An upsert replaces the whole document.
+  engine.Add("/w/c", R"({"KAVOMDTitle":"last"})");
+  Check(engine, {{"OldText", R"({"term":{"KAVOMDTextContent":"first"}})", ""},
+                 {"OldParent", R"({"term":{"KAVOMDParent":"/v"}})", ""},
+                 {"NewTitle", R"({"term":{"KAVOMDTitle":"last"}})", "/w/c"}});
+  EXPECT_EQ(engine.Do("document_del_by_id", R"({"doc_id":"/w/c"})"), "ok");
+  EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":""}})"), "");
+  EXPECT_EQ(engine.Search(R"({"words":"last"})"), "");
+}
+
+TEST(Engine, PathsAreBytes) {
+  EngineFixture engine;
+  std::string deep;
+  for (int i = 0; i < 100; ++i) {
+    deep += "/" + std::string(39, 'a' + static_cast<char>(i % 26));
+  }
+  const std::string paths[] = {"/v/\xff\xfe\x80",
+                               "/v/caf\u00e9",
+                               "/v/cafe\u0301",
+                               "/v/new\nline \"quoted\" \\",
+                               "/v/" + std::string(255, 'n'),
+                               deep + "/" + std::string(4095 - deep.size() - 1, 'z'),
+                               std::string("/v/nul\0x", 8)};
+  for (const std::string& path : paths) {
+    EXPECT_EQ(engine.Add(path), "ok");
+  }
+  engine.Do("commit");
+  engine.Restart();
+  for (const std::string& path : paths) {
+    Json::Value data;
+    data["query"]["qsl"]["term"]["KAVOMDPath"] = path;
+    const Json::Value found = engine.Send("document_get_by_query", data)["data"];
+    ASSERT_EQ(found.size(), 1U) << path;
+    EXPECT_EQ(found[0], EngineFixture::Document(path)) << path;
+    EXPECT_EQ(EngineFixture::Answer(engine.Send(EngineFixture::Rename(path, path + "'"))), "ok");
+  }
+  Json::Value everything;
+  everything["query"]["qsl"]["prefix"]["KAVOMDPath"] = "";
+  EXPECT_EQ(engine.Send("document_get_by_query", everything)["data"].size(), std::size(paths));
+}
+
+TEST(Engine, PagesAreInTheOrderOfPaths) {
+  EngineFixture engine;
+  for (int i = 25; i-- > 0;) {
+    engine.Add("/v/d/" + std::string(1, static_cast<char>('a' + i)));
+  }
+  engine.Add("/v/d0");
+  const std::string below = R"({"prefix":{"KAVOMDPath":"/v/d/"}})";
+  EXPECT_EQ(engine.Documents(below).size(), 10U);
+  EXPECT_EQ(engine.Query(below, R"({"from":23,"size":10000})"), "/v/d/x /v/d/y");
+  EXPECT_EQ(engine.Query(R"({"term":{"KAVOMDParent":"/v/d"}})", R"({"from":24})"), "/v/d/y");
+  EXPECT_EQ(engine.Query(below, R"({"size":0})"), "");
+  EXPECT_EQ(engine.Do("document_del_by_query", R"({"query":{"qsl":)" + below + "}}"), "ok");
+  EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/"}})"), "/v/d0");
+}
+
+TEST(Engine, ItemsOfACompoundFailAlone) {
+  EngineFixture engine;
+  EXPECT_EQ(engine.Create("j", engine.Folder() / "j"), "ok");
+  engine.Add("/v/a", R"({"KAVOMDTitle":"alpha"})");
+  Json::Value request;
+  Json::Value& list = request["compound"];
+  list.append(EngineFixture::Rename("/v/a", "/v/b"));
+  list.append(EngineFixture::Rename("/v/a", "/v/c"));  // It is gone from there.
+  list.append(
+      Parsed(R"({"command":"document_upsert_by_id","data":{"id":"j","doc_id":"/j","data":{}}})"));
+  list.append(
+      Parsed(R"({"command":"document_upsert_by_id","data":{"id":"k","doc_id":"/k","data":{}}})"));
+  list.append(Parsed(R"({"command":"commit","data":{"id":"i"}})"));
+  list.append(7);
+  list.append(EngineFixture::Rename("/v/b", "/v/c"));
+  const Json::Value reply = engine.Send(request);
+  EXPECT_TRUE(reply["success"].asBool());
+  EXPECT_TRUE(reply["has_fail"].asBool());
+  std::string answers;
+  for (const Json::Value& item : reply["data"]) {
+    answers += EngineFixture::Answer(item) + " ";
+  }
+  EXPECT_EQ(answers, "ok 2006 ok 2002 2000 2000 ok ");
+  EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/"}})"), "/v/c");
+  EXPECT_EQ(engine.Search(R"({"words":"alpha"})"), "/v/c");
+}
+
+TEST(Engine, IndexesArePausedMovedRenamedAndDeleted) {
+  EngineFixture engine;
+  const SyslogCapture log;
+  TempFolder& folder = engine.Folder();
+  const auto state = [&] {
+    std::string text;
+    const Json::Value reply = engine.Send(Parsed(R"({"command":"index_list"})"));
+    for (const Json::Value& index : reply["data"]) {
+      text += index["id"].asString() + "=" + index["state"].asString() + "@" +
+              index["path"].asString().substr(folder.Path().size()) + " ";
+    }
+    return text;
+  };
+  engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");
+  EXPECT_EQ(engine.Create("j", folder / "i"), "2003") << "another index's folder";
+  EXPECT_EQ(engine.Create("j", folder / "j"), "ok");
+  // Paused: everything in one file, no work, also after a restart.
+  EXPECT_EQ(engine.Do("index_pause"), "ok");
+  EXPECT_EQ(engine.Do("index_pause"), "ok");
+  EXPECT_FALSE(std::filesystem::exists(folder / "i/index.db-wal"));
+  struct stat status;
+  ASSERT_EQ(stat((folder / "i/index.db").c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 0777, 0600U) << "the text of everybody's files";
+  engine.Restart();
+  for (const char* command : {"commit", "document_get_by_query", "document_upsert_by_id"}) {
+    EXPECT_EQ(engine.Do(command, R"({"doc_id":"/x","data":{}})"), "2004") << command;
+  }
+  // Moved while it is paused, it stays so.
+  EXPECT_EQ(engine.Do("index_config_set", R"({"data":{"path":")" + (folder / "m/n") + "\"}}"),
+            "ok");
+  EXPECT_EQ(state(), "i=paused@/m/n j=active@/j ");
+  EXPECT_EQ(engine.Do("index_resume"), "ok");
+  EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
+  // Renamed and moved with changes that are not committed yet.
+  engine.Add("/v/b", R"({"KAVOMDTitle":"kept"})");
+  EXPECT_EQ(engine.Do("index_config_set", R"({"data":{"id":"j"}})"), "2003");
+  EXPECT_EQ(engine.Do("index_config_set", R"({"data":{"path":")" + (folder / "j") + "\"}}"),
+            "2003");
+  EXPECT_EQ(
+      engine.Do("index_config_set", R"({"data":{"id":"k","path":")" + (folder / "k/") + "\"}}"),
+      "ok");
+  EXPECT_EQ(state(), "j=active@/j k=active@/k ");
+  EXPECT_EQ(engine.Do("commit"), "2002");
+  EXPECT_EQ(EngineFixture::Paths(engine.Send("search", Parsed(R"({"words":"kept"})"), "k")["data"],
+                                 "path"),
+            "/v/a /v/b");
+  // Whoever moved the folder itself only tells where it is now.
+  EXPECT_EQ(engine.Do("index_pause", "{}", "k"), "ok");
+  std::filesystem::rename(folder / "k", folder / "by hand");
+  EXPECT_EQ(
+      engine.Do("index_config_set", R"({"data":{"path":")" + (folder / "by hand") + "\"}}", "k"),
+      "ok");
+  EXPECT_EQ(engine.Do("index_resume", "{}", "k"), "ok");
+  WriteText(folder / "j/others", "");
+  EXPECT_EQ(engine.Do("index_delete", "{}", "j"), "ok");
+  EXPECT_EQ(engine.Do("index_delete", "{}", "k"), "ok");
+  EXPECT_EQ(engine.Do("index_delete", "{}", "k"), "2002");
+  EXPECT_EQ(state(), "");
+  EXPECT_EQ(folder.Names(), (std::set<std::string>{"j", "m", "registry.json"}));
+  EXPECT_EQ(ReadText(folder / "j/others"), "");
+  // A new index of the same id and place is empty.
+  EXPECT_EQ(engine.Create("j", folder / "j"), "ok");
+  EXPECT_EQ(engine.Send("search", Parsed(R"({"words":"kept"})"))["total"].asInt(), 0);
+}
+
+TEST(Engine, MovesToAnotherDisk) {
+  EngineFixture engine;
+  struct stat here;
+  struct stat there;
+  if (stat(engine.Folder().Path().c_str(), &here) != 0 || stat("/dev/shm", &there) != 0 ||
+      access("/dev/shm", W_OK) != 0 || here.st_dev == there.st_dev) {
+    GTEST_SKIP() << "/dev/shm is no other disk to write to";
+  }
+  TempFolder other("/dev/shm");
+  engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");
+  EXPECT_EQ(engine.Do("index_config_set", R"({"data":{"path":")" + (other / "x") + "\"}}"), "ok");
+  EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
+  EXPECT_FALSE(std::filesystem::exists(engine.Folder() / "i"));
+  struct stat status;
+  ASSERT_EQ(stat((other / "x/index.db").c_str(), &status), 0);
+  EXPECT_EQ(status.st_mode & 0777, 0600U) << "the text of everybody's files";
+  engine.Restart();
+  EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
+  EXPECT_EQ(engine.Do("index_delete"), "ok");
+}
+
+}  // namespace

@@ -1,0 +1,135 @@
+#include <gtest/gtest.h>
+
+#include <string>
+
+#include "daemons/kavoelasticd/engine_fixture.h"
+
+namespace {
+
+struct SearchCase {
+  const char* name;
+  std::string data;
+  std::string want;  // Paths in the order of the reply, or a code.
+};
+
+TEST(Search, FindsWordsNamesAndWhatTheFiltersLeave) {
+  EngineFixture engine;
+  engine.Add("/v/a/report.txt",
+             R"({"KAVOMDTextContent":"The quick brown foxes jumped over a lazy dog. Budget 2020.",
+                 "KAVOMDFSSize":100,"KAVOMDFSContentChangeDate":1000})");
+  engine.Add("/v/a/fox.JPG", R"({"KAVOMDTitle":"Winter in Zu\u0308rich","KAVOMDFSSize":200,
+                 "KAVOMDFSContentChangeDate":3000,"KAVOMDAuthors":"Ada Lovelace"})");
+  engine.Add("/v/ab/notes.md", R"({"KAVOMDTextContent":"dog brown quick fox","KAVOMDFSSize":300,
+                 "KAVOMDFSContentChangeDate":2000,"Quiet":"whisper","Quiet text":"murmur",
+                 "Hidden":"secretly"})");
+  engine.Add("/v/b/\u6771\u4eac\u90fd\u306e\u5730\u56f3.pdf",
+             "{\"KAVOMDTextContent\":\"\u65e5\u672c\u8a9e\u306e\u6587\u7ae0\"}");
+  engine.Add(
+      "/v/b/raw\xff\xfe"
+      "name.txt");
+  const SearchCase cases[] = {
+      {"Stem", R"({"words":"fox","sort":"path"})", "/v/a/fox.JPG /v/a/report.txt /v/ab/notes.md"},
+      {"NameCountsMost", R"({"words":"fox","size":1})", "/v/a/fox.JPG"},
+      {"AllWords", R"({"words":"brown jump"})", "/v/a/report.txt"},
+      {"WordsOfDifferentFields", R"({"words":"fox winter"})", "/v/a/fox.JPG"},
+      {"Phrase", R"({"words":"\"quick brown\""})", "/v/a/report.txt"},
+      {"PhraseOpen", R"({"words":"\"quick brown"})", "/v/a/report.txt"},
+      {"Beginning", R"({"words":"budg*"})", "/v/a/report.txt"},
+      {"BeginningBeyondTheStem", R"({"words":"lovelac*"})", "/v/a/fox.JPG"},
+      {"AccentsEitherWay", "{\"words\":\"Z\u00dcRICH\"}", "/v/a/fox.JPG"},
+      {"NumberInCatchAll", R"({"words":"300"})", "/v/ab/notes.md"},
+      {"OutsideCatchAll", R"({"words":"whisper"})", ""},
+      {"TextOutsideCatchAll", R"({"words":"murmur"})", ""},
+      {"NotStoredButFound", R"({"words":"secretly"})", "/v/ab/notes.md"},
+      {"PathIsNotSearched", R"({"words":"ab"})", ""},
+      {"OnlyNoise", R"({"words":"?!"})", ""},
+      {"Operators", R"({"words":"fox) OR (NEAR"})", ""},
+      {"Ideographs", "{\"words\":\"\u65e5\u672c\"}",
+       "/v/b/\u6771\u4eac\u90fd\u306e\u5730\u56f3.pdf"},
+      {"OneIdeograph", "{\"words\":\"\u7ae0\"}", "/v/b/\u6771\u4eac\u90fd\u306e\u5730\u56f3.pdf"},
+      {"IdeographsApart", "{\"words\":\"\u65e5\u8a9e\"}", ""},
+      {"PartOfName", R"({"name":"OTE"})", "/v/ab/notes.md"},
+      {"PartOfNameAtItsEnd", R"({"name":"s.md"})", "/v/ab/notes.md"},
+      {"OneLetter", R"({"name":"J"})", "/v/a/fox.JPG"},
+      {"LastLetter", R"({"name":"g"})", "/v/a/fox.JPG"},
+      {"GramsApart", R"({"name":"reporeport"})", ""},
+      {"PartWithIdeographs", "{\"name\":\"\u5730\u56f3\"}",
+       "/v/b/\u6771\u4eac\u90fd\u306e\u5730\u56f3.pdf"},
+      {"PartWithBadBytes", "{\"name\":\"w\xff\xfen\"}", "/v/b/raw\xff\xfename.txt"},
+      {"NoSuchName", R"({"name":"zzz"})", ""},
+      {"NameAndWords", R"({"name":"o","words":"brown"})", "/v/ab/notes.md /v/a/report.txt"},
+      {"Below", R"({"words":"fox","below":"/v/a","sort":"name"})", "/v/a/fox.JPG /v/a/report.txt"},
+      {"BelowWithSlash", R"({"below":"/v/ab/"})", "/v/ab/notes.md"},
+      {"BelowItself", R"({"below":"/v/ab/notes.md"})", ""},
+      {"Types", R"({"types":["jpg",".MD"],"sort":"path"})", "/v/a/fox.JPG /v/ab/notes.md"},
+      {"Sizes", R"({"size_min":101,"size_max":300,"sort":"size","descending":true})",
+       "/v/ab/notes.md /v/a/fox.JPG"},
+      {"Dates", R"({"modified_max":2000,"sort":"modified"})", "/v/a/report.txt /v/ab/notes.md"},
+      {"Page", R"({"below":"/v/a","sort":"size","from":1,"size":1})", "/v/a/fox.JPG"},
+      {"BehindTheEnd", R"({"words":"fox","from":3})", ""},
+      {"UnknownMembers", R"({"words":"budget","colour":"red"})", "/v/a/report.txt"},
+  };
+  for (const SearchCase& c : cases) {
+    EXPECT_EQ(engine.Search(c.data), c.want) << c.name;
+  }
+  const SearchCase refused[] = {
+      {"Sort", R"({"sort":"colour"})", "2000"},    {"Size", R"({"size":-1})", "2000"},
+      {"From", R"({"from":1e30})", "2000"},        {"Words", R"({"words":[]})", "2000"},
+      {"Types", R"({"types":[1]})", "2000"},       {"Below", R"({"below":{}})", "2000"},
+      {"Ids", R"({"ids":["nowhere"]})", "2002"},   {"Ids", R"({"ids":[7]})", "2000"},
+      {"Range", R"({"size_min":"much"})", "2000"},
+  };
+  for (const SearchCase& c : refused) {
+    EXPECT_EQ(engine.Do("search", c.data), c.want) << c.name;
+  }
+}
+
+TEST(Search, ShowsWhyAndWhat) {
+  EngineFixture engine;
+  std::string text = "\u00e9";
+  for (int i = 0; i < 300; ++i) {
+    text += " w\u00f6rd" + std::to_string(i);
+  }
+  engine.Add("/v/long.txt", "{\"KAVOMDTextContent\":\"" + text +
+                                " foxes\\nand GEESE\",\"KAVOMDFSSize\":7,\"KAVOMDIsDir\":false}");
+  EXPECT_EQ(engine.Create("j", engine.Folder() / "j"), "ok");
+  EXPECT_EQ(engine.Do("commit"), "ok");
+  const Json::Value reply = engine.Send("search", Parsed(R"({"words":"fox geese","snippet":true,
+                                       "load_field":["KAVOMDFSName","Hidden","none"]})"));
+  EXPECT_EQ(reply["total"].asInt(), 1);
+  Json::Value hit = reply["data"][0];
+  EXPECT_GT(hit["score"].asDouble(), 0);
+  hit.removeMember("score");
+  const std::string snippet = hit["snippet"].asString();
+  hit.removeMember("snippet");
+  EXPECT_EQ(hit, Parsed(R"({"id":"i","path":"/v/long.txt","name":"long.txt","size":7,
+                            "modified":null,"is_dir":false,"KAVOMDFSName":"long.txt"})"));
+  EXPECT_TRUE(snippet.starts_with("\u2026w\u00f6rd")) << snippet;
+  EXPECT_TRUE(
+      snippet.ends_with("\x02"
+                        "foxes\x03 and \x02"
+                        "GEESE\x03"))
+      << snippet;
+  // A paused index is left out of a search of all, and refused when it is named.
+  EXPECT_EQ(engine.Do("index_pause", "{}", "j"), "ok");
+  EXPECT_EQ(engine.Send("search", Parsed(R"({"words":"fox"})"))["skipped"],
+            Parsed(R"([{"id":"j","code":2004}])"));
+  EXPECT_EQ(engine.Do("search", R"({"ids":["i","j"]})"), "2004");
+}
+
+TEST(Search, MergesThePagesOfSeveralIndexes) {
+  EngineFixture engine;
+  EXPECT_EQ(engine.Create("j", engine.Folder() / "j"), "ok");
+  for (int i = 0; i < 10; ++i) {
+    const std::string path = "/v/" + std::to_string(i);
+    Json::Value request =
+        EngineFixture::Write("document_upsert_by_id", path, EngineFixture::Document(path));
+    request["data"]["id"] = i % 3 == 0 ? "i" : "j";
+    EXPECT_EQ(EngineFixture::Answer(engine.Send(request)), "ok");
+  }
+  EXPECT_EQ(engine.Do("commit", "{}", "j"), "ok");
+  EXPECT_EQ(engine.Search(R"({"sort":"path","from":2,"size":4})"), "/v/2 /v/3 /v/4 /v/5");
+  EXPECT_EQ(engine.Search(R"({"ids":["j"],"sort":"path","from":2,"size":2})"), "/v/4 /v/5");
+}
+
+}  // namespace

@@ -16,16 +16,19 @@ Json::Value Echo(const Json::Value& request) {
 
 int main(int argc, char** argv) {
   vexlo::daemon::DaemonOptions options = vexlo::elasticd::ElasticdOptions();
-  options.usage = "[fail]";
-  bool fails = false;
-  options.arguments = [&fails](const std::vector<std::string>& arguments) {
-    fails = arguments == std::vector<std::string>{"fail"};
-    return fails || arguments.empty();
+  options.usage = "[throw|stuck]";
+  std::string way;
+  options.arguments = [&way](const std::vector<std::string>& arguments) {
+    way = arguments.empty() ? "" : arguments[0];
+    return way.empty() || way == "throw" || way == "stuck";
   };
   options.reload = [] { throw std::runtime_error("no settings"); };
-  return RunDaemon(options, argc, argv, [&fails](vexlo::daemon::Daemon& daemon) {
-    if (fails) {
+  return RunDaemon(options, argc, argv, [&way](vexlo::daemon::Daemon& daemon) {
+    if (way == "throw") {
       throw std::runtime_error("as asked");
+    }
+    if (way == "stuck") {
+      daemon.EndAtOnce("as asked");
     }
     vexlo::elasticd::Serve(daemon, Echo);
   });

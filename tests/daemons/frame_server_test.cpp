@@ -2,10 +2,10 @@
 
 #include <signal.h>
 #include <sys/eventfd.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 
 #include <filesystem>
-#include <fstream>
 #include <future>
 #include <optional>
 
@@ -128,6 +128,10 @@ TEST_F(FrameServerTest, StalledConnectionsCostNoThread) {
   const auto threads = [] {
     return std::distance(std::filesystem::directory_iterator("/proc/self/task"), {});
   };
+  struct rlimit files {};
+  getrlimit(RLIMIT_NOFILE, &files);
+  files.rlim_cur = std::min<rlim_t>(files.rlim_max, 4096);  // Both ends are here.
+  ASSERT_TRUE(files.rlim_cur > 1100 && setrlimit(RLIMIT_NOFILE, &files) == 0);
   Start();
   EXPECT_EQ(Ask(path_, "warm"), "warm");
   const auto before = threads();

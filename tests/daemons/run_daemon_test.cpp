@@ -83,9 +83,10 @@ TEST_F(RunDaemonTest, EndsWithTheStatusThatSaysWhy) {
     int status;
     std::string says;
   } cases[] = {
-      {"Help", "--help", kEnded, "usage: kavoelasticd [fail]\n"},
-      {"Usage", "--nope", kUsage, "usage: kavoelasticd [fail]\n"},
-      {"WorkThrows", "fail", kFailed, "failed: as asked\n"},
+      {"Help", "--help", kEnded, "usage: kavoelasticd [throw|stuck]\n"},
+      {"Usage", "--nope", kUsage, "usage: kavoelasticd [throw|stuck]\n"},
+      {"WorkThrows", "throw", kFailed, "failed: as asked\n"},
+      {"WorkIsStuck", "stuck", kFailed, "ended at once: as asked\n"},
   };
   for (const auto& row : cases) {
     SCOPED_TRACE(row.name);

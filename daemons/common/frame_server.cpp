@@ -683,7 +683,7 @@ void FrameServer::Work() {
 // The request goes with the handler's call, before the reply is sent.
 std::optional<std::string> FrameServer::Answer(std::string request) {
   try {
-    return options_.handler(std::move(request));
+    return options_.handler(request);
   } catch (const std::exception& error) {
     LogLine(VEXLO_SOURCE, __LINE__, std::string("the handler failed, reason=") + error.what());
   } catch (...) {

@@ -34,7 +34,7 @@ struct FrameServerOptions {
   mode_t mode = 0600;       // Of the socket.
 
   // Called on several threads at once, as many as there are workers.
-  std::function<std::string(std::string request)> handler;
+  std::function<std::string(const std::string& request)> handler;
   // The reply to a request that is refused; when unset, or when it returns "", the connection is
   // closed without one.
   std::function<std::string(Refusal)> refusal;

@@ -6,10 +6,8 @@
 
 #include <cstdio>
 #include <filesystem>
-#include <optional>
 
 #include "kavo/local/shares.h"
-#include "kavo/sock_connection.h"
 #include "support/raw_client.h"
 #include "support/temp_folder.h"
 
@@ -58,13 +56,7 @@ class RunDaemonTest : public testing::Test {
     program.pid = std::stoi(std::exchange(program.text, ""));
     return program;
   }
-  std::string Ask(const std::string& request) const {
-    kavodaemon::DomainSockConnection connection(folder_ / "var/run/kavoelasticd.sock");
-    std::string reply;
-    return connection.Connect(60) && connection.Send(request) && connection.Recv(reply)
-               ? reply
-               : "<failed>";
-  }
+  std::string Ask(const std::string& request) const { return ::Ask(socket_, request); }
   std::set<std::string> Left() const {
     std::set<std::string> names;
     for (const auto& entry : std::filesystem::directory_iterator(folder_ / "var/run")) {
@@ -74,6 +66,7 @@ class RunDaemonTest : public testing::Test {
   }
 
   const TempFolder folder_;
+  const std::string socket_ = folder_ / "var/run/kavoelasticd.sock";
 };
 
 TEST_F(RunDaemonTest, EndsWithTheStatusThatSaysWhy) {
@@ -98,19 +91,18 @@ TEST_F(RunDaemonTest, EndsWithTheStatusThatSaysWhy) {
 }
 
 TEST_F(RunDaemonTest, ServesUntilItIsAskedToEnd) {
-  const int manager = socket(AF_UNIX, SOCK_DGRAM, 0);
-  const struct sockaddr_un address = UnixAddress(folder_ / "notify");
-  ASSERT_EQ(bind(manager, reinterpret_cast<const sockaddr*>(&address), sizeof(address)), 0);
+  const RawClient manager(UnixSocket(folder_ / "notify", SOCK_DGRAM, bind));
   Program program = Start("", "NOTIFY_SOCKET=" + (folder_ / "notify"));
   ASSERT_TRUE(program.Await("ready\n")) << program.text;
-  EXPECT_EQ(RawClient(dup(manager)).Receive(1), "R");  // The rest of a datagram is lost.
+  EXPECT_EQ(manager.Receive(1), "R");  // The rest of a datagram is lost.
   const std::string pid_file = folder_ / "var/run/kavoelasticd.pid";
   EXPECT_EQ(ReadText(pid_file), std::to_string(program.pid) + "\n");
 
-  const std::string malformed = R"("code":120,"msg":"the request is no JSON object"},)";
+  const std::string malformed =
+      R"({"error":{"code":120,"msg":"the request is no JSON object"},"success":false})";
   const struct {
     std::string request;
-    std::string reply;  // A part of it.
+    std::string reply;  // How it begins.
   } cases[] = {
       {"{\"name\":\"\xE9\"}", "{\"name\":\"\xE9\"}"},
       {"", malformed},
@@ -119,9 +111,10 @@ TEST_F(RunDaemonTest, ServesUntilItIsAskedToEnd) {
       {R"({"throw":1})", R"({"error":{"code":9999,)"},
   };
   for (const auto& row : cases) {
-    EXPECT_NE(Ask(row.request).find(row.reply), std::string::npos) << Ask(row.request);
+    EXPECT_TRUE(Ask(row.request).starts_with(row.reply)) << Ask(row.request);
   }
-  EXPECT_EQ(RawClient(folder_ / "var/run/kavoelasticd.sock").Send(std::string(8, '\xFF')), true);
+  EXPECT_EQ(RawClient(socket_, std::string(8, '\xFF')).Receive(31).substr(8),
+            R"({"error":{"code":120,"m)");
 
   Program second = Start();
   EXPECT_EQ(second.End(), kAlreadyRunning);
@@ -135,7 +128,7 @@ TEST_F(RunDaemonTest, ServesUntilItIsAskedToEnd) {
   EXPECT_EQ(Ask("{}"), "{}") << "the first one goes on";
 
   EXPECT_EQ(program.End(SIGTERM), kEnded);
-  EXPECT_EQ(RawClient(manager).Receive(1), "S");
+  EXPECT_EQ(manager.Receive(1), "S");
   EXPECT_EQ(Left(), std::set<std::string>{});
 }
 

@@ -1,4 +1,4 @@
-// A peer on a Unix stream socket that does not keep to the rules.
+// A peer on a Unix stream socket that does not keep to the rules, and one that does.
 #ifndef SUPPORT_RAW_CLIENT_H_
 #define SUPPORT_RAW_CLIENT_H_
 
@@ -8,59 +8,42 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <cstdint>
-#include <cstring>
 #include <string>
 #include <utility>
+
+#include "kavo/sock_connection.h"
 
 inline std::string LengthBytes(uint64_t length) {
   return std::string(reinterpret_cast<const char*>(&length), sizeof(length));
 }
 inline std::string Frame(const std::string& body) { return LengthBytes(body.size()) + body; }
 
-inline struct sockaddr_un UnixAddress(const std::string& path) {
+// A new socket, given with its address to bind() or connect().
+template <typename Use>
+int UnixSocket(const std::string& path, int type, Use use) {
   struct sockaddr_un address {};
   address.sun_family = AF_UNIX;
-  EXPECT_LT(path.size(), sizeof(address.sun_path));
-  memcpy(address.sun_path, path.data(), std::min(path.size(), sizeof(address.sun_path) - 1));
-  return address;
-}
-
-// Bound to the path; it listens when `backlog` is not negative.
-inline int BindTo(const std::string& path, int backlog) {
-  const struct sockaddr_un address = UnixAddress(path);
-  const int fd = socket(AF_UNIX, SOCK_STREAM, 0);
-  EXPECT_EQ(bind(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)), 0) << path;
-  EXPECT_TRUE(backlog < 0 || listen(fd, backlog) == 0);
+  path.copy(address.sun_path, sizeof(address.sun_path));
+  const int fd = socket(AF_UNIX, type, 0);
+  EXPECT_EQ(use(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)), 0) << path;
   return fd;
 }
 
-// An end of a connection: one that was accepted, or a new one to the path.
-class RawClient {
- public:
-  explicit RawClient(int fd) : fd_(fd) {}
-  explicit RawClient(const std::string& path) : fd_(socket(AF_UNIX, SOCK_STREAM, 0)) {
-    const struct sockaddr_un address = UnixAddress(path);
-    EXPECT_EQ(connect(fd_, reinterpret_cast<const sockaddr*>(&address), sizeof(address)), 0)
-        << strerror(errno);
+struct RawClient {
+  explicit RawClient(int socket) : fd(socket) {}
+  explicit RawClient(const std::string& path, const std::string& bytes = "")
+      : fd(UnixSocket(path, SOCK_STREAM, connect)) {
+    Send(bytes);
   }
-  ~RawClient() { Close(); }
-  RawClient(RawClient&& other) noexcept : fd_(std::exchange(other.fd_, -1)) {}
+  ~RawClient() { close(fd); }
+  RawClient(RawClient&& other) noexcept : fd(std::exchange(other.fd, -1)) {}
   RawClient(const RawClient&) = delete;
   RawClient& operator=(const RawClient&) = delete;
 
-  // False when the peer is gone.
+  // False when the peer is gone. It waits, so a part only of the bytes is never sent.
   bool Send(const std::string& bytes) const {
-    size_t sent = 0;
-    while (sent < bytes.size()) {
-      const ssize_t count = send(fd_, bytes.data() + sent, bytes.size() - sent, MSG_NOSIGNAL);
-      if (count < 0) {
-        return false;
-      }
-      sent += static_cast<size_t>(count);
-    }
-    return true;
+    return send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
   }
   // Up to `size` bytes; fewer when the peer closes.
   std::string Receive(size_t size = SIZE_MAX) const {
@@ -68,19 +51,21 @@ class RawClient {
     char buffer[65536];
     ssize_t count = 0;
     while (bytes.size() < size &&
-           (count = recv(fd_, buffer, std::min(sizeof(buffer), size - bytes.size()), 0)) > 0) {
+           (count = recv(fd, buffer, std::min(sizeof(buffer), size - bytes.size()), 0)) > 0) {
       bytes.append(buffer, static_cast<size_t>(count));
     }
     return bytes;
   }
-  void Close() {
-    if (fd_ >= 0) {
-      close(std::exchange(fd_, -1));
-    }
-  }
 
- private:
-  int fd_;
+  int fd;
 };
+
+// The reply, or "<failed>".
+inline std::string Ask(const std::string& path, const std::string& request) {
+  kavodaemon::DomainSockConnection connection(path);
+  std::string reply;
+  const bool done = connection.Connect(60) && connection.Send(request) && connection.Recv(reply);
+  return done ? reply : "<failed>";
+}
 
 #endif  // SUPPORT_RAW_CLIENT_H_

@@ -36,10 +36,12 @@ endif()
 file(RELATIVE_PATH fileindex_bin_to_lib
   ${CMAKE_INSTALL_FULL_BINDIR} ${CMAKE_INSTALL_FULL_LIBDIR})
 set_property(TARGET ${fileindex_libraries} PROPERTY INSTALL_RPATH "$ORIGIN")
-if(TARGET fileindex_cli)
-  set_property(TARGET fileindex_cli PROPERTY INSTALL_RPATH "$ORIGIN/${fileindex_bin_to_lib}")
-  install(TARGETS fileindex_cli RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
-endif()
+foreach(program fileindex_cli kavoelasticd)
+  if(TARGET ${program})
+    set_property(TARGET ${program} PROPERTY INSTALL_RPATH "$ORIGIN/${fileindex_bin_to_lib}")
+    install(TARGETS ${program} RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+  endif()
+endforeach()
 
 install(TARGETS ${fileindex_libraries} EXPORT fileindexTargets
   LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})

@@ -1,0 +1,252 @@
+#include "daemons/common/run_daemon.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <sys/file.h>
+#include <sys/resource.h>
+#include <sys/signalfd.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <syslog.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <cstddef>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <stdexcept>
+#include <system_error>
+#include <thread>
+
+namespace vexlo::daemon {
+namespace {
+
+// Enough for every connection and database; above it only a leak would come.
+constexpr rlim_t kWantedFiles = 65536;
+
+[[noreturn]] void Throw(const std::string& what) {
+  throw std::system_error(errno, std::system_category(), what);
+}
+
+class AlreadyRunning : public std::runtime_error {
+  using std::runtime_error::runtime_error;
+};
+
+class PidFile {
+ public:
+  explicit PidFile(const std::string& path) : path_(path) {
+    std::filesystem::create_directories(std::filesystem::path(path).parent_path());
+    // One that ends removes its file: a lock on a file that is gone excludes nobody.
+    do {
+      fd_ = UniqueFd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0644));
+      if (fd_.Get() < 0) {
+        Throw("open failed, path=" + path);
+      }
+      if (flock(fd_.Get(), LOCK_EX | LOCK_NB) != 0) {
+        if (errno == EWOULDBLOCK) {
+          throw AlreadyRunning("already running, pid " + Holder() + " holds " + path);
+        }
+        Throw("flock failed, path=" + path);
+      }
+    } while (!IsThere());
+    const std::string pid = std::to_string(getpid()) + "\n";
+    if (ftruncate(fd_.Get(), 0) != 0 ||
+        pwrite(fd_.Get(), pid.data(), pid.size(), 0) != static_cast<ssize_t>(pid.size())) {
+      Throw("write failed, path=" + path);
+    }
+  }
+  ~PidFile() { unlink(path_.c_str()); }
+  PidFile(const PidFile&) = delete;
+  PidFile& operator=(const PidFile&) = delete;
+
+ private:
+  bool IsThere() const {
+    struct stat locked {};
+    struct stat named {};
+    return fstat(fd_.Get(), &locked) == 0 && stat(path_.c_str(), &named) == 0 &&
+           locked.st_dev == named.st_dev && locked.st_ino == named.st_ino;
+  }
+  std::string Holder() const {
+    char text[16];
+    const ssize_t count = pread(fd_.Get(), text, sizeof(text), 0);
+    std::string pid(text, count > 0 ? static_cast<size_t>(count) : 0);
+    pid.erase(std::find(pid.begin(), pid.end(), '\n'), pid.end());
+    return pid.empty() ? "(not written yet)" : pid;
+  }
+
+  std::string path_;
+  UniqueFd fd_;
+};
+
+void Raise(int event_fd) {
+  const uint64_t one = 1;
+  while (write(event_fd, &one, sizeof(one)) < 0 && errno == EINTR) {
+  }
+}
+
+// A datagram of the service manager's protocol; nothing where none is wanted.
+void Notify(const std::string& state) {
+  // NOLINTNEXTLINE(concurrency-mt-unsafe): nobody sets the environment.
+  const char* const path = getenv("NOTIFY_SOCKET");
+  struct sockaddr_un address {};
+  const size_t length = path == nullptr ? 0 : strlen(path);
+  if (length < 2 || length >= sizeof(address.sun_path) || (*path != '/' && *path != '@')) {
+    return;
+  }
+  address.sun_family = AF_UNIX;
+  memcpy(address.sun_path, path, length);
+  if (*path == '@') {
+    address.sun_path[0] = '\0';  // An abstract name.
+  }
+  const UniqueFd fd(socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
+  if (sendto(fd.Get(), state.data(), state.size(), MSG_NOSIGNAL,
+             reinterpret_cast<const struct sockaddr*>(&address),
+             static_cast<socklen_t>(offsetof(struct sockaddr_un, sun_path) + length)) < 0) {
+    syslog(LOG_WARNING, "the service manager cannot be told '%s': %m", state.c_str());
+  }
+}
+
+// Takes the signals out of every thread's way, and waits for them on one of its own.
+class SignalThread {
+ public:
+  SignalThread(const DaemonOptions& options, int stop_fd) : options_(options), stop_fd_(stop_fd) {
+    sigset_t signals;
+    sigemptyset(&signals);
+    for (const int signal : {SIGTERM, SIGINT, SIGHUP}) {
+      sigaddset(&signals, signal);
+    }
+    if (pthread_sigmask(SIG_BLOCK, &signals, nullptr) != 0 ||
+        std::signal(SIGPIPE, SIG_IGN) == SIG_ERR) {
+      Throw("the signals cannot be set up");
+    }
+    signal_fd_ = UniqueFd(signalfd(-1, &signals, SFD_CLOEXEC | SFD_NONBLOCK));
+    quit_ = UniqueFd(eventfd(0, EFD_CLOEXEC));
+    if (signal_fd_.Get() < 0 || quit_.Get() < 0) {
+      Throw("no descriptor for the signals");
+    }
+    thread_ = std::thread([this] { Wait(); });
+  }
+  ~SignalThread() {
+    Raise(quit_.Get());
+    thread_.join();
+  }
+  SignalThread(const SignalThread&) = delete;
+  SignalThread& operator=(const SignalThread&) = delete;
+
+ private:
+  void Wait() {
+    struct pollfd fds[] = {{signal_fd_.Get(), POLLIN, 0}, {quit_.Get(), POLLIN, 0}};
+    while (fds[1].revents == 0) {
+      struct signalfd_siginfo info {};
+      while (read(signal_fd_.Get(), &info, sizeof(info)) == static_cast<ssize_t>(sizeof(info))) {
+        Take(static_cast<int>(info.ssi_signo));
+      }
+      poll(fds, 2, -1);
+    }
+  }
+
+  void Take(int signal) {
+    if (signal != SIGHUP) {
+      syslog(LOG_NOTICE, "ending, signal %d", signal);
+      Notify("STOPPING=1");
+      Raise(stop_fd_);
+    } else if (options_.reload) {
+      try {
+        options_.reload();
+        syslog(LOG_NOTICE, "reloaded");
+      } catch (const std::exception& error) {
+        syslog(LOG_ERR, "reloading failed: %s", error.what());
+      }
+    }
+  }
+
+  const DaemonOptions& options_;
+  const int stop_fd_;
+  UniqueFd signal_fd_;
+  UniqueFd quit_;
+  std::thread thread_;
+};
+
+// Services are started with few descriptors allowed, and a higher number that they may ask for.
+void AllowManyFiles() {
+  struct rlimit limit {};
+  if (getrlimit(RLIMIT_NOFILE, &limit) == 0 && limit.rlim_cur < kWantedFiles) {
+    limit.rlim_cur = std::max(limit.rlim_cur, std::min(limit.rlim_max, kWantedFiles));
+    setrlimit(RLIMIT_NOFILE, &limit);
+  }
+}
+
+// The journal's own standard error is known by its device and inode; the variable alone may have
+// been inherited.
+bool IsJournal(int fd) {
+  // NOLINTNEXTLINE(concurrency-mt-unsafe): there is one thread.
+  const char* const stream = getenv("JOURNAL_STREAM");
+  struct stat there {};
+  return stream != nullptr && fstat(fd, &there) == 0 &&
+         std::to_string(there.st_dev) + ":" + std::to_string(there.st_ino) == stream;
+}
+
+void OpenLog(const DaemonOptions& options) {
+  openlog(options.name.c_str(), LOG_PID | (IsJournal(STDERR_FILENO) ? 0 : LOG_PERROR), LOG_DAEMON);
+}
+
+}  // namespace
+
+Daemon::Daemon(const DaemonOptions& options) : options_(options), stop_(eventfd(0, EFD_CLOEXEC)) {
+  if (stop_.Get() < 0) {
+    Throw("eventfd failed");
+  }
+}
+
+// NOLINTNEXTLINE(readability-convert-member-functions-to-static): a daemon is what gets ready.
+void Daemon::Ready() {
+  Notify("READY=1\nMAINPID=" + std::to_string(getpid()));
+  syslog(LOG_NOTICE, "ready");
+}
+
+void Daemon::EndAtOnce(const std::string& reason) {
+  syslog(LOG_ERR, "ended at once: %s", reason.c_str());
+  unlink(options_.pid_file.c_str());
+  _exit(kFailed);
+}
+
+int RunDaemon(const DaemonOptions& options, int argc, char** argv,
+              const std::function<void(Daemon&)>& work) {
+  const std::vector<std::string> arguments(argv + std::min(argc, 1), argv + argc);
+  const bool help = arguments == std::vector<std::string>{"--help"};
+  if (help || !(options.arguments ? options.arguments(arguments) : arguments.empty())) {
+    fprintf(help ? stdout : stderr, "usage: %s%s%s\n", options.name.c_str(),
+            options.usage.empty() ? "" : " ", options.usage.c_str());
+    return help ? kEnded : kUsage;
+  }
+  OpenLog(options);
+  try {
+    umask(022);
+    if (chdir("/") != 0) {  // A folder that is held may be of a volume that is to be unmounted.
+      Throw("chdir failed, path=/");
+    }
+    AllowManyFiles();
+    const PidFile pid_file(options.pid_file);
+    Daemon daemon(options);
+    const SignalThread signals(options, daemon.StopFd());
+    work(daemon);
+    syslog(LOG_NOTICE, "ended");
+    return kEnded;
+  } catch (const AlreadyRunning& error) {
+    syslog(LOG_ERR, "%s", error.what());
+    return kAlreadyRunning;
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "failed: %s", error.what());
+  } catch (...) {
+    syslog(LOG_ERR, "failed: an exception of no known type");
+  }
+  return kFailed;
+}
+
+}  // namespace vexlo::daemon

@@ -1,0 +1,57 @@
+#include "daemons/kavoelasticd/server.h"
+
+#include <utility>
+
+#include "common/error.h"
+#include "common/json.h"
+#include "daemons/common/frame_server.h"
+#include "kavo/local/shares.h"
+
+namespace vexlo::elasticd {
+namespace {
+
+// Never one of the codes that make callers wait and try again: none of these passes by waiting.
+std::string ErrorText(ErrorCode code, const char* message) {
+  Json::Value reply(Json::objectValue);
+  reply["success"] = false;
+  reply["error"]["code"] = static_cast<int>(code);
+  reply["error"]["msg"] = message;
+  return JsonToString(reply);
+}
+
+std::string RefusalText(daemon::Refusal refusal) {
+  return refusal == daemon::Refusal::kTooLong
+             ? ErrorText(ERR_BAD_PARAMETER, "the request is too long")
+             : ErrorText(ERR_INTERNAL, "the request made the engine fail");
+}
+
+}  // namespace
+
+std::string AnswerText(const Handler& handler, const std::string& request) {
+  Json::Value value;
+  if (!JsonFromString(value, request) || !value.isObject()) {
+    return ErrorText(ERR_BAD_PARAMETER, "the request is no JSON object");
+  }
+  return JsonToString(handler(value));
+}
+
+daemon::DaemonOptions ElasticdOptions() {
+  daemon::DaemonOptions options;
+  options.name = "kavoelasticd";
+  options.pid_file = kavo::local::Root() + "/var/run/kavoelasticd.pid";
+  return options;
+}
+
+void Serve(daemon::Daemon& daemon, const Handler& handler) {
+  daemon::FrameServerOptions options;
+  options.socket_path = kavo::local::Root() + "/var/run/kavoelasticd.sock";
+  options.handler = [&handler](const std::string& request) { return AnswerText(handler, request); };
+  options.refusal = RefusalText;
+  daemon::FrameServer server(std::move(options));
+  daemon.Ready();
+  if (!server.Run(daemon.StopFd())) {
+    daemon.EndAtOnce("a request takes too long");
+  }
+}
+
+}  // namespace vexlo::elasticd

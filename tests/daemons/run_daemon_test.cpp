@@ -1,0 +1,147 @@
+// A daemon as a service manager or a person runs it: a program around RunDaemon().
+#include "daemons/common/run_daemon.h"
+
+#include <signal.h>
+#include <sys/wait.h>
+
+#include <cstdio>
+#include <filesystem>
+
+#include "kavo/local/shares.h"
+#include "support/raw_client.h"
+#include "support/temp_folder.h"
+
+namespace vexlo::daemon {
+namespace {
+
+class RunDaemonTest : public testing::Test {
+ protected:
+  // A program that runs, its standard error in a pipe.
+  struct Program {
+    FILE* output = nullptr;
+    pid_t pid = 0;
+    std::string text;
+
+    // Reads on until the text holds `wanted`; false when it ends before.
+    bool Await(const std::string& wanted) {
+      for (int byte = 0; text.find(wanted) == std::string::npos;) {
+        if ((byte = getc(output)) == EOF) {
+          return false;
+        }
+        text += static_cast<char>(byte);
+      }
+      return true;
+    }
+    // The exit status, after a signal if it is one; 128 and the signal that ended it.
+    int End(int signal = 0) {
+      kill(pid, signal);
+      EXPECT_FALSE(Await("what no daemon says"));
+      const int status = pclose(output);
+      return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+    }
+  };
+
+  void SetUp() override {
+    if (kavo::local::Root().empty()) {
+      GTEST_SKIP() << "this build's paths are the system's own";
+    }
+  }
+
+  Program Start(const std::string& arguments = "", const std::string& settings = "") {
+    Program program;
+    const std::string line = settings + " FILEINDEX_ROOT=" + folder_.Path() +
+                             " sh -c 'echo $$; exec " + ECHO_ENGINE + " " + arguments + "' 2>&1";
+    program.output = popen(line.c_str(), "re");
+    EXPECT_TRUE(program.Await("\n"));
+    program.pid = std::stoi(std::exchange(program.text, ""));
+    return program;
+  }
+  std::string Ask(const std::string& request) const { return ::Ask(socket_, request); }
+  std::set<std::string> Left() const {
+    std::set<std::string> names;
+    for (const auto& entry : std::filesystem::directory_iterator(folder_ / "var/run")) {
+      names.insert(entry.path().filename());
+    }
+    return names;
+  }
+
+  const TempFolder folder_;
+  const std::string socket_ = folder_ / "var/run/kavoelasticd.sock";
+};
+
+TEST_F(RunDaemonTest, EndsWithTheStatusThatSaysWhy) {
+  const struct {
+    const char* name;
+    const char* arguments;
+    int status;
+    std::string says;
+  } cases[] = {
+      {"Help", "--help", kEnded, "usage: kavoelasticd [throw|stuck]\n"},
+      {"Usage", "--nope", kUsage, "usage: kavoelasticd [throw|stuck]\n"},
+      {"WorkThrows", "throw", kFailed, "failed: as asked\n"},
+      {"WorkIsStuck", "stuck", kFailed, "ended at once: as asked\n"},
+  };
+  for (const auto& row : cases) {
+    SCOPED_TRACE(row.name);
+    Program program = Start(row.arguments);
+    EXPECT_EQ(program.End(), row.status);
+    EXPECT_NE(program.text.find(row.says), std::string::npos) << program.text;
+  }
+  EXPECT_EQ(Left(), std::set<std::string>{});
+}
+
+TEST_F(RunDaemonTest, ServesUntilItIsAskedToEnd) {
+  const RawClient manager(UnixSocket(folder_ / "notify", SOCK_DGRAM, bind));
+  Program program = Start("", "NOTIFY_SOCKET=" + (folder_ / "notify"));
+  ASSERT_TRUE(program.Await("ready\n")) << program.text;
+  EXPECT_EQ(manager.Receive(1), "R");  // The rest of a datagram is lost.
+  const std::string pid_file = folder_ / "var/run/kavoelasticd.pid";
+  EXPECT_EQ(ReadText(pid_file), std::to_string(program.pid) + "\n");
+
+  const std::string malformed =
+      R"({"error":{"code":120,"msg":"the request is no JSON object"},"success":false})";
+  const struct {
+    std::string request;
+    std::string reply;  // How it begins.
+  } cases[] = {
+      {"{\"name\":\"\xE9\"}", "{\"name\":\"\xE9\"}"},
+      {"", malformed},
+      {"[{}]", malformed},
+      {"{} {}", malformed},
+      {R"({"throw":1})", R"({"error":{"code":9999,)"},
+  };
+  for (const auto& row : cases) {
+    EXPECT_TRUE(Ask(row.request).starts_with(row.reply)) << Ask(row.request);
+  }
+  EXPECT_EQ(RawClient(socket_, std::string(8, '\xFF')).Receive(31).substr(8),
+            R"({"error":{"code":120,"m)");
+
+  Program second = Start();
+  EXPECT_EQ(second.End(), kAlreadyRunning);
+  EXPECT_NE(second.text.find("already running, pid " + std::to_string(program.pid) + " holds " +
+                             pid_file),
+            std::string::npos)
+      << second.text;
+  kill(program.pid, SIGPIPE);
+  kill(program.pid, SIGHUP);
+  EXPECT_TRUE(program.Await("reloading failed: no settings\n"));
+  EXPECT_EQ(Ask("{}"), "{}") << "the first one goes on";
+
+  EXPECT_EQ(program.End(SIGTERM), kEnded);
+  EXPECT_EQ(manager.Receive(1), "S");
+  EXPECT_EQ(Left(), std::set<std::string>{});
+}
+
+TEST_F(RunDaemonTest, StartsWhereAnotherWasKilled) {
+  for (const int signal : {SIGKILL, SIGINT}) {
+    Program program = Start();
+    ASSERT_TRUE(program.Await("ready\n")) << program.text;
+    EXPECT_EQ(Ask("{}"), "{}");
+    EXPECT_EQ(program.End(signal), signal == SIGKILL ? 128 + SIGKILL : 0);
+    EXPECT_EQ(Left().size(), signal == SIGKILL ? 2 : 0);
+    EXPECT_EQ(Ask("{}"), "<failed>");
+  }
+}
+
+}  // namespace
+}  // namespace vexlo::daemon

@@ -1,0 +1,58 @@
+#include "cli/engine.h"
+
+#include <unistd.h>
+
+#include "cli/shares.h"
+#include "cli/text.h"
+#include "common/error.h"
+#include "fileindex/comm.h"
+#include "fileindex/paths.h"
+
+namespace vexlo::cli {
+namespace {
+
+[[noreturn]] void FailWithoutEngine() {
+  throw Failure("the search engine kavoelasticd does not run (nobody answers on '" +
+                fileindex::kElasticdSocketPath.Get() + "')");
+}
+
+}  // namespace
+
+void WithEngine(const std::function<void()>& work) {
+  if (access(fileindex::kElasticdSocketPath.Get().c_str(), F_OK) != 0) {
+    FailWithoutEngine();
+  }
+  try {
+    work();
+  } catch (const Error& error) {
+    const std::string reason = error.what();
+    if (error.GetErrorCode() == ERR_ELASTIC_REQUEST && reason == "Connect failed") {
+      FailWithoutEngine();
+    }
+    if (error.GetErrorCode() == ERR_SHARE_NOT_FOUND) {
+      CheckSharesFile();
+      throw Failure("there is no share '" + reason + "'; 'fileindex share list' lists them");
+    }
+    if (error.GetErrorCode() == ERR_DOC_NOT_FOUND) {
+      throw Failure("the path is not in the index");
+    }
+    constexpr std::string_view kPrefix = "Request failed, msg=";
+    if (reason.starts_with(kPrefix)) {
+      throw Failure("the search engine says: " + ForTerminal(reason.substr(kPrefix.size())) +
+                    " (error " + std::to_string(error.GetErrorCode()) + ")");
+    }
+    throw;
+  }
+}
+
+Json::Value AskEngine(const Json::Value& request, Json::Value* reply) {
+  Json::Value answer;
+  WithEngine([&] { SendRequestImpl(answer, request); });
+  Json::Value data = answer["data"];
+  if (reply != nullptr) {
+    *reply = std::move(answer);
+  }
+  return data;
+}
+
+}  // namespace vexlo::cli

@@ -3,9 +3,13 @@
 #include <json/reader.h>
 #include <json/writer.h>
 
+#include <algorithm>
+#include <deque>
 #include <memory>
-#include <sstream>
+#include <ostream>
+#include <streambuf>
 #include <type_traits>
+#include <utility>
 
 #include "common/check.h"
 #include "common/error.h"
@@ -29,11 +33,61 @@ Json::CharReader& Reader() {
   return *reader;  // NOLINT(clang-analyzer-cplusplus.NewDelete): it lives as long as the thread.
 }
 
+// Collects what is written in blocks. A text that is grown in one piece takes up to three times its
+// length on the way, which for a request of ten thousand documents is memory to speak of.
+class BlockBuffer : public std::streambuf {
+ public:
+  // Empties the buffer: each block goes as soon as it is copied.
+  std::string Take() {
+    if (blocks_.size() == 1) {
+      return std::move(blocks_.front());
+    }
+    std::string text;
+    text.reserve(size_);
+    for (std::string& block : blocks_) {
+      text += block;
+      block = std::string();
+    }
+    return text;
+  }
+
+ protected:
+  int_type overflow(int_type byte) override {
+    const char c = traits_type::to_char_type(byte);
+    return xsputn(&c, 1) == 1 ? byte : traits_type::eof();
+  }
+  std::streamsize xsputn(const char* text, std::streamsize count) override {
+    std::string_view rest(text, static_cast<size_t>(count));
+    size_ += rest.size();
+    while (!rest.empty()) {
+      if (blocks_.empty() || blocks_.back().size() == blocks_.back().capacity()) {
+        blocks_.emplace_back().reserve(std::clamp(size_, kMinBlockBytes, kMaxBlockBytes));
+      }
+      std::string& block = blocks_.back();
+      const size_t taken = std::min(rest.size(), block.capacity() - block.size());
+      block.append(rest.substr(0, taken));
+      rest.remove_prefix(taken);
+    }
+    return count;
+  }
+
+ private:
+  static constexpr size_t kMinBlockBytes = 256;
+  static constexpr size_t kMaxBlockBytes = size_t{256} * 1024;
+
+  std::deque<std::string> blocks_;
+  size_t size_ = 0;
+};
+
 std::string Write(const Json::Value& value, const char* indentation) {
   Json::StreamWriterBuilder builder;
   builder["indentation"] = indentation;
   builder["emitUTF8"] = true;  // Every other form replaces bytes that are not UTF-8.
-  return Json::writeString(builder, value);
+  const std::unique_ptr<Json::StreamWriter> writer(builder.newStreamWriter());
+  BlockBuffer buffer;
+  std::ostream stream(&buffer);
+  writer->write(value, &stream);
+  return buffer.Take();
 }
 
 }  // namespace

@@ -23,6 +23,8 @@ class FixedPath {
   const char* path_;
 };
 
+inline constexpr FixedPath kFileIndexStatusCfgPath("/var/packages/Vexlo/etc/fileindex.status");
+inline constexpr FixedPath kFileIndexStatusLockPath("/tmp/vexlo_cfg_fi_status.lock");
 inline constexpr FixedPath kNotifyToolPath("/usr/kavo/bin/kavoqpxnotify");
 
 }  // namespace vexlo::fileindex

@@ -14,6 +14,7 @@
 #include "common/check.h"
 #include "common/error.h"
 #include "common/lock.h"
+#include "common/scoped_fd.h"
 #include "common/sdk/mutex.h"
 #include "common/string.h"
 #include "kavo/acl.h"
@@ -43,33 +44,6 @@ bool IsDirAfterLinks(const std::string& path, int links_allowed) {
   return length >= 0 &&
          IsDirAfterLinks(std::string(target, static_cast<size_t>(length)), links_allowed - 1);
 }
-
-// Closes a descriptor at the end of a scope without touching errno.
-class ScopedFd {
- public:
-  explicit ScopedFd(int fd) : fd_(fd) {}
-  ~ScopedFd() {
-    const int saved = errno;
-    Close();
-    errno = saved;
-  }
-  ScopedFd(const ScopedFd&) = delete;
-  ScopedFd& operator=(const ScopedFd&) = delete;
-
-  int Get() const { return fd_; }
-  bool IsOpen() const { return fd_ >= 0; }
-  bool Close() {
-    if (fd_ < 0) {
-      return true;
-    }
-    const int fd = fd_;
-    fd_ = -1;
-    return close(fd) == 0;
-  }
-
- private:
-  int fd_;
-};
 
 // Writes all of `data`; false with errno at the first failure.
 bool WriteAll(int fd, std::string_view data) {

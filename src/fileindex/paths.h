@@ -25,6 +25,7 @@ class FixedPath {
 
 inline constexpr FixedPath kFileIndexStatusCfgPath("/var/packages/Vexlo/etc/fileindex.status");
 inline constexpr FixedPath kFileIndexStatusLockPath("/tmp/vexlo_cfg_fi_status.lock");
+inline constexpr FixedPath kFileIndexDaemonSocketPath("/var/run/fileindexd.sock");
 inline constexpr FixedPath kNotifyToolPath("/usr/kavo/bin/kavoqpxnotify");
 
 }  // namespace vexlo::fileindex

@@ -42,6 +42,19 @@ class VEXLO_EXPORT StatusMgr {
   long GetPauseInfo() const;
   unsigned int GetShareStatus(const std::string& share) const;
 
+  // Pauses indexing for `hours` hours from now, or until Resume() when `hours` is 0, and tells the
+  // daemon ("pause", {"resume_time": the instant as above}). The hours are made seconds in 32 bits,
+  // which wrap: from 596,524 on the instant may lie in the past.
+  // Throws Error 120 when `hours` is negative and nothing changes.
+  void Pause(int hours);
+
+  // Ends a pause, and tells the daemon ("resume", null).
+  void Resume();
+
+  // Both hold the status lock throughout. The file is saved before the daemon hears of it, and
+  // stays so when the daemon cannot be told: they throw, and block, as SendCommandToDaemon() does,
+  // besides what Save() and the lock throw.
+
   // Add bits to a share's word, take bits away (a share that had no word has one of 0 then), and
   // drop the word. Throw as GetShareStatus() and Save() do, and for the lock.
   void SetShareStatus(const std::string& share, int bits);
@@ -54,6 +67,7 @@ class VEXLO_EXPORT StatusMgr {
 
  private:
   Json::Value GetShares() const;
+  void SaveResumeTime(Json::Int64 resume_time);
 
   Json::Value data_;
 };

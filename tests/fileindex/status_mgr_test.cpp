@@ -1,20 +1,23 @@
+// The status file, and the command channel that a pause goes out on.
 #include "fileindex/status_mgr.h"
 
+#include <sys/socket.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 
-#include <ctime>
+#include <csignal>
 #include <optional>
+#include <thread>
 
 #include "common/error.h"
 #include "common/json.h"
 #include "common/lock.h"
-#include "fileindex/paths.h"
-#include "support/fake_daemon.h"
+#include "fileindex/communication.h"
 #include "support/faults.h"
 #include "support/private_root.h"
-#include "support/syslog_capture.h"
 
 using namespace vexlo::fileindex;
+using std::to_string;
 
 namespace {
 
@@ -22,161 +25,222 @@ const PrivateRoot root;
 const std::string folder = root.MakeFolder("var/packages/Vexlo/etc");
 const std::string file = folder + "/fileindex.status";
 const std::string lock_file = root.MakeFolder("tmp") + "/vexlo_cfg_fi_status.lock";
-const std::string sockets = root.MakeFolder("var/run");
+const std::string socket_file = root.MakeFolder("var/run") + "/fileindexd.sock";
+std::vector<unsigned> waits;  // In milliseconds, and a thousandth as long.
+std::function<void()> on_wait = [] {
+  std::this_thread::sleep_for(std::chrono::microseconds(waits.back()));
+};
+int interruptions = 0;  // So many writes are cut short.
+
+int Wait(unsigned milliseconds) { return waits.push_back(milliseconds), on_wait(), 0; }
 
 }  // namespace
 
-FAULTABLE(ssize_t, write, (int fd, const void* data, size_t size), (fd, data, size))
+INTERPOSED ssize_t write(int fd, const void* data, size_t size) {
+  static const auto real = REAL_FUNCTION(ssize_t, write, (int, const void*, size_t));
+  const bool interrupted = interruptions > 0 && --interruptions >= 0;
+  errno = interrupted ? EINTR : errno;
+  return interrupted || ScopedFault::Fires("write") ? -1 : real(fd, data, size);
+}
 FAULTABLE(int, fsync, (int fd), (fd))
 FAULTABLE(int, rename, (const char* from, const char* to), (from, to))
 FAULTABLE(int, chmod, (const char* path, mode_t mode), (path, mode))
-INTERPOSED unsigned sleep(unsigned /*seconds*/) { return 0; }
-INTERPOSED int usleep(useconds_t microseconds) {  // A thousandth as long.
-  const timespec pause{0, static_cast<long>(microseconds)};
-  return nanosleep(&pause, nullptr);
-}
+INTERPOSED time_t time(time_t* /*copy*/) { return 2000000000; }
+INTERPOSED unsigned sleep(unsigned seconds) { return Wait(seconds * 1000); }
+INTERPOSED int usleep(useconds_t microseconds) { return Wait(microseconds / 1000); }
 
 namespace {
 
-Json::Value Parsed(const std::string& text) {
-  Json::Value value;
-  EXPECT_TRUE(vexlo::JsonFromString(value, text)) << text;
-  return value;
-}
+std::vector<std::string> commands;  // As the last daemon got them, with their NULs.
 
-// What is thrown, 0 for nothing.
-int CodeOf(const std::function<void(StatusMgr&)>& act) {
-  try {
-    StatusMgr manager;
-    act(manager);
-    return 0;
-  } catch (const vexlo::Error& error) {
-    return error.GetErrorCode();
+// Answers each command with `answer`, byte by byte; without one it accepts nothing.
+struct Daemon {
+  explicit Daemon(const std::optional<std::string>& answer = std::string(8, '\0')) {
+    commands.clear();
+    sockaddr_un address{AF_UNIX, {}};
+    socket_file.copy(address.sun_path, sizeof(address.sun_path) - 1);
+    EXPECT_EQ(bind(listener, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
+    EXPECT_EQ(listen(listener, 64), 0);
+    thread = std::thread([=, this] {
+      for (int fd = -1; answer && (fd = accept(listener, nullptr, nullptr)) >= 0; close(fd)) {
+        uint64_t length = 0;
+        recv(fd, &length, sizeof(length), MSG_WAITALL);
+        recv(fd, commands.emplace_back(length, '?').data(), length, MSG_WAITALL);
+        for (const char byte : *answer) {
+          send(fd, &byte, 1, MSG_NOSIGNAL);
+        }
+      }
+    });
   }
-}
-
-struct Case {
-  const char* name;
-  std::function<void(StatusMgr&)> act;
-  std::string before, want;  // The file, "" for none; with NOW for the instant of the pause.
-  int code = 0;
-  std::string want_command = "";  // As the daemon gets it.
-  long want_now = 0;              // Seconds from now to that instant.
+  ~Daemon() {
+    shutdown(listener, SHUT_RDWR);
+    thread.join();
+    close(listener);
+    unlink(socket_file.c_str());
+  }
+  const int listener = socket(AF_UNIX, SOCK_STREAM, 0);
+  std::thread thread;
 };
 
+// "CODE REASON" of an Error, the text that a wait was broken off with, or "".
+using Act = std::function<void(StatusMgr&)>;
+std::string Caught(const Act& act) {
+  try {
+    StatusMgr manager;
+    return act(manager), "";
+  } catch (const vexlo::Error& error) {
+    return to_string(error.GetErrorCode()) + " " + error.what();
+  } catch (const char* text) {
+    return text;
+  }
+}
+const Act kSet = [](StatusMgr& manager) { manager.SetShareStatus("\xE9", 5); };
+const Act kUnset = [](StatusMgr& manager) { manager.UnsetShareStatus("\xE9", 3); };
+const Act kClear = [](StatusMgr& manager) { manager.ClearShareStatus("\xE9"); };
+const Act kResume = &StatusMgr::Resume;
+Act Pause(int hours, const std::string& lock_path = lock_file + "2") {
+  return [=](StatusMgr& manager) {
+    const vexlo::LockFile lock(lock_path, /*exclusive=*/true);
+    manager.Pause(hours);
+  };
+}
+Json::Value Parsed(const std::string& text) {
+  Json::Value value;
+  return vexlo::JsonFromString(value, text) ? value : text;
+}
+
 TEST(StatusMgr, ChangesTheFileAndTellsTheDaemon) {
-  const auto set = [](StatusMgr& manager) { manager.SetShareStatus("\xE9", 5); };
-  const auto unset = [](StatusMgr& manager) { manager.UnsetShareStatus("\xE9", 3); };
-  const auto clear = [](StatusMgr& manager) { manager.ClearShareStatus("\xE9"); };
-  const auto resume = [](StatusMgr& manager) { manager.Resume(); };
-  const auto pause = [](int hours) { return [=](StatusMgr& manager) { manager.Pause(hours); }; };
-  const auto locked = [](StatusMgr& manager) {
-    const vexlo::LockFile lock(lock_file, /*exclusive=*/true);
-    manager.Pause(-1);
+  struct Row {
+    const char* name;
+    Act act;
+    std::string before, want;  // The file, "" for none, with ' for ".
+    std::string code = "", want_sent = "";
   };
-  const std::string tell = R"({"data":{"resume_time":NOW},"type":"pause"})";
-  const Case cases[] = {
-      {"SetFirst", set, "", "{\"share\":{\"\xE9\":5}}"},
-      {"SetOnNull", set, "null", "{\"share\":{\"\xE9\":5}}"},
-      {"SetAddsBits", set, "{\"new\":1,\"share\":{\"a\":1,\"\xE9\":2}}",
-       "{\"new\":1,\"share\":{\"a\":1,\"\xE9\":7}}"},
-      {"SetOverAnotherType", set, "{\"share\":{\"\xE9\":\"x\"}}", "{\"share\":{\"\xE9\":5}}"},
-      {"Unset", unset, "{\"share\":{\"\xE9\":4294967295}}", "{\"share\":{\"\xE9\":4294967292}}"},
-      {"UnsetWithoutWord", unset, "{\"share\":null}", "{\"share\":{\"\xE9\":0}}"},
-      {"Clear", clear, "{\"share\":{\"a\":1,\"\xE9\":2}}", "{\"share\":{\"a\":1}}"},
-      {"ClearWithoutShares", clear, "", "{}"},
-      {"NoObject", set, "[1]", "[1]", 120},
-      {"PauseOfNoObject", pause(0), "[1]", "[1]", 120},
-      {"SharesAreNoObject", clear, "{\"share\":[]}", "{\"share\":[]}", 120},
-      {"NoJson", set, "7 {", "7 {", 504},
-      {"Pause", pause(2), "{\"a\":1}", "{\"a\":1,\"resume_time\":NOW}", 0, tell, 7200},
-      {"PauseThatWraps", pause(600000), "", "{\"resume_time\":NOW}", 0, tell, -2134967296},
-      {"PauseWithoutEnd", pause(0), "", "{\"resume_time\":0}", 0,
-       R"({"data":{"resume_time":0},"type":"pause"})"},
-      {"NegativePause", pause(-1), "{}", "{}", 120},
-      {"NegativePauseUnderLock", locked, "{}", "{}", 506},
-      {"Resume", resume, "{\"resume_time\":0}", "{\"resume_time\":-1}", 0,
-       R"({"data":null,"type":"resume"})"},
+  const auto pause = [](const std::string& instant) {
+    return R"({"data":{"resume_time":)" + instant + R"(},"type":"pause"})" + '\0';
   };
-  for (const Case& row : cases) {
+  const std::string resume = R"({"data":null,"type":"resume"})" + std::string(1, '\0');
+  for (const Row& row : {
+           Row{"SetFirst", kSet, "", "{'share':{'\xE9':5}}"},
+           Row{"SetOnNull", kSet, "null", "{'share':{'\xE9':5}}"},
+           Row{"SetAdds", kSet, "{'x':1,'share':{'\xE9':2}}", "{'x':1,'share':{'\xE9':7}}"},
+           Row{"Unset", kUnset, "{'share':{'\xE9':4294967295}}", "{'share':{'\xE9':4294967292}}"},
+           Row{"UnsetWithoutWord", kUnset, "{'share':null}", "{'share':{'\xE9':0}}"},
+           Row{"Clear", kClear, "{'share':{'a':1,'\xE9':2}}", "{'share':{'a':1}}"},
+           Row{"ClearWithoutShares", kClear, "", "{}"},
+           Row{"NoObject", kSet, "[1]", "[1]", "120"},
+           Row{"PauseOfNoObject", Pause(0), "[1]", "[1]", "120"},
+           Row{"SharesAreNoObject", kClear, "{'share':[]}", "{'share':[]}", "120"},
+           Row{"NoJson", kSet, "7 {", "7 {", "504"},
+           Row{"Pause", Pause(2), "{'a':1}", "{'a':1,'resume_time':2000007200}", "",
+               pause("2000007200")},
+           Row{"Wraps", Pause(600000), "", "{'resume_time':-134967296}", "", pause("-134967296")},
+           Row{"WithoutEnd", Pause(0), "", "{'resume_time':0}", "", pause("0")},
+           Row{"Negative", Pause(-1), "{}", "{}", "120"},
+           Row{"NegativeUnderLock", Pause(-1, lock_file), "{}", "{}", "506"},
+           Row{"Resume", kResume, "{'resume_time':0}", "{'resume_time':-1}", "", resume},
+       }) {
     SCOPED_TRACE(row.name);
-    row.before.empty() ? void(unlink(file.c_str())) : WriteText(file, row.before);
-    FakeDaemon daemon;
-    SyslogCapture log;
-    const time_t start = time(nullptr);
-    EXPECT_EQ(CodeOf(row.act), row.code);
-    std::string want = row.want, want_command = row.want_command;
-    if (row.want_now != 0) {
-      const long instant = StatusMgr().GetPauseInfo();
-      EXPECT_NEAR(instant - start, row.want_now, 2);
-      want.replace(want.find("NOW"), 3, std::to_string(instant));
-      want_command.replace(want_command.find("NOW"), 3, std::to_string(instant));
-    }
-    const std::string text = ReadText(file);
-    EXPECT_TRUE(row.code == 0 ? Parsed(text) == Parsed(want) : text == want) << text;
-    std::vector<std::string> want_commands;
-    want_command.empty() ? void() : want_commands.push_back(want_command + '\0');
-    EXPECT_EQ(daemon.Stop(), want_commands);
+    std::string before = row.before, want = row.want;
+    std::replace(before.begin(), before.end(), '\'', '"');
+    std::replace(want.begin(), want.end(), '\'', '"');
+    before.empty() ? void(unlink(file.c_str())) : WriteText(file, before);
+    std::optional<Daemon> daemon(std::in_place);
+    EXPECT_EQ(Caught(row.act).substr(0, 3), row.code);
+    daemon.reset();
+    EXPECT_EQ(Parsed(ReadText(file)), Parsed(want));
+    EXPECT_EQ(commands, std::vector<std::string>(row.want_sent.empty() ? 0 : 1, row.want_sent));
   }
 }
 
-TEST(StatusMgr, SavesWhatItReadNotWhatOthersSaved) {
+TEST(StatusMgr, SavesWhatItReadAndNothingWhenASaveFails) {
   unlink(file.c_str());
-  StatusMgr a, b;
-  EXPECT_EQ(a.GetPauseInfo(), -1);
-  a.SetShareStatus("a", 1);
-  b.SetShareStatus("b", 1);
-  EXPECT_EQ(Parsed(ReadText(file)), Parsed("{\"share\":{\"b\":1}}"));
-  EXPECT_EQ(CodeOf(&StatusMgr::Resume), 502);  // Without a daemon the change stands.
-  EXPECT_EQ(Parsed(ReadText(file)), Parsed("{\"resume_time\":-1,\"share\":{\"b\":1}}"));
-}
-
-TEST(StatusMgr, AFailedSaveLeavesTheOldFile) {
-  for (const auto& [function, code] :
-       {std::pair{"write", 505}, {"fsync", 505}, {"rename", 505}, {"chmod", 502}}) {
-    SCOPED_TRACE(function);
-    WriteText(file, "{}");
-    SyslogCapture log;
-    {
-      const ScopedFault fault(function, EIO);
-      EXPECT_EQ(CodeOf([](StatusMgr& manager) { manager.SetShareStatus("a", 1); }), code);
-    }
-    EXPECT_EQ(ReadText(file) == "{}", code == 505);
+  StatusMgr first, second;
+  EXPECT_EQ(first.GetPauseInfo() + first.GetShareStatus("a"), -1);
+  first.SetShareStatus("a", 1);
+  second.SetShareStatus("b", 1);
+  EXPECT_EQ(Caught(kResume).substr(0, 3), "502");  // Without a daemon the change stays.
+  const std::string text = ReadText(file);
+  EXPECT_EQ(Parsed(text), Parsed(R"({"resume_time":-1,"share":{"b":1}})"));
+  for (const std::string function : {"write", "fsync", "rename", "chmod"}) {
+    const ScopedFault fault(function.c_str(), EIO);
+    EXPECT_EQ(Caught(kSet), function == "chmod" ? "502 chmod failed, reason=Input/output error"
+                                                : "505 Failed to save json: " + file);
+    EXPECT_EQ(ReadText(file) == text, function != "chmod") << function;
     EXPECT_EQ(std::distance(std::filesystem::directory_iterator(folder), {}), 1);
   }
 }
 
 TEST(StatusMgr, IsWholeAtEveryMomentAmongManyWriters) {
-  FakeDaemon daemon;
-  WriteText(file, "{}");
-  int running = 0;
-  for (; running < 16; ++running) {
-    if (const pid_t pid = fork(); pid == 0) {
-      for (int i = 0; i < 24;) {
-        const int code = CodeOf([&](StatusMgr& manager) {
-          i % 3 == 0   ? manager.SetShareStatus(std::to_string(running), 1)
-          : i % 3 == 1 ? manager.Pause(1)
-                       : manager.Resume();
-        });
-        i += code == 0 ? 1 : 0;
-        if (code != 0 && code != vexlo::ERR_LOCK) {  // Out of tries: the lock is in demand.
-          _exit(1);
-        }
+  Daemon daemon;
+  for (int writer = 0; writer < 16; ++writer) {
+    if (fork() == 0) {
+      const Act set = [=](StatusMgr& manager) { manager.SetShareStatus(to_string(writer), 1); };
+      const Act acts[] = {set, Pause(1, lock_file + to_string(writer)), kResume};
+      std::string error;
+      for (int i = 0; i < 24 && error.empty(); i += error.empty() ? 1 : 0) {
+        error = Caught(acts[i % 3]);
+        error = error.starts_with("506 Exceed") ? "" : error;  // The lock is in demand.
       }
-      _exit(0);
+      _exit(error.empty() ? 0 : 1);
     }
   }
-  for (size_t reads = 0; running > 0; ++reads) {
-    EXPECT_EQ(CodeOf([](StatusMgr& manager) { manager.GetShareStatus("0"); }), 0) << reads;
-    int status = 0;
-    if (waitpid(-1, &status, WNOHANG) > 0) {
-      EXPECT_EQ(status, 0);
-      --running;
-    }
+  int status = 0;
+  for (pid_t ended = 0; ended >= 0; ended = waitpid(-1, &status, WNOHANG)) {
+    EXPECT_EQ(status, 0);
+    EXPECT_EQ(Caught([](StatusMgr& manager) { manager.GetShareStatus("0"); }), "");
   }
-  EXPECT_EQ(daemon.Stop().size(), size_t{16} * 16);
   EXPECT_EQ(StatusMgr().GetPauseInfo(), -1);  // Each of them resumed last.
   EXPECT_EQ(std::filesystem::status(file).permissions(), std::filesystem::perms{0644});
+}
+
+TEST(SendCommandToDaemon, TellsWhetherTheDaemonTookIt) {
+  constexpr int kNever = -1, kStale = -2;  // A socket that nobody listens on.
+  const std::vector<unsigned> growing = {1, 2, 4, 8, 16, 32, 64, 100, 100};
+  const std::string nobody = "502 write failed, reason=Transport endpoint is not connected";
+  const std::string cut = "502 write failed, reason=Interrupted system call";
+  const std::string late = "502 write failed, reason=Resource temporarily unavailable";
+  const std::string empty(8, '\0'), three("\3\0\0\0\0\0\0\0ok", 11);
+  const std::string lie("\0\0\0\0\0\0\0\x80yes", 11);
+  struct Row {
+    const char* name;
+    int listens_after;  // Waits, or one of the two above.
+    std::optional<std::string> answer;
+    std::string want;
+    std::vector<unsigned> want_waits = {};
+    int cuts = 0;
+  };
+  WriteText(file, "{}");
+  for (const Row& row : {
+           Row{"Absent", kNever, empty, nobody, {1000, 1000, 1000, 1000}},
+           Row{"Stale", kStale, empty, nobody},
+           Row{"AtTheLastTry", 4, empty, "", {1000, 1000, 1000, 1000}},
+           Row{"ByteByByte", 0, three, ""},
+           Row{"TakesNothingForASecond", 0, std::nullopt, late},
+           Row{"ClosesUnasked", 0, "", "broken off", growing},
+           Row{"SaysThatItSends2To63", 0, lie, "broken off", growing},
+           Row{"TenInterruptions", 0, empty, "", {}, 10},
+           Row{"Eleven", 0, empty, cut, {}, 11},
+       }) {
+    SCOPED_TRACE(row.name);
+    std::optional<Daemon> daemon;
+    on_wait = [&] {
+      if (static_cast<int>(waits.size()) == row.listens_after) {
+        daemon.emplace(row.answer);
+      } else if (waits.size() == growing.size()) {
+        throw "broken off";
+      }
+    };
+    unlink(socket_file.c_str());
+    row.listens_after == kStale ? WriteText(socket_file, "") : void();
+    waits.clear();
+    on_wait();
+    interruptions = row.cuts;
+    const auto send = [](StatusMgr&) { SendCommandToDaemon("x", std::string(1 << 20, 'x')); };
+    EXPECT_EQ(Caught(send), row.want);
+    EXPECT_EQ(waits, row.want_waits);
+  }
+  EXPECT_EQ(signal(SIGPIPE, SIG_DFL), SIG_IGN);
 }
 
 }  // namespace

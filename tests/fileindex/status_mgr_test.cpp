@@ -157,7 +157,7 @@ TEST(StatusMgr, SavesWhatItReadAndNothingWhenASaveFails) {
   unlink(file.c_str());
   StatusMgr first, second;
   EXPECT_EQ(first.GetPauseInfo() + first.GetShareStatus("a"), -1);
-  first.SetShareStatus("a", 1);
+  first.SetShareStatus("b", 2);
   second.SetShareStatus("b", 1);
   EXPECT_EQ(Caught(kResume).substr(0, 3), "502");  // Without a daemon the change stays.
   const std::string text = ReadText(file);

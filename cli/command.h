@@ -63,7 +63,9 @@ struct Command {
 
 // One a command family.
 std::vector<Command> ExplainCommands();
+std::vector<Command> IndexCommands();
 std::vector<Command> QueueCommands();
+std::vector<Command> SearchCommands();
 std::vector<Command> ShareCommands();
 std::vector<Command> WatchCommands();
 

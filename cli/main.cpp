@@ -9,8 +9,9 @@ int main(int argc, char** argv) {
   std::ios::sync_with_stdio(false);
   using vexlo::cli::Command;
   std::vector<Command> commands;
-  for (auto* const family : {vexlo::cli::WatchCommands, vexlo::cli::QueueCommands,
-                             vexlo::cli::ExplainCommands, vexlo::cli::ShareCommands}) {
+  for (auto* const family :
+       {vexlo::cli::WatchCommands, vexlo::cli::QueueCommands, vexlo::cli::ExplainCommands,
+        vexlo::cli::ShareCommands, vexlo::cli::IndexCommands, vexlo::cli::SearchCommands}) {
     const std::vector<Command> more = family();
     commands.insert(commands.end(), more.begin(), more.end());
   }

@@ -97,7 +97,7 @@ Json::Value Engine::Handle(const Json::Value& request) {
   try {
     return Dispatch(request);
   } catch (const Failure& failure) {
-    return Refusal(failure.code(), failure.what());
+    return Refusal(failure.GetCode(), failure.what());
   } catch (const std::exception& error) {
     LogLine(VEXLO_SOURCE, __LINE__, std::string("a request failed, reason=") + error.what());
     return Refusal(Code::kInternal, error.what());
@@ -187,7 +187,7 @@ Json::Value Engine::Compound(const Json::Value& list) {
 void Engine::CompoundRun(const std::string& id, std::span<const Json::Value* const> items,
                          std::span<Json::Value> results) {
   const auto refused = [&](size_t i, const Failure& failure) {
-    results[i] = Refusal(failure.code(), failure.what());
+    results[i] = Refusal(failure.GetCode(), failure.what());
   };
   const auto run_item = [&](Writer& writer, size_t i) {
     const Json::Value& request = *items[i];
@@ -248,7 +248,7 @@ void Engine::WithStore(const std::string& id, const StoreUse& use) {
           use(*slot->store);
           return;
         } catch (const Failure& failure) {
-          if (failure.code() != Code::kIndexDamaged) {
+          if (failure.GetCode() != Code::kIndexDamaged) {
             throw;
           }
           LogLine(VEXLO_SOURCE, __LINE__, "damage is met, id=" + id + ", reason=" + failure.what());
@@ -268,7 +268,7 @@ void Engine::Open(Slot& slot) {
   try {
     slot.store = std::make_unique<Store>(slot.entry.path, slot.entry.token);
   } catch (const Failure& failure) {
-    if (failure.code() != Code::kIndexDamaged) {
+    if (failure.GetCode() != Code::kIndexDamaged) {
       throw;
     }
     MarkDamaged(slot, failure.what());
@@ -459,7 +459,7 @@ Json::Value Engine::Search(const Json::Value& data) {
       }
       Json::Value& skipped = reply["skipped"].append(Json::objectValue);
       skipped["id"] = id;
-      skipped["code"] = static_cast<int>(failure.code());
+      skipped["code"] = static_cast<int>(failure.GetCode());
     }
     total += page.total;
     for (SearchHit& hit : page.hits) {

@@ -29,7 +29,7 @@ enum class Code {
 class Failure : public std::runtime_error {
  public:
   Failure(Code code, const std::string& message) : std::runtime_error(message), code_(code) {}
-  Code code() const { return code_; }
+  Code GetCode() const { return code_; }
   // Whether it is an answer to what was asked, given before anything was changed.
   bool IsAnswer() const {
     return code_ <= Code::kUnknownQuery || code_ == Code::kDocumentMissing ||

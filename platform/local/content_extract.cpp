@@ -9,6 +9,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdio>
+#include <iterator>
 #include <string_view>
 #include <system_error>
 #include <utility>
@@ -37,25 +38,38 @@ std::string ExtensionOf(const std::string& name) {
   return extension;
 }
 
+// The leading bytes of UTF-8 characters, and what the second byte may be: over-long forms,
+// surrogates and what is over U+10FFFF are none. Every byte behind it is 0x80 to 0xBF.
+struct Lead {
+  unsigned char first, last;
+  unsigned char low, high;
+  size_t bytes;
+};
+constexpr Lead kLeads[] = {
+    {0x00, 0x7F, 0x00, 0x00, 1}, {0xC2, 0xDF, 0x80, 0xBF, 2}, {0xE0, 0xE0, 0xA0, 0xBF, 3},
+    {0xE1, 0xEC, 0x80, 0xBF, 3}, {0xED, 0xED, 0x80, 0x9F, 3}, {0xEE, 0xEF, 0x80, 0xBF, 3},
+    {0xF0, 0xF0, 0x90, 0xBF, 4}, {0xF1, 0xF3, 0x80, 0xBF, 4}, {0xF4, 0xF4, 0x80, 0x8F, 4},
+};
+
 // How many bytes the UTF-8 character at the start of `text` has: 0 when none begins there, or more
-// than are there when it is cut off. Surrogates, over-long forms and what is over U+10FFFF are
-// none.
+// than are there when it is cut off.
 size_t CharacterBytes(std::string_view text) {
-  const auto byte = [&text](size_t i) { return static_cast<unsigned char>(text[i]); };
-  const unsigned char lead = byte(0);
-  const size_t bytes = lead < 0x80                   ? 1
-                       : lead >= 0xC2 && lead < 0xE0 ? 2
-                       : lead >= 0xE0 && lead < 0xF0 ? 3
-                       : lead >= 0xF0 && lead < 0xF5 ? 4
-                                                     : 0;
-  for (size_t i = 1; i < std::min(bytes, text.size()); ++i) {
-    const unsigned char low = i > 1 ? 0x80 : lead == 0xE0 ? 0xA0 : lead == 0xF0 ? 0x90 : 0x80;
-    const unsigned char high = i > 1 ? 0xBF : lead == 0xED ? 0x9F : lead == 0xF4 ? 0x8F : 0xBF;
-    if (byte(i) < low || byte(i) > high) {
+  const auto is_within = [&text](size_t i, unsigned char low, unsigned char high) {
+    const auto byte = static_cast<unsigned char>(text[i]);
+    return byte >= low && byte <= high;
+  };
+  const Lead* const lead = std::find_if(std::begin(kLeads), std::end(kLeads), [&](const Lead& row) {
+    return is_within(0, row.first, row.last);
+  });
+  if (lead == std::end(kLeads)) {
+    return 0;
+  }
+  for (size_t i = 1; i < std::min(lead->bytes, text.size()); ++i) {
+    if (!is_within(i, i == 1 ? lead->low : 0x80, i == 1 ? lead->high : 0xBF)) {
       return 0;
     }
   }
-  return bytes;
+  return lead->bytes;
 }
 
 // The length of the longest beginning that is UTF-8; `cut_off` tells that only the end of the last
@@ -203,9 +217,9 @@ void ParseFile(const std::string& path, const Json::Value& options, Json::Value&
   }
   Json::Value fields = AttributesOf(path, info);
   if (options["need_meta"].isBool() && options["need_meta"].asBool() && S_ISREG(info.stx_mode)) {
-    std::string text = ReadText(path);
+    const std::string text = ReadText(path);
     if (!text.empty()) {
-      fields["KAVOMDTextContent"] = std::move(text);
+      fields["KAVOMDTextContent"] = text;
     }
   }
   metadata = std::move(fields);

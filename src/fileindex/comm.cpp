@@ -58,10 +58,10 @@ void CheckItems(const Json::Value& response, const Json::Value& request) {
       throw Error(static_cast<ErrorCode>(code), message);
     }
     const int saved = errno;
-    const std::string text =
-        JsonToStyledString(requests.isArray() ? requests[i] : Json::Value::nullSingleton());
-    LogContext({VEXLO_SOURCE, __LINE__, "SendRequestImpl", ""},
-               "Compound failed: " + text + " (" + std::to_string(code) + ") " + message, saved);
+    std::string text = "Compound failed: ";
+    text += JsonToStyledString(requests.isArray() ? requests[i] : Json::Value::nullSingleton());
+    text += " (" + std::to_string(code) + ") " + message;
+    LogContext({VEXLO_SOURCE, __LINE__, "SendRequestImpl", ""}, text, saved);
   }
 }
 

@@ -35,7 +35,7 @@ class FrameServerTest : public testing::Test {
     };
     options_.workers = 2;
   }
-  ~FrameServerTest() override { EXPECT_TRUE(!thread_.joinable() || Stop()); }
+  void TearDown() override { EXPECT_TRUE(!thread_.joinable() || Stop()); }
 
   static std::string Handle(const std::string& request) {
     if (request == "throw") {
@@ -139,10 +139,11 @@ TEST_F(FrameServerTest, ClosesWhoeverDoesNothing) {
   EXPECT_EQ(half.Receive(), "");
   EXPECT_EQ(refused.Receive(), Frame("refused 0"));
   // A byte now and then puts nothing off.
-  const RawClient trickling = Sending(LengthBytes(kMost));
+  const RawClient trickling = Sending(LengthBytes(60000));
   while (trickling.Send("x")) {
-    std::this_thread::yield();
+    Ask("tick");
   }
+  EXPECT_EQ(trickling.Receive(), "");
   // By now its time is over, too: only what the socket held is left.
   const std::string heard = deaf.Receive();
   EXPECT_TRUE(heard.size() > 8 && heard.size() < 8 * kMost) << heard.size();
@@ -156,10 +157,9 @@ TEST_F(FrameServerTest, LongRequestsWaitForMemoryAndGoOn) {
   const std::string rest(kMost - part.size(), 'x');
   const RawClient common = Sending(LengthBytes(kMost) + part);
   const RawClient reserve = Sending(LengthBytes(kMost) + part);
-  std::vector<std::future<std::string>> others;
-  for (int i = 0; i < 4; ++i) {
-    others.push_back(
-        std::async(std::launch::async, [this] { return Ask(std::string(kMost, 'x')); }));
+  std::vector<std::future<std::string>> others(4);
+  for (std::future<std::string>& other : others) {
+    other = std::async(std::launch::async, [this] { return Ask(std::string(kMost, 'x')); });
   }
   EXPECT_EQ(Ask(std::string(60000, 'x')), "60000");
   for (const RawClient* const client : {&reserve, &common}) {
@@ -244,8 +244,8 @@ TEST_F(FrameServerTest, ReplacesOnlyASocketThatNobodyServes) {
   options_.mode = 0660;
   WriteText(folder_ / "file", "text");
   const std::string longest = folder_ / std::string(106 - folder_.Path().size(), 'x');
-  RawClient(UnixSocket(folder_ / "stale", SOCK_STREAM, bind));
-  RawClient(UnixSocket(folder_ / "stal~", SOCK_STREAM, bind));  // From a start that was cut short.
+  close(UnixSocket(folder_ / "stale", SOCK_STREAM, bind));
+  close(UnixSocket(folder_ / "stal~", SOCK_STREAM, bind));  // From a start that was cut short.
   const RawClient full(UnixSocket(folder_ / "full", SOCK_STREAM, bind));
   listen(full.fd, 0);
   const RawClient waiting(folder_ / "full");
@@ -275,14 +275,14 @@ TEST_F(FrameServerTest, ReplacesOnlyASocketThatNobodyServes) {
 
 TEST_F(FrameServerTest, ServesManyTinyRequests) {
   Start();
-  std::vector<std::future<void>> clients;
-  for (int client = 0; client < 16; ++client) {
-    clients.push_back(std::async(std::launch::async, [this, client] {
+  std::vector<std::future<void>> clients(16);
+  for (std::future<void>& client : clients) {
+    client = std::async(std::launch::async, [this, &client] {
+      const std::string name = std::to_string(reinterpret_cast<uintptr_t>(&client)) + ":";
       for (int i = 0; i < 1000; ++i) {
-        const std::string request = std::to_string(client) + ":" + std::to_string(i);
-        EXPECT_EQ(Ask(request), request);
+        EXPECT_EQ(Ask(name + std::to_string(i)), name + std::to_string(i));
       }
-    }));
+    });
   }
 }
 

@@ -20,25 +20,26 @@ struct PeerCase {
   const char* name;
   std::string request;
   std::string answer;
-  int error = 0;           // 0: the answer's body is received, and what stands behind it is not.
-  size_t step = SIZE_MAX;  // Bytes of the answer that are sent at a time.
-  bool deaf = false;       // The peer does not read the request.
+  // 0: the answer's body is received, and what stands behind it is not.
+  int error = 0;
+  // How the answer is sent; deaf: not at all, and the request is not read either.
+  enum { kWhole, kByByte, kDeaf } way = kWhole;
 };
 
 TEST(SockConnectionTest, BearsWhatThePeerDoes) {
   const std::string large = std::string("\0\xFF\n", 3) + std::string(3000000, 'x');
   const PeerCase cases[] = {
       {"Whole", "request", Frame("reply")},
-      {"ByteByByte", large, Frame(large.substr(0, 3000)), 0, 1},
+      {"ByteByByte", large, Frame(large.substr(0, 3000)), 0, PeerCase::kByByte},
       {"Empty", "", Frame("")},
       {"Large", "r", Frame(large)},
       {"MoreThanWasAsked", "r", Frame("reply") + "more"},
       {"ClosesAtOnce", "r", "", ECONNRESET},
       {"ClosesInTheLength", "r", LengthBytes(5).substr(0, 7), ECONNRESET},
-      {"ClosesInTheBody", "r", LengthBytes(5) + "repl", ECONNRESET, 1},
+      {"ClosesInTheBody", "r", LengthBytes(5) + "repl", ECONNRESET, PeerCase::kByByte},
       {"LiesAboutTheLength", "r", LengthBytes(kMost) + "reply", ECONNRESET},
       {"TooLong", "r", LengthBytes(kMost + 1), EMSGSIZE},
-      {"NeverReads", large, "", EPIPE, SIZE_MAX, /*deaf=*/true},
+      {"NeverReads", large, "", EPIPE, PeerCase::kDeaf},
   };
   const TempFolder folder;
   const RawClient listener(UnixSocket(folder / "s", SOCK_STREAM, bind));
@@ -56,9 +57,11 @@ TEST(SockConnectionTest, BearsWhatThePeerDoes) {
     pthread_sigmask(SIG_BLOCK, &alarm, nullptr);
     std::thread peer([&] {
       const RawClient client(accept(listener.fd, nullptr, nullptr));
-      read = row.deaf ? Frame(row.request) : client.Receive(Frame(row.request).size());
-      for (size_t at = 0; at < row.answer.size(); at += std::min(row.step, row.answer.size())) {
-        client.Send(row.answer.substr(at, row.step));
+      const size_t step = row.way == PeerCase::kByByte ? 1 : SIZE_MAX;
+      read = row.way == PeerCase::kDeaf ? Frame(row.request)
+                                        : client.Receive(Frame(row.request).size());
+      for (size_t at = 0; at < row.answer.size(); at += std::min(step, row.answer.size())) {
+        client.Send(row.answer.substr(at, step));
       }
     });
     struct itimerval interval {

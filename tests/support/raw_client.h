@@ -40,6 +40,7 @@ struct RawClient {
   RawClient(RawClient&& other) noexcept : fd(std::exchange(other.fd, -1)) {}
   RawClient(const RawClient&) = delete;
   RawClient& operator=(const RawClient&) = delete;
+  RawClient& operator=(RawClient&&) = delete;
 
   // False when the peer is gone. It waits, so a part only of the bytes is never sent.
   bool Send(const std::string& bytes) const {

@@ -10,26 +10,27 @@
 #include "support/private_root.h"
 #include "support/syslog_capture.h"
 
-using namespace vexlo::fileindex;
+using vexlo::fileindex::AddCustomEvent;
+using vexlo::fileindex::StatusMgr;
 
 FAULTABLE(ssize_t, write, (int fd, const void* data, size_t size), (fd, data, size))
 
 namespace {
 
-const PrivateRoot root;
+const PrivateRoot kRoot;
 
 std::string Share(const std::string& name, const std::string& flags) {
-  return R"({"name": ")" + name + R"(", "path": ")" + root.MakeFolder("v/" + name) + "\"" + flags +
+  return R"({"name": ")" + name + R"(", "path": ")" + kRoot.MakeFolder("v/" + name) + "\"" + flags +
          "}";
 }
 
 TEST(AddCustomEvent, AppendsOneLineOrNothing) {
   for (const char* needed : {"tmp", "var/packages/Vexlo/etc", "var/lib/kavo/fileindex/queue"}) {
-    root.MakeFolder(needed);
+    kRoot.MakeFolder(needed);
   }
-  root.SetShares(Share("s", "") + "," + Share("off", R"(, "encrypted": true)") + "," +
-                 Share("ro", R"(, "read_only": true)"));
-  const std::string reindex = R"({"event":65536,"path":")" + root / "v/s/a" + "\"}\n";
+  kRoot.SetShares(Share("s", "") + "," + Share("off", R"(, "encrypted": true)") + "," +
+                  Share("ro", R"(, "read_only": true)"));
+  const std::string reindex = R"({"event":65536,"path":")" + kRoot / "v/s/a" + "\"}\n";
   const std::string whole = R"({"event":8,"path":"/x"})";
   struct Row {
     const char *name, *share, *below;
@@ -55,13 +56,13 @@ TEST(AddCustomEvent, AppendsOneLineOrNothing) {
            Row{"NoRoomForTheMark", "s", "a", 0x40, whole, "", 502, false, false, 2},
        }) {
     SCOPED_TRACE(row.name);
-    const std::string path = root / "v/" + row.share + "/" + row.below;
+    const std::string path = kRoot / "v/" + row.share + "/" + row.below;
     const std::string queue =
         vexlo::sdk::SDKShare(*row.share == '\0' ? "s" : row.share).GetQueuePath();
     for (const auto& [file, text] : {std::pair{queue, row.live}, {queue + ".tmp", row.snapshot}}) {
       text.empty() ? void(unlink(file.c_str())) : WriteText(file, text);
     }
-    WriteText(root / "var/packages/Vexlo/etc/fileindex.status", "{\"share\":{\"s\":4}}");
+    WriteText(kRoot / "var/packages/Vexlo/etc/fileindex.status", "{\"share\":{\"s\":4}}");
     SyslogCapture log;
     std::string want_logged;
     try {

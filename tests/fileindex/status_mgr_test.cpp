@@ -16,16 +16,17 @@
 #include "support/faults.h"
 #include "support/private_root.h"
 
-using namespace vexlo::fileindex;
 using std::to_string;
+using vexlo::fileindex::SendCommandToDaemon;
+using vexlo::fileindex::StatusMgr;
 
 namespace {
 
-const PrivateRoot root;
-const std::string folder = root.MakeFolder("var/packages/Vexlo/etc");
-const std::string file = folder + "/fileindex.status";
-const std::string lock_file = root.MakeFolder("tmp") + "/vexlo_cfg_fi_status.lock";
-const std::string socket_file = root.MakeFolder("var/run") + "/fileindexd.sock";
+const PrivateRoot kRoot;
+const std::string kFolder = kRoot.MakeFolder("var/packages/Vexlo/etc");
+const std::string kFile = kFolder + "/fileindex.status";
+const std::string kLockFile = kRoot.MakeFolder("tmp") + "/vexlo_cfg_fi_status.lock";
+const std::string kSocketFile = kRoot.MakeFolder("var/run") + "/fileindexd.sock";
 std::vector<unsigned> waits;  // In milliseconds, and a thousandth as long.
 std::function<void()> on_wait = [] {
   std::this_thread::sleep_for(std::chrono::microseconds(waits.back()));
@@ -58,7 +59,7 @@ struct Daemon {
   explicit Daemon(const std::optional<std::string>& answer = std::string(8, '\0')) {
     commands.clear();
     sockaddr_un address{AF_UNIX, {}};
-    socket_file.copy(address.sun_path, sizeof(address.sun_path) - 1);
+    kSocketFile.copy(address.sun_path, sizeof(address.sun_path) - 1);
     EXPECT_EQ(bind(listener, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
     EXPECT_EQ(listen(listener, 64), 0);
     thread = std::thread([=, this] {
@@ -72,11 +73,13 @@ struct Daemon {
       }
     });
   }
+  Daemon(const Daemon&) = delete;
+  Daemon& operator=(const Daemon&) = delete;
   ~Daemon() {
     shutdown(listener, SHUT_RDWR);
     thread.join();
     close(listener);
-    unlink(socket_file.c_str());
+    unlink(kSocketFile.c_str());
   }
   const int listener = socket(AF_UNIX, SOCK_STREAM, 0);
   std::thread thread;
@@ -98,7 +101,7 @@ const Act kSet = [](StatusMgr& manager) { manager.SetShareStatus("\xE9", 5); };
 const Act kUnset = [](StatusMgr& manager) { manager.UnsetShareStatus("\xE9", 3); };
 const Act kClear = [](StatusMgr& manager) { manager.ClearShareStatus("\xE9"); };
 const Act kResume = &StatusMgr::Resume;
-Act Pause(int hours, const std::string& lock_path = lock_file + "2") {
+Act Pause(int hours, const std::string& lock_path = kLockFile + "2") {
   return [=](StatusMgr& manager) {
     const vexlo::LockFile lock(lock_path, /*exclusive=*/true);
     manager.Pause(hours);
@@ -114,7 +117,7 @@ TEST(StatusMgr, ChangesTheFileAndTellsTheDaemon) {
     const char* name;
     Act act;
     std::string before, want;  // The file, "" for none, with ' for ".
-    std::string code = "", want_sent = "";
+    std::string code = {}, want_sent = {};
   };
   const auto pause = [](const std::string& instant) {
     return R"({"data":{"resume_time":)" + instant + R"(},"type":"pause"})" + '\0';
@@ -137,37 +140,37 @@ TEST(StatusMgr, ChangesTheFileAndTellsTheDaemon) {
            Row{"Wraps", Pause(600000), "", "{'resume_time':-134967296}", "", pause("-134967296")},
            Row{"WithoutEnd", Pause(0), "", "{'resume_time':0}", "", pause("0")},
            Row{"Negative", Pause(-1), "{}", "{}", "120"},
-           Row{"NegativeUnderLock", Pause(-1, lock_file), "{}", "{}", "506"},
+           Row{"NegativeUnderLock", Pause(-1, kLockFile), "{}", "{}", "506"},
            Row{"Resume", kResume, "{'resume_time':0}", "{'resume_time':-1}", "", resume},
        }) {
     SCOPED_TRACE(row.name);
     std::string before = row.before, want = row.want;
     std::replace(before.begin(), before.end(), '\'', '"');
     std::replace(want.begin(), want.end(), '\'', '"');
-    before.empty() ? void(unlink(file.c_str())) : WriteText(file, before);
+    before.empty() ? void(unlink(kFile.c_str())) : WriteText(kFile, before);
     std::optional<Daemon> daemon(std::in_place);
     EXPECT_EQ(Caught(row.act).substr(0, 3), row.code);
     daemon.reset();
-    EXPECT_EQ(Parsed(ReadText(file)), Parsed(want));
+    EXPECT_EQ(Parsed(ReadText(kFile)), Parsed(want));
     EXPECT_EQ(commands, std::vector<std::string>(row.want_sent.empty() ? 0 : 1, row.want_sent));
   }
 }
 
 TEST(StatusMgr, SavesWhatItReadAndNothingWhenASaveFails) {
-  unlink(file.c_str());
+  unlink(kFile.c_str());
   StatusMgr first, second;
   EXPECT_EQ(first.GetPauseInfo() + first.GetShareStatus("a"), -1);
   first.SetShareStatus("b", 2);
   second.SetShareStatus("b", 1);
   EXPECT_EQ(Caught(kResume).substr(0, 3), "502");  // Without a daemon the change stays.
-  const std::string text = ReadText(file);
+  const std::string text = ReadText(kFile);
   EXPECT_EQ(Parsed(text), Parsed(R"({"resume_time":-1,"share":{"b":1}})"));
   for (const std::string function : {"write", "fsync", "rename", "chmod"}) {
     const ScopedFault fault(function.c_str(), EIO);
     EXPECT_EQ(Caught(kSet), function == "chmod" ? "502 chmod failed, reason=Input/output error"
-                                                : "505 Failed to save json: " + file);
-    EXPECT_EQ(ReadText(file) == text, function != "chmod") << function;
-    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(folder), {}), 1);
+                                                : "505 Failed to save json: " + kFile);
+    EXPECT_EQ(ReadText(kFile) == text, function != "chmod") << function;
+    EXPECT_EQ(std::distance(std::filesystem::directory_iterator(kFolder), {}), 1);
   }
 }
 
@@ -176,7 +179,7 @@ TEST(StatusMgr, IsWholeAtEveryMomentAmongManyWriters) {
   for (int writer = 0; writer < 16; ++writer) {
     if (fork() == 0) {
       const Act set = [=](StatusMgr& manager) { manager.SetShareStatus(to_string(writer), 1); };
-      const Act acts[] = {set, Pause(1, lock_file + to_string(writer)), kResume};
+      const Act acts[] = {set, Pause(1, kLockFile + to_string(writer)), kResume};
       std::string error;
       for (int i = 0; i < 24 && error.empty(); i += error.empty() ? 1 : 0) {
         error = Caught(acts[i % 3]);
@@ -191,7 +194,7 @@ TEST(StatusMgr, IsWholeAtEveryMomentAmongManyWriters) {
     EXPECT_EQ(Caught([](StatusMgr& manager) { manager.GetShareStatus("0"); }), "");
   }
   EXPECT_EQ(StatusMgr().GetPauseInfo(), -1);  // Each of them resumed last.
-  EXPECT_EQ(std::filesystem::status(file).permissions(), std::filesystem::perms{0644});
+  EXPECT_EQ(std::filesystem::status(kFile).permissions(), std::filesystem::perms{0644});
 }
 
 TEST(SendCommandToDaemon, TellsWhetherTheDaemonTookIt) {
@@ -200,7 +203,7 @@ TEST(SendCommandToDaemon, TellsWhetherTheDaemonTookIt) {
   const std::string nobody = "502 write failed, reason=Transport endpoint is not connected";
   const std::string cut = "502 write failed, reason=Interrupted system call";
   const std::string late = "502 write failed, reason=Resource temporarily unavailable";
-  const std::string empty(8, '\0'), three("\3\0\0\0\0\0\0\0ok", 11);
+  const std::string empty(8, '\0'), three("\3\0\0\0\0\0\0\0okay", 11);
   const std::string lie("\0\0\0\0\0\0\0\x80yes", 11);
   struct Row {
     const char* name;
@@ -210,7 +213,7 @@ TEST(SendCommandToDaemon, TellsWhetherTheDaemonTookIt) {
     std::vector<unsigned> want_waits = {};
     int cuts = 0;
   };
-  WriteText(file, "{}");
+  WriteText(kFile, "{}");
   for (const Row& row : {
            Row{"Absent", kNever, empty, nobody, {1000, 1000, 1000, 1000}},
            Row{"Stale", kStale, empty, nobody},
@@ -231,8 +234,8 @@ TEST(SendCommandToDaemon, TellsWhetherTheDaemonTookIt) {
         throw "broken off";
       }
     };
-    unlink(socket_file.c_str());
-    row.listens_after == kStale ? WriteText(socket_file, "") : void();
+    unlink(kSocketFile.c_str());
+    row.listens_after == kStale ? WriteText(kSocketFile, "") : void();
     waits.clear();
     on_wait();
     interruptions = row.cuts;

@@ -52,7 +52,7 @@ void AddCustomEvent(int event, const std::string& full_path, const std::string& 
     }
     const std::string line = LineOf(event, full_path, path_old, data);
     // A line that readers refuse would fail every question about the queue while it is there.
-    Event{line};
+    [[maybe_unused]] const Event readable(line);
     AppendLines(queue_path, line + "\n");
   } catch (const Error& error) {
     LogContext({"util", 868, "AddCustomEvent", ""},

@@ -135,7 +135,6 @@ Json::Value MakeRequest(const Arguments& arguments, const Console& console) {
   }
   if (arguments.Has("--type")) {
     data["types"] = ReadType(arguments.Get("--type"));
-    data["is_dir"] = false;
   }
   for (const auto& [option, member] :
        {std::pair{"--larger", "size_min"}, std::pair{"--smaller", "size_max"}}) {

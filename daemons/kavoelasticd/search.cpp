@@ -207,6 +207,7 @@ class Filter {
     for (const std::string& type : request.types) {
       types_.push_back(Fold(type.starts_with('.') ? type.substr(1) : type));
     }
+    std::sort(types_.begin(), types_.end());
   }
 
   bool Open() const {
@@ -223,9 +224,9 @@ class Filter {
         !(path.starts_with(below_) && path.size() > below_.size() && path[below_.size()] == '/')) {
       return false;
     }
-    if (!types_.empty() && std::none_of(types_.begin(), types_.end(), [&](const std::string& t) {
-          return !row.NullAt(column + 1) && row.BytesAt(column + 1) == t;
-        })) {
+    if (!types_.empty() &&
+        (row.NullAt(column + 1) ||
+         !std::binary_search(types_.begin(), types_.end(), row.BytesAt(column + 1)))) {
       return false;
     }
     hit->size = row.NullAt(column + 2) ? std::nullopt : std::optional(row.IntAt(column + 2));

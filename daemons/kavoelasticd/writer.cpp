@@ -104,7 +104,10 @@ DocsRow DocsRowOf(Session& session, const StoredDocument& document) {
     const auto id = session.IdOf(name);
     return id ? document.record.Find(*id) : nullptr;
   };
-  if (const Item* item = find(kExtensionField); item != nullptr && IsText(*item)) {
+  // A folder's name has no extension in this sense: a search for types is one for files.
+  const Item* const is_dir = find(kIsDirField);
+  const bool is_folder = is_dir != nullptr && JsonOf(*is_dir, document.path).asBool();
+  if (const Item* item = find(kExtensionField); !is_folder && item != nullptr && IsText(*item)) {
     row.extension = Fold(TextOf(*item, document.path));
   }
   if (const Item* item = find(kSizeField); item != nullptr && item->kind == Kind::kInt) {

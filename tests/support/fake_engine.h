@@ -13,7 +13,12 @@
 class FakeEngine {
  public:
   explicit FakeEngine(const std::string& path)
-      : path_(path), listener_(BindTo(path, 8)), thread_([this] { Serve(); }) {}
+      : path_(path),
+        listener_(UnixSocket(path, SOCK_STREAM, bind)),
+        is_listening_(listen(listener_, 8) == 0),
+        thread_([this] { Serve(); }) {
+    EXPECT_TRUE(is_listening_) << path;
+  }
   ~FakeEngine() {
     shutdown(listener_, SHUT_RDWR);
     thread_.join();
@@ -60,6 +65,7 @@ class FakeEngine {
 
   const std::string path_;
   const int listener_;
+  const bool is_listening_;
   std::mutex mutex_;
   std::deque<std::string> replies_;
   std::vector<std::string> requests_;

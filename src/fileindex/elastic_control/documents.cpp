@@ -26,7 +26,7 @@ Json::StaticString Key(const char* name) { return Json::StaticString(name); }
 
 Json::Value BelowPath(const std::string& path) {
   Json::Value query;
-  query[Key("qsl")][Key("prefix")][Key(field::kPath)] = path + "/";
+  query[Key("qsl")][Key("prefix")][Key(field::KAVOMDPath)] = path + "/";
   return query;
 }
 
@@ -43,7 +43,7 @@ Json::Value Find(const std::string& id, const Json::Value& query) {
 
 bool IsDocumentExists(const std::string& share, const std::string& path) {
   Json::Value query;
-  query["qsl"]["term"][field::kPath] = path;
+  query["qsl"]["term"][field::KAVOMDPath] = path;
   return !Find(GetFileIndexID(share), query).empty();
 }
 
@@ -56,8 +56,8 @@ Json::Value Extract(const std::string& path, bool need_meta) {
     KAVO::CONTENT_EXTRACT::ParseFile(path, options, metadata);
     const Json::Value& extracted =
         metadata;  // What is missing is null, and is not added by reading.
-    metadata[field::kSearchFileName] = extracted[field::kFSName];
-    metadata[field::kSearchAncestor] = extracted[field::kParent];
+    metadata[field::KAVOMDSearchFileName] = extracted[field::KAVOMDFSName];
+    metadata[field::KAVOMDSearchAncestor] = extracted[field::KAVOMDParent];
   } catch (...) {
     FailCheck({VEXLO_SOURCE, __LINE__, __func__, "ParseFile(path, options, metadata)"},
               ERR_PARSE_FILE, "Parse failed, path=" + path, errno);
@@ -79,21 +79,21 @@ Json::Value MoveOf(Json::Value& hit, const std::string& id, const Json::Value& q
                    const std::string& new_path, const std::string& old_path) {
   std::string name;
   std::string parent;
-  GetJsonValue(name, hit, field::kFSName, /*required=*/true);
-  GetJsonValue(parent, hit, field::kParent, /*required=*/true);
+  GetJsonValue(name, hit, field::KAVOMDFSName, /*required=*/true);
+  GetJsonValue(parent, hit, field::KAVOMDParent, /*required=*/true);
   parent.replace(0, old_path.size(), new_path);
   Json::Value move;
   move[Key("command")] = Key("document_set_by_id");
   Json::Value& data = move[Key("data")];
   data[Key("id")] = Key(id.c_str());
-  data[Key("doc_id")] = std::move(hit[field::kPath]);
+  data[Key("doc_id")] = std::move(hit[field::KAVOMDPath]);
   // The engine does not look at it, but is used to seeing it.
   data[Key("query")] = query;
   Json::Value& fields = data[Key("data")];
-  fields[Key(field::kParent)] = parent;
-  fields[Key(field::kPath)] = parent + "/" + name;
-  fields[Key(field::kSearchFileName)] = name;
-  fields[Key(field::kSearchAncestor)] = parent;
+  fields[Key(field::KAVOMDParent)] = parent;
+  fields[Key(field::KAVOMDPath)] = parent + "/" + name;
+  fields[Key(field::KAVOMDSearchFileName)] = name;
+  fields[Key(field::KAVOMDSearchAncestor)] = parent;
   return move;
 }
 
@@ -145,12 +145,12 @@ void IndexDelDir(const std::string& share, const std::string& path) {
 void IndexGetByPrefixPath(const std::string& id, const std::string& path,
                           std::vector<std::string>& out) {
   Json::Value query = BelowPath(path);
-  query["load_field"].append(field::kPath);
+  query["load_field"].append(field::KAVOMDPath);
   const Json::Value hits = Find(id, query);
   for (const Json::Value& hit : hits) {
-    if (hit.isObject() && hit.isMember(field::kPath) &&
-        isJsonType<std::string>(hit[field::kPath])) {
-      out.push_back(hit[field::kPath].asString());
+    if (hit.isObject() && hit.isMember(field::KAVOMDPath) &&
+        isJsonType<std::string>(hit[field::KAVOMDPath])) {
+      out.push_back(hit[field::KAVOMDPath].asString());
     }
   }
 }
@@ -177,14 +177,14 @@ void IndexRename(const std::string& share, const std::string& new_path,
     throw Error(ERR_DOC_NOT_FOUND);
   }
   Json::Value fields;
-  fields[field::kPath] = new_path;
-  fields[field::kParent] = parent;
-  fields[field::kFSName] = name;
-  fields[field::kSearchFileName] = name;
-  fields[field::kSearchAncestor] = parent;
-  fields[field::kDisplayName] = name;
-  fields[field::kKind] = extension;
-  fields[field::kExtension] = extension;
+  fields[field::KAVOMDPath] = new_path;
+  fields[field::KAVOMDParent] = parent;
+  fields[field::KAVOMDFSName] = name;
+  fields[field::KAVOMDSearchFileName] = name;
+  fields[field::KAVOMDSearchAncestor] = parent;
+  fields[field::KAVOMDDisplayName] = name;
+  fields[field::KAVOMDKind] = extension;
+  fields[field::KAVOMDExtension] = extension;
   SendDocument("document_set_by_id", share, old_path, std::move(fields));
 
   const std::string id = GetFileIndexID(share);
@@ -193,7 +193,7 @@ void IndexRename(const std::string& share, const std::string& new_path,
   query[Key("size")] = kRenameBatch;
   for (unsigned pass = 1;; ++pass) {
     // The names are listed once more in each pass, which the engine takes for what it is.
-    for (const char* const load : {field::kPath, field::kFSName, field::kParent}) {
+    for (const char* const load : {field::KAVOMDPath, field::KAVOMDFSName, field::KAVOMDParent}) {
       query[Key("load_field")].append(Key(load));
     }
     if (MoveBatch(id, query, new_path, old_path) < kRenameBatch) {

@@ -70,6 +70,7 @@ struct Engine::Slot {
   RegistryEntry entry;
   bool gone = false;  // Deleted: whoever still holds the slot finds no index.
   std::unique_ptr<Store> store;
+  uint64_t openings = 0;  // Tells one store from the next.
 };
 
 Engine::Engine(std::string registry_path) : registry_(std::move(registry_path)) {
@@ -229,9 +230,10 @@ Engine::SlotPtr Engine::Find(const std::string& id) {
 
 void Engine::WithStore(const std::string& id, const StoreUse& use) {
   const SlotPtr slot = Find(id);
-  // Twice at most: once to find it closed, once when it is open. Whoever closes it in between also
-  // changes its state.
+  // As a rule twice at most: once to find it closed, once when it is open. Whoever closes it in
+  // between also changes its state.
   for (;;) {
+    uint64_t damaged_opening = 0;
     {
       const Gate::Visit visit(slot->gate);
       if (slot->gone || slot->id != id) {
@@ -252,12 +254,16 @@ void Engine::WithStore(const std::string& id, const StoreUse& use) {
             throw;
           }
           LogLine(VEXLO_SOURCE, __LINE__, "damage is met, id=" + id + ", reason=" + failure.what());
+          damaged_opening = slot->openings;
         }
       }
     }
     const Gate::Alone alone(slot->gate);
+    // Between the two gates others may have opened the index, or closed and opened it.
     if (slot->store != nullptr) {
-      MarkDamaged(*slot, "damage was met while it was used");
+      if (slot->openings == damaged_opening) {
+        MarkDamaged(*slot, "damage was met while it was used");
+      }
     } else if (!slot->gone && slot->entry.state == State::kActive) {
       Open(*slot);
     }
@@ -267,6 +273,7 @@ void Engine::WithStore(const std::string& id, const StoreUse& use) {
 void Engine::Open(Slot& slot) {
   try {
     slot.store = std::make_unique<Store>(slot.entry.path, slot.entry.token);
+    ++slot.openings;
   } catch (const Failure& failure) {
     if (failure.GetCode() != Code::kIndexDamaged) {
       throw;

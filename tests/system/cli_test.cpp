@@ -60,6 +60,42 @@ const CliCase kBadSharesCases[] = {
     {"ExplainBadShares", "explain vol/photo", 3, "", "shares.json:2: "},
 };
 
+// With the engine running.
+const CliCase kEngineCases[] = {
+    {"AddShare", "share add vol/docs", 0, "*added: docs", ""},
+    {"NoIndexYet", "doc put docs vol/docs/a.txt", 3, "", "there is no index fileindex_docs (error"},
+    {"CreateForNoShare", "index create films", 3, "", "there is no share 'films'"},
+    {"Create", "index create docs", 0, "created: the index of docs\n", ""},
+    {"List", "index list", 0, "*fileindex_docs  active  /", ""},
+    {"Put", "doc put docs vol/docs/a.txt", 0, "*indexed: /", ""},
+    {"PutBySharePath", "doc put docs '/docs/Caf\xC3\xA9 \xE9.md'", 0, "*indexed: /", ""},
+    {"PutFolder", "doc put docs vol/docs", 0, "*indexed: /", ""},
+    {"PutMissing", "doc put docs vol/docs/none", 3, "", "Parse failed, path=/"},
+    {"Get", "doc get docs /docs/a.txt", 0, "*\"KAVOMDExtension\" : \"txt\"", ""},
+    {"GetMissing", "doc get docs /docs/none", 1, "", "not in the index"},
+    {"SearchWords", "search harbours museum", 0, "*vol/docs/a.txt\n", ""},
+    {"SearchNoneOfIt", "search museum apples", 1, "", "0 files found"},
+    {"SearchName", "search --name CAFE --share docs -0", 0, "*Caf\xC3\xA9 \xE9.md", ""},
+    {"SearchJson", "search museum --json", 0, "*\"snippet\":\"", ""},
+    {"SearchFilesOnly", "search --type document --below vol --newer 1d --larger 5 --sort -size", 0,
+     "*a.txt\n", ""},
+    {"SearchNothing", "search", 2, "", "wants words"},
+    {"SearchBadSize", "search x --larger 5q", 2, "", "'5q' is no size"},
+    {"SearchBadDate", "search x --newer soon", 2, "", "'soon' is no date"},
+    {"SearchBadType", "search x --type film", 2, "", "'film' is no type"},
+    {"SearchBadOrder", "search x --sort best", 2, "", "'best' is no order"},
+    {"Pause", "index pause docs", 0, "paused: the index of docs\n", ""},
+    {"SearchPaused", "search museum", 1, "", "not searched: fileindex_docs"},
+    {"SearchPausedShare", "search museum --share docs", 3, "", "the index is paused"},
+    {"Resume", "index resume docs", 0, "*resumed", ""},
+    {"Migrate", "index migrate docs root/elsewhere", 0, "*moved", ""},
+    {"SearchMoved", "search museum", 0, "*vol/docs/a.txt\n", ""},
+    {"Remove", "doc rm docs /docs", 0, "*and all below it\n", ""},
+    {"SearchRemoved", "search museum", 1, "", "0 files found"},
+    {"Delete", "index delete docs", 0, "*deleted", ""},
+    {"ListNone", "index list", 1, "", ""},
+};
+
 // A run of the program, ended by timeout(1) if it would never end.
 class Cli : public testing::Test {
  protected:
@@ -131,6 +167,32 @@ TEST_F(Cli, AnswersEveryCommandLine) {
   for (const CliCase& row : kBadSharesCases) {
     Check(row);
   }
+}
+
+TEST_F(Cli, SearchesWhatItHasIndexed) {
+  std::filesystem::create_directories(files_ / "vol/docs");
+  WriteText(files_ / "vol/docs/a.txt", "The harbour museum.");
+  WriteText(files_ / "vol/docs/Caf\xC3\xA9 \xE9.md", "apples");
+  Start("search museum");
+  EXPECT_EQ(End(), 3);
+  EXPECT_NE(err_.find("kavoelasticd does not run"), std::string::npos) << err_;
+  // Ready when its line has come; ends when this test has read all.
+  const std::string command = "cd " + files_.Path() +
+                              "; FILEINDEX_ROOT=$PWD/root exec timeout 60 " + KAVOELASTICD_PROGRAM +
+                              " 2>&1";
+  FILE* const engine = popen(command.c_str(), "re");
+  char line[256] = {};
+  ASSERT_TRUE(fgets(line, sizeof(line), engine) != nullptr);
+  const std::string said = line;
+  ASSERT_NE(said.find("ready"), std::string::npos) << said;
+  for (const CliCase& row : kEngineCases) {
+    Check(row);
+  }
+  kill(std::stoi(said.substr(said.find('[') + 1)), SIGTERM);
+  while (fgets(line, sizeof(line), engine) != nullptr) {
+  }
+  EXPECT_EQ(pclose(engine), 0);
+  EXPECT_FALSE(std::filesystem::exists(files_ / "root/var/run/kavoelasticd.sock"));
 }
 
 TEST_F(Cli, WatchDeliversWhatAnEarlierRunLeftAndThenWhatHappens) {

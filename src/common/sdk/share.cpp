@@ -143,7 +143,7 @@ std::set<std::string> SDKShare::Enum() {
   for (int i = 0; i < share_list->nItem; ++i) {
     names.insert(KLIBCSzListGet(share_list, i));
   }
-  // The list stays: on some NAS releases its strings are the share library's own.
+  // The list is left alone: whose its strings are is not the same on every platform.
   return names;
 }
 

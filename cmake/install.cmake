@@ -20,16 +20,16 @@ function(fileindex_install_headers folder subfolder)
   endforeach()
 endfunction()
 
-fileindex_install_headers(${CMAKE_SOURCE_DIR}/src/include common)
-fileindex_install_headers(${CMAKE_SOURCE_DIR}/src fileindex)
+fileindex_install_headers(${PROJECT_SOURCE_DIR}/src/include common)
+fileindex_install_headers(${PROJECT_SOURCE_DIR}/src fileindex)
 
 set(fileindex_libraries fileindex)
 if(TARGET kavoplatform)
-  fileindex_install_headers(${CMAKE_SOURCE_DIR}/platform/include kavo)
+  fileindex_install_headers(${PROJECT_SOURCE_DIR}/platform/include kavo)
   list(APPEND fileindex_libraries kavoplatform)
   # An exported target must not name the source tree.
   set_property(TARGET kavoplatform PROPERTY INTERFACE_INCLUDE_DIRECTORIES
-    $<BUILD_INTERFACE:${CMAKE_SOURCE_DIR}/platform/include>
+    $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/platform/include>
     $<INSTALL_INTERFACE:${fileindex_headers}>)
 endif()
 
@@ -47,17 +47,17 @@ install(TARGETS ${fileindex_libraries} EXPORT fileindexTargets
   LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
 install(EXPORT fileindexTargets NAMESPACE fileindex:: DESTINATION ${fileindex_package})
 
-write_basic_package_version_file(${CMAKE_BINARY_DIR}/fileindexConfigVersion.cmake
+write_basic_package_version_file(${PROJECT_BINARY_DIR}/fileindexConfigVersion.cmake
   COMPATIBILITY SameMinorVersion)
 install(FILES
-  ${CMAKE_SOURCE_DIR}/cmake/fileindexConfig.cmake
-  ${CMAKE_BINARY_DIR}/fileindexConfigVersion.cmake
+  ${PROJECT_SOURCE_DIR}/cmake/fileindexConfig.cmake
+  ${PROJECT_BINARY_DIR}/fileindexConfigVersion.cmake
   DESTINATION ${fileindex_package})
 
 file(RELATIVE_PATH FILEINDEX_PC_TO_PREFIX
   ${CMAKE_INSTALL_FULL_LIBDIR}/pkgconfig ${CMAKE_INSTALL_PREFIX})
-configure_file(${CMAKE_SOURCE_DIR}/cmake/fileindex.pc.in ${CMAKE_BINARY_DIR}/fileindex.pc @ONLY)
-install(FILES ${CMAKE_BINARY_DIR}/fileindex.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
+configure_file(${PROJECT_SOURCE_DIR}/cmake/fileindex.pc.in ${PROJECT_BINARY_DIR}/fileindex.pc @ONLY)
+install(FILES ${PROJECT_BINARY_DIR}/fileindex.pc DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
 
-install(FILES ${CMAKE_SOURCE_DIR}/README.md ${CMAKE_SOURCE_DIR}/LICENSE
+install(FILES ${PROJECT_SOURCE_DIR}/README.md ${PROJECT_SOURCE_DIR}/LICENSE
   DESTINATION ${CMAKE_INSTALL_DOCDIR})

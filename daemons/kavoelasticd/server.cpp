@@ -10,6 +10,8 @@
 namespace vexlo::elasticd {
 namespace {
 
+std::string SocketPath() { return kavo::local::Root() + "/var/run/kavoelasticd.sock"; }
+
 // Never one of the codes that make callers wait and try again: none of these passes by waiting.
 std::string ErrorText(ErrorCode code, const char* message) {
   Json::Value reply(Json::objectValue);
@@ -38,13 +40,18 @@ std::string AnswerText(const Handler& handler, const std::string& request) {
 daemon::DaemonOptions ElasticdOptions() {
   daemon::DaemonOptions options;
   options.name = "kavoelasticd";
+  options.usage =
+      "\n\nKeeps the full-text indexes of the shares. Runs in the foreground until SIGTERM or "
+      "SIGINT and "
+      "answers\non " +
+      SocketPath() + ".";
   options.pid_file = kavo::local::Root() + "/var/run/kavoelasticd.pid";
   return options;
 }
 
 void Serve(daemon::Daemon& daemon, const Handler& handler) {
   daemon::FrameServerOptions options;
-  options.socket_path = kavo::local::Root() + "/var/run/kavoelasticd.sock";
+  options.socket_path = SocketPath();
   options.handler = [&handler](const std::string& request) { return AnswerText(handler, request); };
   options.refusal = RefusalText;
   daemon::FrameServer server(std::move(options));

@@ -10,9 +10,11 @@
 
 namespace vexlo::elasticd {
 
+// The next one for a byte that is not ASCII.
+int32_t NextWideCodePoint(std::string_view text, size_t* at);
+
 // What stands at `*at`, which is moved behind it: a code point, or -1 for one byte that is no
 // UTF-8.
-int32_t NextWideCodePoint(std::string_view text, size_t* at);
 inline int32_t NextCodePoint(std::string_view text, size_t* at) {
   const auto byte = static_cast<unsigned char>(text[*at]);
   if (byte < 0x80) {

@@ -182,6 +182,9 @@ std::vector<std::string> TextsOf(const Item& item, const std::string& path) {
 }
 
 std::string JoinedTexts(const Item& item, const std::string& path) {
+  if (IsText(item)) {
+    return TextOf(item, path);
+  }
   std::string joined;
   for (const std::string& text : TextsOf(item, path)) {
     joined += joined.empty() ? "" : "\n";

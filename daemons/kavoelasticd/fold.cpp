@@ -57,7 +57,7 @@ void FoldUnicode(std::string_view text, std::string* out) {
 
 }  // namespace
 
-int32_t NextCodePoint(std::string_view text, size_t* at) {
+int32_t NextWideCodePoint(std::string_view text, size_t* at) {
   const auto* bytes = reinterpret_cast<const uint8_t*>(text.data());
   size_t behind = *at;
   UChar32 c = 0;
@@ -68,14 +68,14 @@ int32_t NextCodePoint(std::string_view text, size_t* at) {
 }
 
 std::string Fold(std::string_view text) {
-  std::string out;
-  out.reserve(text.size());
+  std::string out(text);
   if (std::all_of(text.begin(), text.end(), [](char c) { return (c & 0x80) == 0; })) {
-    for (const char c : text) {
-      out += c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
+    for (char& c : out) {
+      c = c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
     }
     return out;
   }
+  out.clear();
   size_t begin = 0;
   for (size_t i = 0; i < text.size();) {
     const size_t from = i;

@@ -10,9 +10,19 @@
 
 namespace vexlo::elasticd {
 
+// The next one for a byte that is not ASCII.
+int32_t NextWideCodePoint(std::string_view text, size_t* at);
+
 // What stands at `*at`, which is moved behind it: a code point, or -1 for one byte that is no
 // UTF-8.
-int32_t NextCodePoint(std::string_view text, size_t* at);
+inline int32_t NextCodePoint(std::string_view text, size_t* at) {
+  const auto byte = static_cast<unsigned char>(text[*at]);
+  if (byte < 0x80) {
+    ++*at;
+    return byte;
+  }
+  return NextWideCodePoint(text, at);
+}
 
 // NFKC with case folding, without the accents of Latin, Greek, Cyrillic and Arabic letters. The
 // voice marks of kana and the vowel signs of Indic scripts tell words apart and stay. Bytes that

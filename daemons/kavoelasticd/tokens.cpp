@@ -15,6 +15,7 @@ namespace {
 
 // What is longer is no word; its beginning stands for it.
 constexpr size_t kMaxWordBytes = 128;
+constexpr size_t kKnownWords = 2048;
 
 enum class Class { kSeparator, kLetter, kExtend, kIdeograph };
 
@@ -131,16 +132,21 @@ std::string_view WordCutter::Stem(const std::string& word) {
       std::any_of(word.begin(), word.end(), [](char c) { return c >= '0' && c <= '9'; })) {
     return word;
   }
-  const auto* stem =
-      sb_stemmer_stem(stemmer_.get(), reinterpret_cast<const sb_symbol*>(word.data()),
-                      static_cast<int>(word.size()));
-  if (stem == nullptr) {
-    return word;
+  if (known_.empty()) {
+    known_.resize(kKnownWords);
   }
-  const int length = sb_stemmer_length(stemmer_.get());
-  return length > 0
-             ? std::string_view(reinterpret_cast<const char*>(stem), static_cast<size_t>(length))
-             : std::string_view(word);
+  Known& known = known_[std::hash<std::string>()(word) % kKnownWords];
+  if (known.word != word) {
+    const auto* stem =
+        sb_stemmer_stem(stemmer_.get(), reinterpret_cast<const sb_symbol*>(word.data()),
+                        static_cast<int>(word.size()));
+    const int length = stem == nullptr ? 0 : sb_stemmer_length(stemmer_.get());
+    known.stem = length > 0
+                     ? std::string(reinterpret_cast<const char*>(stem), static_cast<size_t>(length))
+                     : word;
+    known.word = word;
+  }
+  return known.stem;
 }
 
 bool WordCutter::Word(std::string_view text, size_t begin, size_t end, Cut cut,

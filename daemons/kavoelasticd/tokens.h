@@ -55,6 +55,12 @@ class WordCutter {
     void operator()(sb_stemmer* stemmer) const;
   };
   std::unique_ptr<sb_stemmer, StemmerDelete> stemmer_;
+  // Words met lately, each at the place of its hash: most of a text is words that are frequent.
+  struct Known {
+    std::string word;
+    std::string stem;
+  };
+  std::vector<Known> known_;
 };
 
 // Whether the text is one character of Chinese, Japanese or Korean, as a query found by beginnings.

@@ -1,9 +1,7 @@
 #include "daemons/kavoelasticd/writer.h"
 
 #include <algorithm>
-#include <array>
 #include <optional>
-#include <set>
 #include <utility>
 #include <vector>
 
@@ -26,7 +24,7 @@ enum Table : unsigned {
 };
 
 using Row = std::vector<std::string>;
-using ExactRows = std::set<std::pair<uint32_t, std::string>>;
+using ExactRows = std::vector<std::pair<uint32_t, std::string>>;  // In order, each once.
 
 unsigned TablesOf(const Field& field) {
   const unsigned filter = field.filter ? static_cast<unsigned>(kDocsTable) : 0;
@@ -49,17 +47,18 @@ unsigned TablesOf(const Field& field) {
   return 0;
 }
 
-void Append(std::string* column, const std::string& text) {
-  *column += column->empty() ? "" : "\n";
+void Append(std::string* column, std::string text) {
+  if (column->empty()) {
+    *column = std::move(text);
+    return;
+  }
+  *column += '\n';
   *column += text;
 }
 
 // What the three text tables hold of a document; bodies must be known.
-Row RowOf(Session& session, const StoredDocument& document, Table table) {
-  const Schema& schema = session.schema;
-  Row row(table == kTexts       ? std::max<size_t>(1, schema.TextColumns().size())
-          : table == kGramTable ? std::max<size_t>(1, schema.GramColumns().size())
-                                : 3);
+Row RowOf(Session& session, const StoredDocument& document, unsigned table, size_t columns) {
+  Row row(columns);
   for (const Item& item : document.record.Items()) {
     const Field& field = session.FieldOf(item.field);
     if ((TablesOf(field) & table) == 0) {
@@ -84,10 +83,12 @@ ExactRows ExactRowsOf(Session& session, const StoredDocument& document) {
     }
     for (const std::string& text : TextsOf(item, document.path)) {
       for (std::string& value : ExactValues(field, text)) {
-        rows.emplace(item.field, std::move(value));
+        rows.emplace_back(item.field, std::move(value));
       }
     }
   }
+  std::sort(rows.begin(), rows.end());
+  rows.erase(std::unique(rows.begin(), rows.end()), rows.end());
   return rows;
 }
 
@@ -153,7 +154,18 @@ struct Writer::Change {
   std::vector<uint32_t> new_bodies = {};
 };
 
-Writer::Writer(Session& session) : session_(session) {}
+Writer::Writer(Session& session)
+    : session_(session), text_tables_([&session] {
+        const auto table = [](unsigned which, const char* name, const char* columns, size_t count) {
+          return TextTable{which, count, TextSql(name, columns, count, /*forget=*/false),
+                           TextSql(name, columns, count, /*forget=*/true)};
+        };
+        const size_t texts = std::max<size_t>(1, session.schema.TextColumns().size());
+        const size_t grams = std::max<size_t>(1, session.schema.GramColumns().size());
+        return std::array<TextTable, 3>{table(kTexts, "texts", "t", texts),
+                                        table(kWordTable, "words", "name,rest,other", 3),
+                                        table(kGramTable, "grams", "g", grams)};
+      }()) {}
 
 void Writer::Begin() {
   if (!session_.db.InTransaction()) {
@@ -344,20 +356,25 @@ unsigned Writer::ChangedTables(Change& change) {
   return tables;
 }
 
-void Writer::Reindex(Change& change, StoredDocument& document, const std::string& table,
-                     const std::string& insert, const std::string& remove, bool before) {
-  const Table which = table == "texts" ? kTexts : table == "grams" ? kGramTable : kWordTable;
-  const std::vector<Item> items = document.record.Items();
-  for (const Item& item : items) {
-    if ((TablesOf(session_.FieldOf(item.field)) & which) != 0) {
-      session_.FillBody(change.after.id, &document.record, item.field);
+// Reads the long texts of the fields that are in `table`.
+void Writer::FillBodies(int64_t id, StoredDocument* document, unsigned table) {
+  // By number: what is filled in takes the place of the item that is there.
+  const std::vector<Item>& items = document->record.Items();
+  for (size_t i = 0; i < items.size(); ++i) {
+    if (items[i].kind == Kind::kBody && (TablesOf(session_.FieldOf(items[i].field)) & table) != 0) {
+      session_.FillBody(id, &document->record, items[i].field);
     }
   }
-  const Row row = RowOf(session_, document, which);
+}
+
+void Writer::Reindex(Change& change, StoredDocument& document, const TextTable& table,
+                     bool before) {
+  FillBodies(change.after.id, &document, table.table);
+  const Row row = RowOf(session_, document, table.table, table.columns);
   if (std::all_of(row.begin(), row.end(), [](const std::string& text) { return text.empty(); })) {
     return;
   }
-  Sql sql(session_.db, before ? remove : insert);
+  Sql sql(session_.db, before ? table.remove : table.insert);
   sql.Int(change.after.id);
   for (const std::string& text : row) {
     sql.Text(text);
@@ -388,18 +405,13 @@ void Writer::WriteBodies(Change& change) {
 
 void Writer::WriteExact(Change& change) {
   for (StoredDocument* document : {&change.before, &change.after}) {
-    const std::vector<Item> items = document->record.Items();
-    for (const Item& item : items) {
-      if ((TablesOf(session_.FieldOf(item.field)) & kExactTable) != 0) {
-        session_.FillBody(change.after.id, &document->record, item.field);
-      }
-    }
+    FillBodies(change.after.id, document, kExactTable);
   }
   const ExactRows before = ExactRowsOf(session_, change.before);
   const ExactRows after = ExactRowsOf(session_, change.after);
   const auto write = [&](const ExactRows& rows, const ExactRows& kept, const char* text) {
     for (const auto& row : rows) {
-      if (!kept.contains(row)) {
+      if (!std::binary_search(kept.begin(), kept.end(), row)) {
         Sql(session_.db, text).Int(row.first).Blob(row.second).Int(change.after.id).Run();
       }
     }
@@ -477,23 +489,10 @@ void Writer::Apply(Change& change) {
   if (!exists) {
     WriteRows(change, filters_differ);
   }
-  const size_t texts = std::max<size_t>(1, session_.schema.TextColumns().size());
-  const size_t grams = std::max<size_t>(1, session_.schema.GramColumns().size());
-  struct Part {
-    unsigned table;
-    const char* name;
-    const char* columns;
-    size_t count;
-  };
-  const std::array<Part, 3> parts = {{{kTexts, "texts", "t", texts},
-                                      {kWordTable, "words", "name,rest,other", 3},
-                                      {kGramTable, "grams", "g", grams}}};
-  for (const Part& part : parts) {
-    if ((tables & part.table) != 0) {
-      const std::string insert = TextSql(part.name, part.columns, part.count, /*forget=*/false);
-      const std::string remove = TextSql(part.name, part.columns, part.count, /*forget=*/true);
-      Reindex(change, change.before, part.name, insert, remove, /*before=*/true);
-      Reindex(change, change.after, part.name, insert, remove, /*before=*/false);
+  for (const TextTable& table : text_tables_) {
+    if ((tables & table.table) != 0) {
+      Reindex(change, change.before, table, /*before=*/true);
+      Reindex(change, change.after, table, /*before=*/false);
     }
   }
   if ((tables & kExactTable) != 0) {

@@ -4,6 +4,7 @@
 
 #include <json/value.h>
 
+#include <array>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
@@ -55,8 +56,14 @@ class Writer {
                     const std::function<void(size_t, const Failure&)>& refused);
   void RemoveDocument(StoredDocument document);
   void Apply(Change& change);
-  void Reindex(Change& change, StoredDocument& document, const std::string& table,
-               const std::string& insert, const std::string& remove, bool before);
+  struct TextTable {
+    unsigned table;
+    size_t columns;
+    std::string insert;
+    std::string remove;
+  };
+  void FillBodies(int64_t id, StoredDocument* document, unsigned table);
+  void Reindex(Change& change, StoredDocument& document, const TextTable& table, bool before);
   unsigned ChangedTables(Change& change);
   bool Same(Change& change, const Item& before, const Item& after);
   void WriteBodies(Change& change);
@@ -66,6 +73,7 @@ class Writer {
   void CheckRequired(const Json::Value& data, bool whole) const;
 
   Session& session_;
+  const std::array<TextTable, 3> text_tables_;
   size_t changes_ = 0;
   std::string lost_;  // Why changes were rolled back, until it is told.
 };

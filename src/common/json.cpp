@@ -79,14 +79,17 @@ class BlockBuffer : public std::streambuf {
   size_t size_ = 0;
 };
 
-std::string Write(const Json::Value& value, const char* indentation) {
+Json::StreamWriter* NewWriter(const char* indentation) {
   Json::StreamWriterBuilder builder;
   builder["indentation"] = indentation;
   builder["emitUTF8"] = true;  // Every other form replaces bytes that are not UTF-8.
-  const std::unique_ptr<Json::StreamWriter> writer(builder.newStreamWriter());
+  return builder.newStreamWriter();
+}
+
+std::string Write(const Json::Value& value, Json::StreamWriter& writer) {
   BlockBuffer buffer;
   std::ostream stream(&buffer);
-  writer->write(value, &stream);
+  writer.write(value, &stream);
   return buffer.Take();
 }
 
@@ -105,7 +108,11 @@ bool JsonFromFile(Json::Value& value, const std::string& path) {
   return ReadFile(text, path) && JsonFromString(value, text);
 }
 
-std::string JsonToString(const Json::Value& value) { return Write(value, ""); }
+// With a writer that is made once a thread, as the reader is.
+std::string JsonToString(const Json::Value& value) {
+  thread_local const std::unique_ptr<Json::StreamWriter> writer(NewWriter(""));
+  return Write(value, *writer);
+}
 
 void AppendJsonText(std::string& out, std::string_view text) {
   constexpr char kHex[] = "0123456789abcdef";
@@ -128,7 +135,10 @@ void AppendJsonText(std::string& out, std::string_view text) {
   out += '"';
 }
 
-std::string JsonToStyledString(const Json::Value& value) { return Write(value, "   ") + "\n"; }
+std::string JsonToStyledString(const Json::Value& value) {
+  const std::unique_ptr<Json::StreamWriter> writer(NewWriter("   "));
+  return Write(value, *writer) + "\n";
+}
 
 bool JsonToFile(const Json::Value& value, const std::string& path) {
   return ReplaceFile(path, JsonToStyledString(value));

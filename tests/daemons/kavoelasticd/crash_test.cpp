@@ -45,8 +45,8 @@ TEST(Crash, WhatWasCommittedIsThere) {
         const std::string path = "/v/" + std::to_string(i);
         engine.Add(path, R"({"KAVOMDTextContent":"word)" + std::to_string(i) + "\"}");
         if (i > 0) {
-          engine.Send(EngineFixture::Rename("/v/" + std::to_string(i - 1),
-                                            "/moved/" + std::to_string(i - 1)));
+          engine.Send(
+              RenameRequest("/v/" + std::to_string(i - 1), "/moved/" + std::to_string(i - 1)));
         }
         if (engine.Do("commit") != "ok" || write(pipes[1], "c", 1) != 1) {
           _exit(1);
@@ -86,8 +86,7 @@ TEST(Crash, AMoveCutShortIsSettledAtTheNextStart) {
       engine.Restart();
       // Die at the nth rename: of the registry, the database, or the registry again.
       const ScopedFault fault("rename", EIO, nth, /*lasting=*/true);
-      const std::string data = R"({"data":{"path":")" + (engine.Folder() / "new") + "\"}}";
-      _exit(engine.Do("index_config_set", data) == "ok" ? 0 : 1);
+      _exit(engine.Move(engine.Folder() / "new") == "ok" ? 0 : 1);
     });
     ASSERT_TRUE(WIFEXITED(status));
     EXPECT_EQ(WEXITSTATUS(status), nth <= 3 ? 1 : 0);
@@ -188,9 +187,9 @@ TEST(Crash, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   sqlite3_close(db);
   engine.Do("index_resume");
   const auto document = [](const std::string& path, const std::string& text) {
-    return EngineFixture::Write("document_upsert_by_id", path,
-                                EngineFixture::Document(path, R"({"KAVOMDTextContent":")" + text +
-                                                                  std::string(500, 'x') + "\"}"));
+    return WriteRequest(
+        "document_upsert_by_id", path,
+        MakeDocument(path, R"({"KAVOMDTextContent":")" + text + std::string(500, 'x') + "\"}"));
   };
   // In a compound it fails alone, and leaves no part of it behind.
   Json::Value request;
@@ -199,12 +198,12 @@ TEST(Crash, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   request["compound"].append(document("/v/3", "good "));
   const Json::Value reply = engine.Send(request);
   EXPECT_TRUE(reply["has_fail"].asBool());
-  EXPECT_EQ(EngineFixture::Answer(reply["data"][1]), "2009");
+  EXPECT_EQ(Answer(reply["data"][1]), "2009");
   EXPECT_EQ(engine.Search(R"({"words":"good","sort":"path"})"), "/v/1 /v/3");
   EXPECT_EQ(engine.Search(R"({"words":"bad"})"), "");
   // Alone it takes what was not committed with it, and the commit says so.
   EXPECT_EQ(engine.Add("/v/4"), "ok");
-  EXPECT_EQ(EngineFixture::Answer(engine.Send(document("/v/5", "bad "))), "2009");
+  EXPECT_EQ(Answer(engine.Send(document("/v/5", "bad "))), "2009");
   EXPECT_EQ(engine.Add("/v/6"), "ok");
   EXPECT_EQ(engine.Do("commit"), "2011");
   EXPECT_EQ(engine.Do("commit"), "ok");

@@ -12,13 +12,10 @@ TEST(DiskFull, WhatIsCommittedStaysAndWorkGoesOnWhenThereIsRoom) {
   ASSERT_EQ(engine.Create("small", disk / "index"), "ok");
   const auto add = [&engine](int i) {
     const std::string path = "/v/" + std::to_string(i);
-    Json::Value request = EngineFixture::Write(
-        "document_upsert_by_id", path,
-        EngineFixture::Document(path, R"({"KAVOMDTextContent":"kept )" +
-                                          std::string(20000, static_cast<char>('a' + i % 26)) +
-                                          "\"}"));
-    request["data"]["id"] = "small";
-    return EngineFixture::Answer(engine.Send(request));
+    const std::string text = "kept " + std::string(20000, static_cast<char>('a' + i % 26));
+    return Answer(engine.Send(
+        WriteRequest("document_upsert_by_id", path,
+                     MakeDocument(path, R"({"KAVOMDTextContent":")" + text + "\"}"), "small")));
   };
   const auto find = [&engine] {
     return engine.Send("search", Parsed(R"({"ids":["small"],"words":"kept","size":1000})"))["total"]

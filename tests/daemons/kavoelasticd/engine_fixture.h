@@ -43,6 +43,50 @@ constexpr char kMappings[] = R"({"property_id":"KAVOMDPath",
   "Lower":{"analyzer":"keyword","preprocess":["tolower"]},
   "Escaped":{"type":"text","analyzer":"white space escaped"}}})";
 
+// "ok", or the code.
+inline std::string Answer(const Json::Value& reply) {
+  return reply["success"].asBool() ? "ok" : std::to_string(reply["error"]["code"].asInt());
+}
+
+// A document with the fields that follow from its path, and those of `more`.
+inline Json::Value MakeDocument(const std::string& path, const std::string& more = "{}") {
+  Json::Value data = Parsed(more);
+  const size_t slash = path.rfind('/');
+  data["KAVOMDPath"] = path;
+  for (const char* field : {"KAVOMDParent", "KAVOMDSearchAncestor"}) {
+    data[field] = path.substr(0, slash);
+  }
+  for (const char* field : {"KAVOMDFSName", "KAVOMDSearchFileName", "KAVOMDDisplayName"}) {
+    data[field] = path.substr(slash + 1);
+  }
+  const size_t dot = path.rfind('.');
+  data["KAVOMDExtension"] = dot == std::string::npos ? "" : path.substr(dot + 1);
+  return data;
+}
+
+inline Json::Value WriteRequest(const std::string& command, const std::string& doc_id,
+                                const Json::Value& data, const std::string& id = "i") {
+  Json::Value request;
+  request["command"] = command;
+  request["data"]["id"] = id;
+  request["data"]["doc_id"] = doc_id;
+  request["data"]["data"] = data;
+  return request;
+}
+
+// What the library sends for a document that moves from `from`.
+inline Json::Value RenameRequest(const std::string& from, const std::string& to) {
+  return WriteRequest("document_set_by_id", from, MakeDocument(to));
+}
+
+inline std::string Paths(const Json::Value& list, const char* field) {
+  std::string paths;
+  for (const Json::Value& item : list) {
+    paths += (paths.empty() ? "" : " ") + item[field].asString();
+  }
+  return paths;
+}
+
 class EngineFixture {
  public:
   explicit EngineFixture(const std::string& mappings = kMappings) {
@@ -66,13 +110,14 @@ class EngineFixture {
     return Send(request);
   }
 
-  // "ok", or the code.
-  static std::string Answer(const Json::Value& reply) {
-    return reply["success"].asBool() ? "ok" : std::to_string(reply["error"]["code"].asInt());
-  }
   std::string Do(const std::string& command, const std::string& data = "{}",
                  const std::string& id = "i") {
     return Answer(Send(command, Parsed(data), id));
+  }
+
+  // Tells where the folder of the index is to be.
+  std::string Move(const std::string& path, const std::string& id = "i") {
+    return Do("index_config_set", R"({"data":{"path":")" + path + "\"}}", id);
   }
 
   std::string Create(const std::string& id, const std::string& path,
@@ -82,43 +127,11 @@ class EngineFixture {
     data["path"] = path;
     data["settings"] = Json::objectValue;
     data["mappings"] = Parsed(mappings);
-    const Json::Value reply = Send("index_create", data);
-    return Answer(reply);
-  }
-
-  // A document with the fields that follow from its path, and those of `more`.
-  static Json::Value Document(const std::string& path, const std::string& more = "{}") {
-    Json::Value data = Parsed(more);
-    const size_t slash = path.rfind('/');
-    data["KAVOMDPath"] = path;
-    for (const char* field : {"KAVOMDParent", "KAVOMDSearchAncestor"}) {
-      data[field] = path.substr(0, slash);
-    }
-    for (const char* field : {"KAVOMDFSName", "KAVOMDSearchFileName", "KAVOMDDisplayName"}) {
-      data[field] = path.substr(slash + 1);
-    }
-    const size_t dot = path.rfind('.');
-    data["KAVOMDExtension"] = dot == std::string::npos ? "" : path.substr(dot + 1);
-    return data;
-  }
-
-  static Json::Value Write(const std::string& command, const std::string& doc_id,
-                           const Json::Value& data) {
-    Json::Value request;
-    request["command"] = command;
-    request["data"]["id"] = "i";
-    request["data"]["doc_id"] = doc_id;
-    request["data"]["data"] = data;
-    return request;
+    return Answer(Send("index_create", data));
   }
 
   std::string Add(const std::string& path, const std::string& more = "{}") {
-    return Answer(Send(Write("document_upsert_by_id", path, Document(path, more))));
-  }
-
-  // What the library sends for a document that moves from `from`.
-  static Json::Value Rename(const std::string& from, const std::string& to) {
-    return Write("document_set_by_id", from, Document(to));
+    return Answer(Send(WriteRequest("document_upsert_by_id", path, MakeDocument(path, more))));
   }
 
   // The documents that a query finds, as it gives them.
@@ -129,14 +142,6 @@ class EngineFixture {
     const Json::Value reply = Send("document_get_by_query", data);
     EXPECT_TRUE(reply["data"].isArray()) << reply;
     return reply["data"];
-  }
-
-  static std::string Paths(const Json::Value& list, const char* field) {
-    std::string paths;
-    for (const Json::Value& item : list) {
-      paths += (paths.empty() ? "" : " ") + item[field].asString();
-    }
-    return paths;
   }
 
   // Their paths.

@@ -21,14 +21,14 @@ class Oracle {
       case 0:
       case 1:
       case 2: {
-        const Json::Value document = EngineFixture::Document(path, Fields());
-        Send(EngineFixture::Write("document_upsert_by_id", path, document), "ok");
+        const Json::Value document = MakeDocument(path, Fields());
+        Send(WriteRequest("document_upsert_by_id", path, document), "ok");
         documents_[path] = document;
         break;
       }
       case 3: {
         const Json::Value data = Parsed(Fields());
-        Send(EngineFixture::Write("document_set_by_id", path, data), Known(path));
+        Send(WriteRequest("document_set_by_id", path, data), Known(path));
         if (documents_.contains(path)) {
           Merge(path, data);
         }
@@ -39,7 +39,7 @@ class Oracle {
         Rename(path, Path());
         break;
       case 6:
-        Send(EngineFixture::Write("document_del_by_id", path, Json::Value()), "ok");
+        Send(WriteRequest("document_del_by_id", path, Json::Value()), "ok");
         documents_.erase(path);
         break;
       default:
@@ -107,7 +107,7 @@ class Oracle {
   }
 
   void Send(const Json::Value& request, const std::string& want) {
-    EXPECT_EQ(EngineFixture::Answer(engine_.Send(request)), want) << request;
+    EXPECT_EQ(Answer(engine_.Send(request)), want) << request;
   }
 
   void Merge(const std::string& path, const Json::Value& data) {
@@ -120,7 +120,7 @@ class Oracle {
   }
 
   void Rename(const std::string& from, const std::string& to) {
-    Json::Value request = EngineFixture::Rename(from, to);
+    Json::Value request = RenameRequest(from, to);
     if (random_() % 3 == 0) {  // Only the path: the other fields stay what they were.
       request["data"]["data"] = Json::Value();
       request["data"]["data"]["KAVOMDPath"] = to;

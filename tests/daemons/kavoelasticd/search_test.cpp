@@ -33,7 +33,6 @@ TEST(Search, FindsWordsNamesAndWhatTheFiltersLeave) {
       {"AllWords", R"({"words":"brown jump"})", "/v/a/report.txt"},
       {"WordsOfDifferentFields", R"({"words":"fox winter"})", "/v/a/fox.JPG"},
       {"Phrase", R"({"words":"\"quick brown\""})", "/v/a/report.txt"},
-      {"PhraseOpen", R"({"words":"\"quick brown"})", "/v/a/report.txt"},
       {"Beginning", R"({"words":"budg*"})", "/v/a/report.txt"},
       {"BeginningBeyondTheStem", R"({"words":"lovelac*"})", "/v/a/fox.JPG"},
       {"AccentsEitherWay", "{\"words\":\"Z\u00dcRICH\"}", "/v/a/fox.JPG"},
@@ -44,14 +43,9 @@ TEST(Search, FindsWordsNamesAndWhatTheFiltersLeave) {
       {"PathIsNotSearched", R"({"words":"ab"})", ""},
       {"OnlyNoise", R"({"words":"?!"})", ""},
       {"Operators", R"({"words":"fox) OR (NEAR"})", ""},
-      {"Ideographs", "{\"words\":\"\u65e5\u672c\"}",
-       "/v/b/\u6771\u4eac\u90fd\u306e\u5730\u56f3.pdf"},
-      {"OneIdeograph", "{\"words\":\"\u7ae0\"}", "/v/b/\u6771\u4eac\u90fd\u306e\u5730\u56f3.pdf"},
       {"IdeographsApart", "{\"words\":\"\u65e5\u8a9e\"}", ""},
       {"PartOfName", R"({"name":"OTE"})", "/v/ab/notes.md"},
-      {"PartOfNameAtItsEnd", R"({"name":"s.md"})", "/v/ab/notes.md"},
       {"OneLetter", R"({"name":"J"})", "/v/a/fox.JPG"},
-      {"LastLetter", R"({"name":"g"})", "/v/a/fox.JPG"},
       {"GramsApart", R"({"name":"reporeport"})", ""},
       {"PartWithIdeographs", "{\"name\":\"\u5730\u56f3\"}",
        "/v/b/\u6771\u4eac\u90fd\u306e\u5730\u56f3.pdf"},
@@ -122,10 +116,9 @@ TEST(Search, MergesThePagesOfSeveralIndexes) {
   EXPECT_EQ(engine.Create("j", engine.Folder() / "j"), "ok");
   for (int i = 0; i < 10; ++i) {
     const std::string path = "/v/" + std::to_string(i);
-    Json::Value request =
-        EngineFixture::Write("document_upsert_by_id", path, EngineFixture::Document(path));
-    request["data"]["id"] = i % 3 == 0 ? "i" : "j";
-    EXPECT_EQ(EngineFixture::Answer(engine.Send(request)), "ok");
+    EXPECT_EQ(Answer(engine.Send(WriteRequest("document_upsert_by_id", path, MakeDocument(path),
+                                              i % 3 == 0 ? "i" : "j"))),
+              "ok");
   }
   EXPECT_EQ(engine.Do("commit", "{}", "j"), "ok");
   EXPECT_EQ(engine.Search(R"({"sort":"path","from":2,"size":4})"), "/v/2 /v/3 /v/4 /v/5");

@@ -48,8 +48,8 @@ TEST(Threads, SearchesSeeOneCommitWhileDocumentsMove) {
     Json::Value request;
     for (int i = 0; i < kDocuments; ++i) {
       const std::string name = "/d" + std::to_string(i);
-      request["compound"].append(EngineFixture::Rename("/" + std::to_string(round) + name,
-                                                       "/" + std::to_string(round + 1) + name));
+      request["compound"].append(RenameRequest("/" + std::to_string(round) + name,
+                                               "/" + std::to_string(round + 1) + name));
     }
     EXPECT_FALSE(engine.Send(request)["has_fail"].asBool());
     // What was written is there at once for queries, committed or not.

@@ -1,13 +1,10 @@
 // A daemon as a service manager or a person runs it: a program around RunDaemon().
 #include "daemons/common/run_daemon.h"
 
-#include <signal.h>
-#include <sys/wait.h>
-
-#include <cstdio>
 #include <filesystem>
 
 #include "kavo/local/shares.h"
+#include "support/program.h"
 #include "support/raw_client.h"
 #include "support/temp_folder.h"
 
@@ -16,45 +13,15 @@ namespace {
 
 class RunDaemonTest : public testing::Test {
  protected:
-  // A program that runs, its standard error in a pipe.
-  struct Program {
-    FILE* output = nullptr;
-    pid_t pid = 0;
-    std::string text;
-
-    // Reads on until the text holds `wanted`; false when it ends before.
-    bool Await(const std::string& wanted) {
-      for (int byte = 0; text.find(wanted) == std::string::npos;) {
-        if ((byte = getc(output)) == EOF) {
-          return false;
-        }
-        text += static_cast<char>(byte);
-      }
-      return true;
-    }
-    // The exit status, after a signal if it is one; 128 and the signal that ended it.
-    int End(int signal = 0) {
-      kill(pid, signal);
-      EXPECT_FALSE(Await("what no daemon says"));
-      const int status = pclose(output);
-      return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-    }
-  };
-
   void SetUp() override {
     if (kavo::local::Root().empty()) {
       GTEST_SKIP() << "this build's paths are the system's own";
     }
   }
 
-  Program Start(const std::string& arguments = "", const std::string& settings = "") {
-    Program program;
-    const std::string line = settings + " FILEINDEX_ROOT=" + folder_.Path() +
-                             " sh -c 'echo $$; exec " + ECHO_ENGINE + " " + arguments + "' 2>&1";
-    program.output = popen(line.c_str(), "re");
-    EXPECT_TRUE(program.Await("\n"));
-    program.pid = std::stoi(std::exchange(program.text, ""));
-    return program;
+  Program Start(const std::string& arguments = "", const std::string& settings = "") const {
+    return {"export FILEINDEX_ROOT=" + folder_.Path() + settings,
+            ECHO_ENGINE " " + arguments + " 2>&1"};
   }
   std::string Ask(const std::string& request) const { return ::Ask(socket_, request); }
   std::set<std::string> Left() const {
@@ -92,7 +59,7 @@ TEST_F(RunDaemonTest, EndsWithTheStatusThatSaysWhy) {
 
 TEST_F(RunDaemonTest, ServesUntilItIsAskedToEnd) {
   const RawClient manager(UnixSocket(folder_ / "notify", SOCK_DGRAM, bind));
-  Program program = Start("", "NOTIFY_SOCKET=" + (folder_ / "notify"));
+  Program program = Start("", " NOTIFY_SOCKET=" + (folder_ / "notify"));
   ASSERT_TRUE(program.Await("ready\n")) << program.text;
   EXPECT_EQ(manager.Receive(1), "R");  // The rest of a datagram is lost.
   const std::string pid_file = folder_ / "var/run/kavoelasticd.pid";

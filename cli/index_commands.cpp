@@ -81,7 +81,7 @@ ExitStatus ListIndexes(const Arguments& arguments, const Console& console) {
 
 // The path of a document, by a path of the file system or below the share: "/photo/2019".
 std::string DocumentPath(const std::string& path) {
-  const std::string absolute = AbsolutePath(path);
+  std::string absolute = AbsolutePath(path);
   if (IsFileExist(absolute) || IsDirExist(absolute, /*follow_link=*/false)) {
     return absolute;
   }

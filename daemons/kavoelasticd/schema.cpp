@@ -61,7 +61,7 @@ Field Apply(Field field, const Json::Value& attributes) {
     const std::string name(flag.name);
     if (attributes.isMember(name)) {
       if (!attributes[name].isBool()) {
-        Refuse("mappings: " + where + "." + name + " is neither true nor false");
+        Refuse(std::string("mappings: ").append(where) + "." + name + " is neither true nor false");
       }
       field.*flag.value = attributes[name].asBool();
     }

@@ -7,7 +7,7 @@
 namespace vexlo::elasticd {
 namespace {
 
-constexpr size_t kReadBytes = 256 * 1024;
+constexpr size_t kReadBytes = size_t{256} * 1024;
 constexpr size_t kShownBytes = 200;
 constexpr size_t kLeadBytes = 40;
 

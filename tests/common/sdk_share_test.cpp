@@ -41,7 +41,7 @@ int Ask(const char* name, int (*real)(const KAVO_SHARE*, int*), const KAVO_SHARE
 }  // namespace
 
 // Enum() leaves its list to the platform; LeakSanitizer asks here.
-// NOLINTNEXTLINE(bugprone-reserved-identifier)
+// NOLINTNEXTLINE(bugprone-reserved-identifier,readability-identifier-naming)
 INTERPOSED const char* __lsan_default_suppressions() { return "leak:SDKShare::Enum"; }
 
 #define QUESTION(name)                                                                    \

@@ -21,11 +21,23 @@
 #include "support/private_root.h"
 #include "support/syslog_capture.h"
 
-using namespace vexlo::fileindex::elastic;
+using vexlo::fileindex::elastic::IndexAttr;
+using vexlo::fileindex::elastic::IndexCommit;
+using vexlo::fileindex::elastic::IndexDel;
+using vexlo::fileindex::elastic::IndexDelDir;
+using vexlo::fileindex::elastic::IndexGetByPrefixPath;
+using vexlo::fileindex::elastic::IndexRename;
+using vexlo::fileindex::elastic::IndexUpsert;
+using vexlo::fileindex::elastic::ShareIndexCreate;
+using vexlo::fileindex::elastic::ShareIndexDelete;
+using vexlo::fileindex::elastic::ShareIndexMigrate;
+using vexlo::fileindex::elastic::ShareIndexPause;
+using vexlo::fileindex::elastic::ShareIndexRename;
+using vexlo::fileindex::elastic::ShareIndexResume;
 
 namespace {
 
-const PrivateRoot root;
+const PrivateRoot kRoot;
 std::string happened;  // Requests, sleeps, what was logged and thrown, a line each.
 int random_number = 0;
 
@@ -73,9 +85,9 @@ Replies Refusals(const std::vector<int>& codes) {
 
 class Elastic : public testing::Test {
  protected:
-  Elastic() : engine_(root.MakeFolder("var/run") + "/kavoelasticd.sock") {
+  Elastic() : engine_(kRoot.MakeFolder("var/run") + "/kavoelasticd.sock") {
     happened.clear();
-    root.SetShares(
+    kRoot.SetShares(
         R"({"name": "my photo", "path": "/v/my photo"}, {"name": "full", "path": "/v/full"})");
   }
   void Do(const std::string& name, const Replies& replies, const std::function<void()>& call) {
@@ -205,8 +217,8 @@ TEST(ElasticSocket, IsAwaitedFor31SecondsAndConnectedToAnyway) {
 }
 
 TEST_F(Elastic, ABusyEngineIsAwaited) {
-  const std::string tool = root.MakeFolder("usr/kavo/bin") + "/kavoqpxnotify";
-  WriteText(tool, "#!/bin/sh\nprintf x >> '" + root / "notices" + "'\n");
+  const std::string tool = kRoot.MakeFolder("usr/kavo/bin") + "/kavoqpxnotify";
+  WriteText(tool, "#!/bin/sh\nprintf x >> '" + kRoot / "notices" + "'\n");
   ASSERT_EQ(chmod(tool.c_str(), 0755), 0);
   const auto pause = [] { ShareIndexPause("s"); };
   Do("not ready", Refusals({607, 608, 610, 609}), pause);
@@ -229,9 +241,9 @@ TEST_F(Elastic, ABusyEngineIsAwaited) {
   std::vector<int> codes(10, 1400);
   codes.push_back(608);
   Do("ten times", Refusals(codes), pause);
-  EXPECT_EQ(ReadText(root / "notices"), "<missing>");
+  EXPECT_EQ(ReadText(kRoot / "notices"), "<missing>");
   Do("twelve times", Refusals(std::vector<int>(12, 1401)), pause);
-  EXPECT_EQ(ReadText(root / "notices"), "x");
+  EXPECT_EQ(ReadText(kRoot / "notices"), "x");
 }
 
 TEST_F(Elastic, EachOperationHasItsRequest) {
@@ -316,7 +328,7 @@ TEST_F(Elastic, ANewIndexGetsTheMappings) {
   EXPECT_EQ(
       vexlo::JsonToString(request),
       R"({"command":"index_create","data":{"event_handler":{"lib_path":"/var/packages/Vexlo/target/handler/fileindex_event_handler.so"},"id":"fileindex_my photo","mappings":{"default":{"_all":true,"analyzer":"kavostandard","required":false,"stored":true,"type":"string"},"property_id":"KAVOMDPath"},"path":")" +
-          root / "var/lib/kavo/fileindex/db/%2Fv%2Fmy photo" + R"(","settings":{}}})");
+          kRoot / "var/lib/kavo/fileindex/db/%2Fv%2Fmy photo" + R"(","settings":{}}})");
   std::map<std::string, std::string> groups;
   for (std::string name : properties.getMemberNames()) {
     std::string& group = groups[vexlo::JsonToString(properties[name])];
@@ -397,8 +409,8 @@ TEST_F(Elastic, ACommitWithoutRoomMarksTheShare) {
   if (geteuid() != 0) {
     GTEST_SKIP() << "the status file is root's";
   }
-  root.MakeFolder("tmp");
-  const std::string status = root.MakeFolder("var/packages/Vexlo/etc") + "/fileindex.status";
+  kRoot.MakeFolder("tmp");
+  const std::string status = kRoot.MakeFolder("var/packages/Vexlo/etc") + "/fileindex.status";
   WriteText(status, R"({"share": {"full": 2}, "resume_time": 5})");
   Do("full", {Refusal(500)}, [] { IndexCommit("full"); });
   EXPECT_NE(happened.find("\n! 1003 Share (full) space not enough\n"), std::string::npos);

@@ -164,7 +164,7 @@ TEST(Engine, PathsAreBytes) {
   EngineFixture engine;
   std::string deep;
   for (int i = 0; i < 100; ++i) {
-    deep += "/" + std::string(39, 'a' + static_cast<char>(i % 26));
+    deep += "/" + std::string(39, "abcdefghijklmnopqrstuvwxyz"[i % 26]);
   }
   const std::string paths[] = {"/v/\xff\xfe\x80",
                                "/v/caf\u00e9",

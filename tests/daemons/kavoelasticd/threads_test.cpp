@@ -22,6 +22,7 @@ TEST(Threads, SearchesSeeOneCommitWhileDocumentsMove) {
   ASSERT_EQ(engine.Do("commit"), "ok");
   std::atomic<bool> done = false;
   std::vector<std::thread> readers;
+  readers.reserve(2);
   std::atomic<int> searches = 0;
   for (int t = 0; t < 2; ++t) {
     readers.emplace_back([&] {
@@ -92,6 +93,7 @@ TEST(Threads, PausesAndRenamesWaitForWhatIsRunning) {
   engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");
   std::atomic<bool> done = false;
   std::vector<std::thread> users;
+  users.reserve(3);
   for (int t = 0; t < 3; ++t) {
     users.emplace_back([&, t] {
       while (!done) {

@@ -82,16 +82,21 @@ int Run(Arguments& arguments) {
   return WIFSIGNALED(status) ? 128 + WTERMSIG(status) : WEXITSTATUS(status);
 }
 
+// What both functions do once they have found their list; `rest` ends in a null pointer.
+int RunList(const char* path, va_list rest) noexcept {
+  return kavo::local::Guarded([path, &rest] {
+    Arguments arguments{const_cast<char*>(path)};
+    Append(arguments, rest);
+    return Run(arguments);
+  });
+}
+
 }  // namespace
 
 int KLIBCExec(const char* path, ...) {
   va_list rest;
   va_start(rest, path);
-  const int result = kavo::local::Guarded([path, &rest] {
-    Arguments arguments{const_cast<char*>(path)};
-    Append(arguments, rest);
-    return Run(arguments);
-  });
+  const int result = RunList(path, rest);
   va_end(rest);
   return result;
 }
@@ -99,11 +104,7 @@ int KLIBCExec(const char* path, ...) {
 int KLIBCExecl(const char* path, int options, ...) {
   va_list rest;
   va_start(rest, options);
-  const int result = kavo::local::Guarded([path, &rest] {
-    Arguments arguments{const_cast<char*>(path)};
-    Append(arguments, rest);
-    return Run(arguments);
-  });
+  const int result = RunList(path, rest);
   va_end(rest);
   return result;
 }

@@ -23,6 +23,8 @@ class FixedPath {
   const char* path_;
 };
 
+inline constexpr FixedPath kFileIndexFoldersCfgPath("/var/packages/Vexlo/etc/fileindex.folders");
+inline constexpr FixedPath kFileIndexFoldersLockPath("/tmp/vexlo_cfg_folder.lock");
 inline constexpr FixedPath kFileIndexStatusCfgPath("/var/packages/Vexlo/etc/fileindex.status");
 inline constexpr FixedPath kFileIndexStatusLockPath("/tmp/vexlo_cfg_fi_status.lock");
 inline constexpr FixedPath kFileIndexDaemonSocketPath("/var/run/fileindexd.sock");

@@ -11,6 +11,7 @@
 #include "common/json.h"
 #include "common/lock.h"
 #include "common/string.h"
+#include "fileindex/folder_mgr.h"
 #include "fileindex/optree/line_parser.h"
 #include "fileindex/optree/line_reader.h"
 
@@ -113,6 +114,9 @@ int QueueMgr::ProcessOP(std::function<void(std::shared_ptr<OP>)> callback, bool 
 }
 
 bool QueueMgr::IsFullPathProcessing(const std::string& full_path) {
+  // Whoever asks trusts the list of folders: one that cannot be loaded must not look like an idle
+  // queue.
+  const FolderMgr folders;
   const auto concerns = [&full_path](const EventView& event) {
     return IsSameOrBelow(event.path, full_path) || IsSameOrBelow(event.path_old, full_path);
   };

@@ -41,7 +41,8 @@ class VEXLO_EXPORT QueueMgr {
   // Whether an event is pending, live or in the snapshot, for `full_path` or anything below it (by
   // "path" or "path_old"). Throws Error 502 when a queue cannot be read, and 906 or 120 at a bad
   // line that stands before the first match. Takes no lock: a last line that is being written is
-  // waited for for a tenth of a second.
+  // waited for for a tenth of a second. Throws what FolderMgr's constructor does, too, when the
+  // list of folders cannot be loaded.
   bool IsFullPathProcessing(const std::string& full_path);
 
   // Whether a reindex of `full_path` or of a folder above it is pending: an event of exactly

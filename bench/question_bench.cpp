@@ -1,0 +1,265 @@
+// What is asked about a path, beside what it would cost otherwise.
+//
+//   folders/N     which of N folders covers a file, over 4,096 files below folders drawn at random,
+//                 at 10, 1,000 and 10,000 folders: the cost must not grow with N
+//   linear/N      the same with one pass over the list, at 10 and 1,000
+//   own/N         whether a path is itself a folder's
+//   reindex       whether a reindex that covers a path waits in a queue of 1,000,000 lines
+//   processing    whether anything waits below a path, in the same queue
+//   simdjson      a pass over the same file, read whole, that parses each line with simdjson and
+//                 takes "event" and "path" out of it
+//
+// The files are made in a folder of the program's own below the temporary folder.
+// --quick runs each case for a moment, with 10,000 lines. Otherwise all of Google Benchmark's
+// flags.
+#include <benchmark/benchmark.h>
+#include <json/value.h>
+#include <simdjson.h>
+
+#include <algorithm>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <map>
+#include <memory>
+#include <random>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "common/json.h"
+#include "common/string.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/paths.h"
+#include "fileindex/queue_mgr.h"
+#include "kavo/local/shares.h"
+
+namespace {
+
+using vexlo::fileindex::Folder;
+using vexlo::fileindex::FolderMgr;
+using vexlo::fileindex::QueueMgr;
+
+constexpr size_t kPaths = 4096;
+
+// What stands before every fixed path here.
+const std::string& OwnRoot() {
+  static const std::string root = [] {
+    std::string path = std::filesystem::temp_directory_path() / "question_bench.XXXXXX";
+    if (mkdtemp(path.data()) == nullptr) {
+      std::perror(path.c_str());
+      std::exit(1);
+    }
+    return path;
+  }();
+  return root;
+}
+
+}  // namespace
+
+// In the place of the library's and the platform's own.
+namespace vexlo::fileindex {
+__attribute__((visibility("default"))) const std::string& GetFileIndexRoot() { return OwnRoot(); }
+}  // namespace vexlo::fileindex
+namespace kavo::local {
+__attribute__((visibility("default"))) const std::string& Root() { return OwnRoot(); }
+}  // namespace kavo::local
+
+namespace {
+
+void MakeShare() {
+  std::filesystem::create_directories(OwnRoot() + "/etc/kavo");
+  std::ofstream(kavo::local::SharesFile())
+      << R"({"shares": [{"name": "photo", "path": "/volume1/photo"}]})";
+  std::filesystem::create_directories(OwnRoot() + "/var/packages/Vexlo/etc");
+}
+
+// Folders at three depths, as an administrator would have them.
+std::string FolderName(size_t i) {
+  const std::string year = "/" + std::to_string(1900 + i % 120);
+  const std::string album = "/album " + std::to_string(i / 3);
+  return "/photo" + (i % 3 == 0 ? album : year + album + (i % 3 == 1 ? "" : "/selected"));
+}
+
+struct Asked {
+  explicit Asked(size_t count) {
+    Json::Value folders(Json::arrayValue);
+    for (size_t i = 0; i < count; ++i) {
+      Json::Value folder;
+      folder["path"] = FolderName(i);
+      folder["name"] = std::to_string(i);
+      for (const char* const type : {"document", "audio", "video", "photo"}) {
+        folder[type] = true;
+      }
+      folders.append(folder);
+    }
+    vexlo::JsonToFile(folders, vexlo::fileindex::kFileIndexFoldersCfgPath.Get());
+    manager = std::make_unique<FolderMgr>();
+    std::mt19937_64 random(count);
+    paths.reserve(kPaths);
+    for (size_t i = 0; i < kPaths; ++i) {
+      paths.push_back("/volume1" + FolderName(random() % count) + "/raw/IMG_" +
+                      std::to_string(random() % 100000) + ".JPG");
+    }
+  }
+
+  std::unique_ptr<FolderMgr> manager;
+  std::vector<std::string> paths;
+};
+
+// One iteration asks about all of the paths.
+template <typename Question>
+void AskAll(benchmark::State& state, size_t count, bool want, const Question& question) {
+  const Asked asked(count);
+  for (const std::string& path : asked.paths) {
+    if ((question(*asked.manager, path) != nullptr) != want) {
+      state.SkipWithError("the answer is wrong");
+      return;
+    }
+  }
+  for (auto _ : state) {
+    for (const std::string& path : asked.paths) {
+      benchmark::DoNotOptimize(question(*asked.manager, path));
+    }
+  }
+}
+
+const Folder* Covering(const FolderMgr& manager, const std::string& path) {
+  return manager.GetMostSuitableCfg(path).get();
+}
+
+const FolderMgr* Own(const FolderMgr& manager, const std::string& path) {
+  return manager.IsFullPathHasOwnCfg(path) ? &manager : nullptr;
+}
+
+const Folder* Linear(const FolderMgr& manager, const std::string& path) {
+  const Folder* best = nullptr;
+  size_t length = 0;
+  for (const std::shared_ptr<Folder>& folder : manager.GetFolders()) {
+    const std::string full_path = folder->GetFullPath();
+    if (full_path.size() > length && vexlo::IsSameOrBelow(path, full_path)) {
+      best = folder.get();
+      length = full_path.size();
+    }
+  }
+  return best;
+}
+
+void MakeQueue(const std::string& path, int64_t lines) {
+  std::ofstream file(path);
+  std::mt19937_64 random(2);
+  for (int64_t i = 0; i < lines; ++i) {
+    const uint64_t name = random() % 1'000'003;
+    file << R"({"event":)" << (random() % 2 == 0 ? 8 : 4)
+         << R"(,"is_dir":false,"path":"/volume1/photo/album)" << name % 97 << "/2019-"
+         << name % 12 + 1 << "/IMG_" << name << R"(.JPG","path_old":"","data":null})"
+         << "\n";
+  }
+}
+
+template <typename Question>
+void AskQueue(benchmark::State& state, const std::string& path, Question question) {
+  for (auto _ : state) {
+    if ((QueueMgr(path).*question)("/volume1/photo/album98")) {
+      state.SkipWithError("the answer is wrong");
+      return;
+    }
+  }
+}
+
+void PassWithSimdjson(benchmark::State& state, const std::string& path) {
+  for (auto _ : state) {
+    const simdjson::padded_string text = simdjson::padded_string::load(path);
+    simdjson::ondemand::parser parser;
+    simdjson::ondemand::document_stream lines = parser.iterate_many(text);
+    uint64_t sum = 0;
+    for (auto line : lines) {
+      sum += line["event"].get_uint64().value();
+      sum += line["path"].get_string().value().size();
+    }
+    benchmark::DoNotOptimize(sum);
+  }
+}
+
+// Keeps the fastest repetition of each run, by name.
+class Figures : public benchmark::ConsoleReporter {
+ public:
+  void ReportRuns(const std::vector<Run>& runs) override {
+    for (const Run& run : runs) {
+      failed_ = failed_ || run.error_occurred;
+      if (run.run_type == Run::RT_Iteration && !run.error_occurred) {
+        const double seconds = run.real_accumulated_time / static_cast<double>(run.iterations);
+        auto [at, added] = seconds_.try_emplace(run.run_name.function_name, seconds);
+        at->second = std::min(at->second, seconds);
+      }
+    }
+    ConsoleReporter::ReportRuns(runs);
+  }
+
+  bool Print() const {
+    std::printf("\n%-16s %14s %26s\n", "", "ns a question", "times that of 10 folders");
+    for (const auto& [name, seconds] : seconds_) {
+      const size_t slash = name.find('/');
+      if (slash != std::string::npos) {
+        const double base = Seconds(name.substr(0, slash) + "/10");
+        std::printf("%-16s %14.0f %26.2f\n", name.c_str(), seconds * 1e9 / kPaths, seconds / base);
+      }
+    }
+    std::printf("\n%-16s %14s %26s\n", "", "ms a question", "times simdjson's pass");
+    for (const char* const name : {"reindex", "processing", "simdjson"}) {
+      std::printf("%-16s %14.1f %26.2f\n", name, Seconds(name) * 1e3,
+                  Seconds(name) / Seconds("simdjson"));
+    }
+    return !failed_;
+  }
+
+ private:
+  // 0 for what was not run.
+  double Seconds(const std::string& name) const {
+    const auto found = seconds_.find(name);
+    return found == seconds_.end() ? 0 : found->second;
+  }
+
+  std::map<std::string, double> seconds_;
+  bool failed_ = false;
+};
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  const bool quick = argc > 1 && std::string_view(argv[1]) == "--quick";
+  if (quick) {
+    --argc;
+    std::rotate(argv + 1, argv + 2, argv + argc + 1);
+  }
+  MakeShare();
+  const std::string queue = OwnRoot() + "/queue";
+  MakeQueue(queue, quick ? 10'000 : 1'000'000);
+  const auto add = [quick](const std::string& name, auto run) {
+    benchmark::RegisterBenchmark(name.c_str(), run)
+        ->MinTime(quick ? 0.01 : 0.3)
+        ->Repetitions(quick ? 1 : 5);
+  };
+  for (const size_t count : {10, 1000, 10000}) {
+    const std::string suffix = "/" + std::to_string(count);
+    add("folders" + suffix, [=](benchmark::State& state) { AskAll(state, count, true, Covering); });
+    add("own" + suffix, [=](benchmark::State& state) { AskAll(state, count, false, Own); });
+    if (count <= 1000) {
+      add("linear" + suffix, [=](benchmark::State& state) { AskAll(state, count, true, Linear); });
+    }
+  }
+  add("reindex",
+      [&](benchmark::State& state) { AskQueue(state, queue, &QueueMgr::IsFullPathHasReindex); });
+  add("processing",
+      [&](benchmark::State& state) { AskQueue(state, queue, &QueueMgr::IsFullPathProcessing); });
+  add("simdjson", [&](benchmark::State& state) { PassWithSimdjson(state, queue); });
+  benchmark::Initialize(&argc, argv);
+  const bool usable = !benchmark::ReportUnrecognizedArguments(argc, argv);
+  Figures figures;
+  if (usable) {
+    benchmark::RunSpecifiedBenchmarks(&figures);
+  }
+  std::filesystem::remove_all(OwnRoot());
+  return usable ? (figures.Print() ? 0 : 1) : 2;
+}

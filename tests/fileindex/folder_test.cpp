@@ -1,0 +1,374 @@
+// The folders file, its records, and which of them a path goes by.
+#include "fileindex/folder_mgr.h"
+
+#include <sys/wait.h>
+
+#include <random>
+
+#include "common/error.h"
+#include "common/json.h"
+#include "common/sdk/share.h"
+#include "fileindex/util/path_index.h"
+#include "support/faults.h"
+#include "support/private_root.h"
+
+using std::to_string;
+using vexlo::JsonFromString;
+using vexlo::fileindex::Folder;
+using vexlo::fileindex::FolderMgr;
+using vexlo::fileindex::PathIndex;
+
+namespace {
+
+const PrivateRoot kRoot;
+const std::string kFolder = kRoot.MakeFolder("var/packages/Vexlo/etc");
+const std::string kFile = kFolder + "/fileindex.folders";
+const std::string kStatusFile = kFolder + "/fileindex.status";
+int steps_left = 0;  // Until a step of a save fails, or ends the process. 0: none does.
+bool fatal = false;
+
+bool Stops() {
+  const bool stops = steps_left > 0 && --steps_left == 0;
+  if (stops && fatal) {
+    _exit(9);
+  }
+  errno = stops ? ENOSPC : errno;
+  return stops;
+}
+
+}  // namespace
+
+#define STEP(result, name, parameters, arguments)                     \
+  INTERPOSED result name parameters {                                 \
+    static const auto real = REAL_FUNCTION(result, name, parameters); \
+    return Stops() ? -1 : real arguments;                             \
+  }
+STEP(ssize_t, write, (int fd, const void* data, size_t size), (fd, data, size))
+STEP(int, fsync, (int fd), (fd))
+STEP(int, rename, (const char* from, const char* to), (from, to))
+STEP(int, chmod, (const char* path, mode_t mode), (path, mode))
+INTERPOSED time_t time(time_t* /*copy*/) { return 1000; }
+
+namespace {
+
+using FolderPtr = std::shared_ptr<Folder>;
+
+// JSON with ' for ".
+Json::Value Parsed(std::string text) {
+  std::replace(text.begin(), text.end(), '\'', '"');
+  Json::Value value;
+  EXPECT_TRUE(JsonFromString(value, text)) << text;
+  return value;
+}
+
+// `types` as "davp", less those that are off; `more` as "'group': 'x'".
+Json::Value Data(const std::string& path, const std::string& types = "davp",
+                 const std::string& more = "") {
+  Json::Value data = Parsed("{" + more + "}");
+  data["path"] = path;
+  data["name"] = data.get("name", "N");
+  for (const std::string type : {"document", "audio", "video", "photo"}) {
+    data[type] = types.find(type[0]) != std::string::npos;
+  }
+  return data;
+}
+
+FolderPtr Make(const std::string& path, const std::string& types = "davp",
+               const std::string& more = "") {
+  return std::make_shared<Folder>(Data(path, types, more));
+}
+
+// "PATH:TYPES", or "none".
+std::string Told(const FolderPtr& folder) {
+  if (folder == nullptr) {
+    return "none";
+  }
+  EXPECT_EQ(folder->GetName(), "N");
+  return folder->GetPath() + ":" + (folder->IsDocument() ? "d" : "") +
+         (folder->IsAudio() ? "a" : "") + (folder->IsVideo() ? "v" : "") +
+         (folder->IsPhoto() ? "p" : "");
+}
+
+std::string Paths(const std::vector<FolderPtr>& folders) {
+  std::string paths;
+  for (const FolderPtr& folder : folders) {
+    paths += folder->GetPath() + " ";
+  }
+  return paths;
+}
+
+// "CODE REASON" of the Error, or "".
+template <typename Act>
+std::string Caught(Act act) {
+  try {
+    return act(), "";
+  } catch (const vexlo::Error& error) {
+    return to_string(error.GetErrorCode()) + " " + error.what();
+  }
+}
+
+void SetShares() {
+  kRoot.MakeFolder("tmp");
+  kRoot.SetShares(R"({"name": "p", "path": ")" + kRoot.MakeFolder("v1/p") +
+                  R"("}, {"name": "m", "path": ")" + kRoot.MakeFolder("v1/m") + "\"}");
+}
+
+FolderMgr Loaded(const std::vector<Json::Value>& records) {
+  Json::Value folders(Json::arrayValue);
+  for (const Json::Value& record : records) {
+    folders.append(record);
+  }
+  WriteText(kFile, vexlo::JsonToString(folders));
+  return {};
+}
+
+TEST(FolderMgr, LoadsAllOfTheFileOrNothing) {
+  const std::string record = "{'path':'/p','name':'','document':1,'audio':0,'video':true,";
+  const std::string whole = record + "'photo':false";
+  struct Row {
+    const char* name;
+    std::string text, want;
+  };
+  for (const Row& row : {
+           Row{"Empty", "[]", ""},
+           Row{"Null", "null", ""},
+           Row{"LeastRecord", "[" + whole + "}]", "/p "},
+           Row{"OptionalOfAnotherType", "[" + whole + ",'owner':{}}]", "/p "},
+           Row{"AnotherAll", "[" + whole + ",'group':'All'}]", "/p "},
+           Row{"Object", "{}", "504 Cannot load json: " + kFile},
+           Row{"Torn", "[" + whole, "504 Cannot load json: " + kFile},
+           Row{"NoPhoto", "[" + whole + "}," + record + "'x':1}]", "120 Missing property: photo"},
+           Row{"NoObject", "[[]]", "120 Not an object"},
+           Row{"Reserved", "[" + whole + ",'group':'all'}]", "120 \"all\" is reserved group name"},
+       }) {
+    SCOPED_TRACE(row.name);
+    std::string text = row.text, got;
+    std::replace(text.begin(), text.end(), '\'', '"');
+    WriteText(kFile, text);
+    const std::string error = Caught([&] { got = Paths(FolderMgr().GetFolders()); });
+    EXPECT_EQ(error.empty() ? got : error.substr(0, row.want.size()), row.want) << error;
+  }
+  unlink(kFile.c_str());
+  EXPECT_TRUE(FolderMgr().GetFolders().empty());
+}
+
+TEST(FolderMgr, GivesBackWhatWasSavedWhateverFailsInBetween) {
+  const FolderMgr old = Loaded({Data("/p/\xE9", "dv",
+                                     "'owner':'o','group':'g','paused':true,"
+                                     "'privileged':true,'volume_to_be_clean':'/v'")});
+  const Json::Value record = old.GetFolders()[0]->GetData();
+  EXPECT_EQ(record["owner"].asString() + record["group"].asString(), "og");
+  EXPECT_EQ(record.size(), 11U);
+  old.Save();
+  const std::string before = ReadText(kFile);
+  FolderMgr changed;
+  EXPECT_EQ(changed.GetFolders()[0]->GetData(), record);
+  changed.DeleteByShare("p");
+  bool finished = false;
+  for (int step = 1; !finished; ++step) {
+    SCOPED_TRACE(step);
+    WriteText(kFile, before);
+    const pid_t child = fork();
+    steps_left = step;
+    fatal = child == 0;
+    const std::string error = Caught([&] { changed.Save(); });
+    finished = steps_left > 0;
+    steps_left = 0;
+    if (child == 0) {
+      _exit(0);
+    }
+    const std::string failed = ReadText(kFile);
+    EXPECT_TRUE(failed == before || FolderMgr().GetFolders().empty());
+    EXPECT_TRUE(finished ? error.empty() : error == "505 " + kFile || error == "502 " + kFile)
+        << error;
+    int status = 0;
+    waitpid(child, &status, 0);
+    EXPECT_EQ(WEXITSTATUS(status), finished ? 0 : 9);
+    EXPECT_LE(FolderMgr().GetFolders().size(), 1U);
+  }
+  EXPECT_EQ(std::filesystem::status(kFile).permissions(), std::filesystem::perms{0644});
+}
+
+TEST(FolderMgr, TellsWhatAChangeMeansForAPath) {
+  SetShares();
+  struct Row {
+    const char* name;
+    FolderPtr upsert;
+    std::string erase, want_diff, want_paths;
+  };
+  const std::string rest = "/p /p/a ";
+  for (const Row& row : {
+           Row{"NothingCovered", Make("/m"), "", "/m:davp", rest + "/m "},
+           Row{"Same", Make("/p", "dv"), "", "/p:", "/p/a /p "},
+           Row{"Changed", Make("/p/a", "dp", "'group':'g','owner':'o'"), "", "/p/a:dap", rest},
+           Row{"CoveredBefore", Make("/p/ab", "d"), "", "/p/ab:v", rest + "/p/ab "},
+           Row{"DeletesTheInner", nullptr, "/p/a", "/p/a:dav", "/p "},
+           Row{"DeletesTheOuter", nullptr, "/p", "/p:davp", "/p/a "},
+           Row{"DeletesNoFolderOfACoveredPath", nullptr, "/p/x", "/p:", rest},
+           Row{"DeletesNoFolder", nullptr, "/m", "none", rest},
+           Row{"UnknownShare", nullptr, "/gone/x", "800", rest},
+           Row{"UnknownShareAdded", Make("/gone"), "", "800", rest},
+       }) {
+    SCOPED_TRACE(row.name);
+    FolderMgr manager = Loaded({Data("/p", "dv"), Data("/p/a", "a")});
+    FolderPtr diff;
+    const std::string error = Caught([&] {
+      row.upsert == nullptr ? manager.Delete(diff, row.erase) : manager.Upsert(diff, row.upsert);
+    });
+    EXPECT_EQ(error.empty() ? Told(diff) : error.substr(0, 3), row.want_diff);
+    EXPECT_TRUE(diff == nullptr || (diff->GetGroup() + diff->GetOwner()).empty());
+    EXPECT_EQ(Paths(manager.GetFolders()), row.want_paths);
+  }
+}
+
+TEST(FolderMgr, AnswersByTheDeepestFolderThatCovers) {
+  SetShares();
+  const std::string volume = kRoot / "v1";
+  FolderMgr manager = Loaded({Data("/p/a", "d"), Data("/p", "p", "'group':'g'"), Data("/p/a", "")});
+  for (const auto& [path, want] : std::map<std::string, std::string>{
+           {"/p/a/b/x.pdf", "/p/a:d meta"},
+           {"/p/a/x.jpg", "/p/a:d"},
+           {"/p/a/x.unknown", "/p/a:d meta"},
+           {"/p/ab.jpg", "/p:p meta"},
+           {"/p", "/p:p own"},
+           {"/m/x.jpg", "none"},
+       }) {
+    EXPECT_EQ(Told(manager.GetMostSuitableCfg(volume + path)) +
+                  (manager.IsFullPathNeedMeta(volume + path) ? " meta" : "") +
+                  (manager.IsFullPathHasOwnCfg(volume + path) ? " own" : ""),
+              want);
+    EXPECT_EQ(manager.IsFullPathIndexed(volume + path), want != "none");
+  }
+  EXPECT_EQ(manager.GetIndexedShares(), std::set<std::string>{"p"});
+  EXPECT_EQ(manager.GetGroups(), std::set<std::string>{"g"});
+  EXPECT_TRUE(manager.IsShareIndexed("p") && !manager.IsShareIndexed("P"));
+  FolderPtr found;
+  manager.Get(found, "/p");
+  EXPECT_EQ(found->GetFullPath(), volume + "/p");
+  found->SetShare("m");
+  EXPECT_EQ(found->GetPath() + found->GetShare() + found->GetFullPath(), "/mm" + volume + "/p");
+  EXPECT_EQ(Caught([&] { manager.Get(found, "/p"); }), "902 /p");
+  // A folder of a share that is gone stops the questions, and can be removed.
+  FolderMgr broken = Loaded({Data("/gone"), Data("/p")});
+  EXPECT_EQ(Caught([&] { broken.IsFullPathIndexed(volume); }).substr(0, 3), "800");
+  broken.DeleteByShare("gone");
+  EXPECT_TRUE(broken.IsFullPathIndexed(volume + "/p"));
+}
+
+TEST(PathIndex, AgreesWithAPassOverAllPaths) {
+  std::mt19937 random(1);
+  const auto component = [&random] { return std::string(random() % 3, 'x') + "ab"[random() % 2]; };
+  const auto make = [&](size_t most) {
+    std::string path;
+    for (size_t left = random() % (most + 1); left > 0; --left) {
+      path += "/" + component();
+    }
+    return path;
+  };
+  for (int round = 0; round < 300; ++round) {
+    const size_t most = round % 10 == 0 ? 70 : 4;
+    std::vector<std::string> paths(random() % 20);
+    std::generate(paths.begin(), paths.end(), [&] { return make(most); });
+    const PathIndex index(paths);
+    for (int question = 0; question < 50; ++question) {
+      std::string path = make(most + 2);
+      path += !paths.empty() && random() % 2 == 0 ? "" : paths.empty() ? "/" : paths[0] + path;
+      size_t covering = PathIndex::kNone, exact = PathIndex::kNone;
+      for (size_t i = paths.size(); i-- > 0;) {
+        exact = paths[i] == path ? i : exact;
+        if ((path + "/").starts_with(paths[i] + "/") &&
+            (covering == PathIndex::kNone || paths[i].size() >= paths[covering].size())) {
+          covering = i;
+        }
+      }
+      ASSERT_EQ(index.FindCovering(path), covering) << path;
+      ASSERT_EQ(index.FindExactly(path), exact) << path;
+    }
+  }
+}
+
+TEST(FolderMgr, ListsAPage) {
+  const FolderMgr manager = Loaded({Data("/p/b", "", "'name':'Z','group':'g','owner':'2'"),
+                                    Data("/p/A", "", "'name':'b','owner':'1'"),
+                                    Data("/p/c", "", "'name':'b','group':'g','owner':'1'")});
+  struct Row {
+    const char* name;
+    unsigned long offset, limit;
+    std::string sort_by, direction, group, keyword, want;
+    size_t want_total;
+  };
+  const unsigned long most = ~0UL;
+  for (const Row& row : {
+           Row{"All", 0, 0, "", "", "", "", "/p/b /p/A /p/c ", 3},
+           Row{"EndsKeepTheOrder", 0, 0, "owner", "ASC", "all", "", "/p/A /p/c /p/b ", 3},
+           Row{"ByBytes", 0, 0, "name", "", "", "", "/p/b /p/A /p/c ", 3},
+           Row{"Descending", 0, 0, "name", "dEsC", "", "", "/p/A /p/c /p/b ", 3},
+           Row{"UnsortedDescending", 0, 0, "", "DESC", "", "", "/p/b /p/A /p/c ", 3},
+           Row{"Group", 0, 0, "path", "DESC", "g", "", "/p/c /p/b ", 2},
+           Row{"KeywordInName", 0, 0, "", "", "", "z", "/p/b ", 1},
+           Row{"KeywordInPath", 0, 0, "", "", "", "/a", "/p/A ", 1},
+           Row{"Both", 0, 0, "", "", "g", "/a", "", 0},
+           Row{"Page", 1, 1, "path", "", "", "", "/p/b ", 3},
+           Row{"Beyond", 3, 1, "", "", "", "", "", 3},
+           Row{"NoOverflow", 1, most, "", "", "", "", "/p/A /p/c ", 3},
+           Row{"FarBeyond", most, most, "", "", "", "", "", 3},
+           Row{"UnknownField", 0, 0, "size", "", "", "", "120 Unknown sort_by: size", 0},
+           Row{"UnknownDirection", 0, 0, "", "up", "", "", "120 Unknown sort_direction: up", 0},
+       }) {
+    SCOPED_TRACE(row.name);
+    std::vector<FolderPtr> page;
+    size_t total = 0;
+    const std::string error = Caught([&] {
+      manager.List(page, total, row.offset, row.limit, row.sort_by, row.direction, row.group,
+                   row.keyword);
+    });
+    EXPECT_EQ(error.empty() ? Paths(page) : error, row.want);
+    EXPECT_EQ(total, row.want_total);
+  }
+}
+
+TEST(Folder, TellsHowItsIndexingStands) {
+  SetShares();
+  unlink(kFile.c_str());
+  kRoot.MakeFolder("var/lib/kavo/fileindex/queue");
+  kRoot.MakeFolder("v1/p/b");
+  const std::string queue = vexlo::sdk::SDKShare("p").GetQueuePath();
+  const std::string event = R"({"event":8,"path":")" + kRoot / "v1/p/a" + R"("})";
+  struct Row {
+    const char* name;
+    std::string path, status, queue, want;
+  };
+  for (const Row& row : {
+           Row{"Unpaused", "/p", "{}", event, "{'text':'processing'}"},
+           Row{"Elsewhere", "/p/b", "{}", event, "{'text':'finished'}"},
+           Row{"Paused", "/p", "{'resume_time':1001}", event, "{'text':'paused'}"},
+           Row{"PausedForGood", "/p", "{'resume_time':0}", event, "{'text':'paused'}"},
+           Row{"PauseRanOut", "/p", "{'resume_time':1000}", event, "{'text':'processing'}"},
+           Row{"PausedIdle", "/p", "{'resume_time':0}", "", "{'text':'finished'}"},
+           Row{"NeedsReindex", "/p", "{'share':{'p':3}}", event, "{'text':'need_reindex'}"},
+           Row{"OtherBit", "/p", "{'share':{'p':2}}", event, "{'text':'processing'}"},
+           Row{"InvalidPath", "/p/@eaDir", "{'share':{'p':1}}", event,
+               "{'text':'error','desc':'invalid_path'}"},
+       }) {
+    SCOPED_TRACE(row.name);
+    WriteText(kStatusFile, vexlo::JsonToString(Parsed(row.status)));
+    WriteText(queue, row.queue);
+    Json::Value status;
+    Make(row.path)->GetStatus(status);
+    EXPECT_EQ(status, Parsed(row.want));
+  }
+  const FolderPtr folder = Make("/p");
+  EXPECT_EQ(folder->GetDataWithAdditional(Parsed("[]")), folder->GetData());
+  const Json::Value data = folder->GetDataWithAdditional(Parsed("['status','status']"));
+  EXPECT_EQ(data["additional"], Parsed("{'status':{'text':'need_reindex'}}"));
+  for (const auto& [additional, want] : std::map<std::string, std::string>{
+           {"null", "120 null"},
+           {"['status',1]", "120 1"},
+           {"['size']", "120 Unknown additioal: size"},
+       }) {
+    const std::string error = Caught([&] { folder->GetDataWithAdditional(Parsed(additional)); });
+    EXPECT_EQ(error.substr(0, want.size()), want);
+  }
+}
+
+}  // namespace

@@ -62,8 +62,10 @@ struct Command {
 };
 
 // One a command family.
+std::vector<Command> ConfigCommands();
 std::vector<Command> ExplainCommands();
 std::vector<Command> IndexCommands();
+std::vector<Command> PauseCommands();
 std::vector<Command> QueueCommands();
 std::vector<Command> SearchCommands();
 std::vector<Command> ShareCommands();

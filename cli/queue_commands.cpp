@@ -1,15 +1,25 @@
 // "fileindex queue ...": what stands in a queue file.
+#include <algorithm>
 #include <cstdint>
 #include <functional>
+#include <iterator>
 
 #include "cli/command.h"
 #include "cli/operation_writer.h"
 #include "cli/progress.h"
+#include "cli/service.h"
+#include "cli/shares.h"
 #include "cli/text.h"
 #include "common/error.h"
 #include "common/file.h"
+#include "common/json.h"
+#include "common/sdk/share.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/optree/event.h"
 #include "fileindex/optree/optree.h"
 #include "fileindex/queue_mgr.h"
+#include "fileindex/util/custom_event.h"
+#include "fileindex/util/share_path.h"
 
 namespace vexlo::cli {
 namespace {
@@ -67,12 +77,93 @@ ExitStatus Ask(const Arguments& arguments, const Console& console,
 }
 
 ExitStatus IsPending(const Arguments& arguments, const Console& console) {
+  try {
+    const fileindex::FolderMgr folders;  // The question loads it too; its own error tells less.
+  } catch (const Error& error) {
+    throw Failure("the list of folders cannot be loaded: " + CauseOf(error.what()) +
+                  "; 'fileindex config check' says more");
+  }
   return Ask(arguments, console, &QueueMgr::IsFullPathProcessing, "pending: ", "not pending: ");
 }
 
 ExitStatus HasReindex(const Arguments& arguments, const Console& console) {
   return Ask(arguments, console, &QueueMgr::IsFullPathHasReindex,
              "reindex pending: ", "no reindex pending: ");
+}
+
+struct EventName {
+  const char* name;
+  int event;
+};
+const EventName kEventNames[] = {
+    {"attrib", fileindex::EV_ATTRIB},   {"write", fileindex::EV_CLOSE_WRITE},
+    {"create", fileindex::EV_CREATE},   {"delete", fileindex::EV_DELETE},
+    {"rename", fileindex::EV_RENAME},   {"crashed", fileindex::EV_QUEUE_CRASHED},
+    {"reindex", fileindex::EV_REINDEX}, {"update-directory", fileindex::EV_UPDATE_DIRECTORY},
+};
+
+const EventName& ReadEvent(const std::string& name) {
+  const auto* const known =
+      std::find_if(std::begin(kEventNames), std::end(kEventNames),
+                   [&](const EventName& event) { return name == event.name; });
+  if (known == std::end(kEventNames)) {
+    std::string names;
+    for (const EventName& event : kEventNames) {
+      names.append(names.empty() ? "" : ", ").append(event.name);
+    }
+    throw UsageError("there is no event '" + name + "'; there are " + names);
+  }
+  return *known;
+}
+
+// The library adds nothing in these cases, and does not say so; a person wants to know.
+std::string WhyNothingIsAdded(const sdk::SDKShare& share, const std::string& path) {
+  if (!share.CanBeIndexed()) {
+    return "the share '" + share.GetName() + "' cannot be indexed at present";
+  }
+  if (QueueMgr(share.GetQueuePath()).IsFullPathHasReindex(path)) {
+    return "a reindex that covers the path is queued already";
+  }
+  return "";
+}
+
+ExitStatus AddEvent(const Arguments& arguments, const Console& console) {
+  const EventName& event = ReadEvent(arguments.positional[0]);
+  const std::string path = AbsolutePath(arguments.positional[1]);
+  if (arguments.Has("--old") != (event.event == fileindex::EV_RENAME)) {
+    throw UsageError("'rename' wants the option --old PATH, and nothing else takes it");
+  }
+  const std::string path_old = arguments.Has("--old") ? AbsolutePath(arguments.Get("--old")) : "";
+  Json::Value data;
+  if (arguments.Has("--data")) {
+    const std::string fault = JsonFault(arguments.Get("--data"));
+    if (!fault.empty()) {
+      throw UsageError("the value of --data is no JSON: " + fault);
+    }
+    JsonFromString(data, arguments.Get("--data"));
+  }
+  CheckSharesFile();
+  std::string share_name;
+  std::string share_dir;
+  try {
+    fileindex::GetShareNamePathByFullPath(share_name, share_dir, path);
+  } catch (const Error&) {
+    throw Failure("no share holds '" + ForTerminal(path) + "'");
+  }
+  const sdk::SDKShare share(share_name);
+  const std::string why_nothing = WhyNothingIsAdded(share, path);
+  if (!why_nothing.empty()) {
+    console.err << "nothing added: " << ForTerminal(why_nothing) << "\n";
+    return kNothingFound;
+  }
+  fileindex::AddCustomEvent(event.event, path, path_old, data);
+  console.out << "added to " << ForTerminal(share.GetQueuePath()) << ": " << event.name << " "
+              << (path_old.empty() ? "" : ForTerminal(path_old) + " -> ") << ForTerminal(path)
+              << "\n";
+  if (!IsIndexDaemonRunning()) {
+    console.err << NoIndexDaemon() << "; the event waits in the queue until it does\n";
+  }
+  return kDone;
 }
 
 const Option kQueueOption = {"--queue", "FILE", "the queue; its snapshot FILE.tmp is read too"};
@@ -106,6 +197,24 @@ std::vector<Command> QueueCommands() {
        1,
        1,
        ShowQueue},
+      {"queue add",
+       "EVENT PATH",
+       "queues an event for a path, as if it had just happened",
+       "Appends one line to the queue of the share that holds PATH. EVENT is one of attrib, "
+       "write,\n"
+       "create, delete, rename (with --old), crashed, reindex and update-directory (with --data:\n"
+       "which groups of files to index again). Nothing is added, and the exit status is 1, while\n"
+       "the share cannot be indexed or a reindex that covers PATH is queued.\n"
+       "\n"
+       "  fileindex queue add reindex /volume1/photo/2019\n"
+       "  fileindex queue add rename /volume1/photo/new --old /volume1/photo/old\n"
+       "  fileindex queue add update-directory /volume1/photo --data '{\"photo\": true}'\n",
+       {{"--old", "PATH", "the path before a rename"},
+        {"--data", "JSON", "the event's payload; null without it"}},
+       {},
+       2,
+       2,
+       AddEvent},
       {"queue pending",
        "PATH",
        "asks whether events wait for a path or below it",

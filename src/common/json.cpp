@@ -4,6 +4,7 @@
 #include <json/writer.h>
 
 #include <algorithm>
+#include <cstdio>
 #include <deque>
 #include <memory>
 #include <ostream>
@@ -101,6 +102,26 @@ bool JsonFromString(Json::Value& value, std::string_view text) {
   } catch (const Json::Exception&) {
     return false;  // Nested too deep.
   }
+}
+
+std::string JsonFault(std::string_view text) {
+  Json::Value value;
+  std::string errors;
+  try {
+    if (Reader().parse(text.data(), text.data() + text.size(), &value, &errors)) {
+      return "";
+    }
+  } catch (const Json::Exception& error) {
+    return error.what();
+  }
+  // The first of several faults, as "* Line 3, Column 9\n  Missing ...\n".
+  unsigned line = 0;
+  unsigned column = 0;
+  int what_from = 0;
+  sscanf(errors.c_str(), "* Line %u, Column %u %n", &line, &column, &what_from);
+  std::string what = errors.substr(static_cast<size_t>(what_from));
+  what.resize(std::min(what.find('\n'), what.size()));
+  return "line " + std::to_string(line) + ", column " + std::to_string(column) + ": " + what;
 }
 
 bool JsonFromFile(Json::Value& value, const std::string& path) {

@@ -51,11 +51,28 @@ const CliCase kCases[] = {
     {"ExplainYes", "explain vol/photo/a.JPG", 0, "*type: photo\nshare: photo (", ""},
     {"ExplainNo", "explain --json vol/photo/.git", 1, "*{\"can_be_indexed\":false,", ""},
     {"ExplainNoShare", "explain vol", 1, "*share: none holds the path\n", ""},
+    {"AddEvent", "queue add reindex vol/photo/", 0, "*: reindex /", "fileindexd does not run"},
+    {"AddCovered", "queue add write vol/photo/a.JPG", 1, "", "a reindex that covers"},
+    {"AddRename", "queue add rename films/a --old films/b --data 1", 0, "*films/b -> /", ""},
+    {"AddWithoutOld", "queue add rename vol/photo", 2, "", "wants the option --old"},
+    {"AddUnknown", "queue add modify vol/photo", 2, "", "no event 'modify'"},
+    {"AddBadData", "queue add write films --data {", 2, "", "no JSON: line 1, column 2"},
+    {"AddNoShare", "queue add write vol", 3, "", "no share holds '"},
+    {"PauseAlone", "pause", 3, "", "the status file says: paused until 'fileindex resume',"},
+    {"PauseBadHours", "pause 0", 2, "", "'0' is no number of hours"},
     {"RemoveShare", "share remove films", 0, "*removed: films", ""},
     {"RemoveShareTwice", "share remove films", 3, "", "films"},
 };
 
+// With faults in the folders file and the status file.
+const CliCase kBadConfigCases[] = {
+    {"Check", "config check", 1, "*folders: .[3]: 'photo' is no share path", "6 findings"},
+    {"CheckJson", "config check --json", 1, "*.status\",\"place\":\".share.photo\"", ""},
+    {"Pending", "queue pending /v --queue queue", 3, "", "'fileindex config check' says"},
+};
+
 const CliCase kBadSharesCases[] = {
+    {"CheckTorn", "config check", 1, "*folders: line 2, column 2: Missing", "0 folders"},
     {"BadShares", "share list", 3, "", "shares.json:2: "},
     {"ExplainBadShares", "explain vol/photo", 3, "", "shares.json:2: "},
 };
@@ -160,9 +177,22 @@ TEST_F(Cli, AnswersEveryCommandLine) {
   std::filesystem::create_directories(files_ / "films");
   std::filesystem::create_symlink("films", files_ / "link");
   WriteText(files_ / "vol/photo/a.JPG", "");
+  const std::string etc = files_ / "root/var/packages/Vexlo/etc";
+  for (const char* needed : {"", "/../../../../tmp", "/../../../lib/kavo/fileindex/queue"}) {
+    std::filesystem::create_directories(etc + needed);
+  }
   for (const CliCase& row : kCases) {
     Check(row);
   }
+  const std::string rest = R"(,"name":"","document":true,"audio":true,"video":true,"photo":true)";
+  WriteText(etc + "/fileindex.folders",
+            R"([{"path":"/photo")" + rest + R"(,"owner":{}},{"path":"/photo")" + rest +
+                R"(},{"path":"/gone")" + rest + R"(},{"path":"photo")" + rest + "},{}]");
+  WriteText(etc + "/fileindex.status", R"({"share": {"photo": "1"}})");
+  for (const CliCase& row : kBadConfigCases) {
+    Check(row);
+  }
+  WriteText(etc + "/fileindex.folders", "[\n{");
   WriteText(files_ / "root/etc/kavo/shares.json", "{\"shares\": [\n{\"name\": \"a\"}]}");
   for (const CliCase& row : kBadSharesCases) {
     Check(row);

@@ -19,6 +19,10 @@ namespace vexlo {
 // nesting over 1,000 levels make it malformed. False then, and `value` holds nothing of use.
 VEXLO_EXPORT bool JsonFromString(Json::Value& value, std::string_view text);
 
+// What is wrong with a malformed text, and where: "line 3, column 9: Missing ',' or '}' ...", on
+// one line. "" for a text that JsonFromString() takes.
+VEXLO_EXPORT std::string JsonFault(std::string_view text);
+
 // Parses a whole file; false when it cannot be read or is malformed.
 VEXLO_EXPORT bool JsonFromFile(Json::Value& value, const std::string& path);
 

@@ -113,11 +113,13 @@ RegisteredQueue ReadQueue(const Json::Value& value, int type) {
   const Json::Value& config = Member(value, kConfig);
   Require(config.isArray(), "\"config\" must be a list");
   queue.folders.reserve(config.size());
-  std::set<std::string> paths = {queue.queue};
+  std::set<std::string> paths;
   for (const Json::Value& folder : config) {
-    queue.folders.push_back(ReadFolder(folder));
-    Require(paths.insert(queue.folders.back().path).second,
-            "\"path\" must be another one than the queue and those before it");
+    MonitoredFolder monitored = ReadFolder(folder);
+    Require(monitored.path != queue.queue, "\"path\" must be another one than the queue");
+    if (paths.insert(monitored.path).second) {
+      queue.folders.push_back(std::move(monitored));
+    }
   }
   return queue;
 }
@@ -211,8 +213,8 @@ std::string Serialise(const std::vector<RegisteredQueue>& queues) {
   return out.str();
 }
 
-// Replaces the application's queues by what change(queues) makes of them, unless it returns false.
-// That false, or true, or false with a line in syslog.
+// Replaces the application's queues by what change(queues) makes of them, unless it returns false
+// because nothing is to be changed. False, with a line in syslog, when that fails.
 template <typename Change>
 bool Edit(const std::string& app, const Change& change) noexcept {
   try {
@@ -221,10 +223,9 @@ bool Edit(const std::string& app, const Change& change) noexcept {
     MakeFolders(FolderOf(file));
     const EditLock lock(file);
     std::vector<RegisteredQueue> queues = ReadFile(app, file);
-    if (!change(queues)) {
-      return false;
+    if (change(queues)) {
+      ReplaceWhole(file, Serialise(queues));
     }
-    ReplaceWhole(file, Serialise(queues));
     return true;
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "kavoplatform: the queues of application '%s' are not changed: %s", app.c_str(),

@@ -26,10 +26,11 @@ class MonitorQueue {
   //    "config": [{"path": "/volume1/photo", "mask": 65484, "ignore": ["@eaDir"]}]}
   //
   // "queue" is the queue file and "path" a folder to watch with all below it, both absolute and
-  // without ".", "..", doubled or trailing slashes; no "path" comes twice, none equals the queue.
-  // "mask" is a whole number of 32 bits: the event bits that are wanted. "ignore", which may be
-  // left out, lists names: what is called so, at any depth, is neither watched nor reported, so no
-  // component of "path" may be among them. Other members are not kept.
+  // without ".", "..", doubled or trailing slashes; no "path" equals the queue,
+  // and of equal ones the first holds. "mask" is a whole number of 32 bits: the event bits that are
+  // wanted. "ignore", which may be left out, lists names: what is called so, at any depth, is
+  // neither watched nor reported, so no component of "path" may be among them. Other members are
+  // not kept.
   explicit MonitorQueue(const Json::Value& description);
 
   // Registers the queue for an application, or replaces what it had registered under the same queue
@@ -42,8 +43,8 @@ class MonitorQueue {
   static bool Upsert(const MonitorQueue& queue, const std::string& app_name,
                      MonitorQueueType type) noexcept;
 
-  // Takes a registration back. False, without a line in syslog, when there is none of this path and
-  // type; false as above otherwise.
+  // Takes a registration back. True when there is none of this path and type afterwards, so that a
+  // caller who was interrupted can do it again; false as above otherwise.
   static bool Delete(const std::string& queue_path, const std::string& app_name,
                      MonitorQueueType type) noexcept;
 

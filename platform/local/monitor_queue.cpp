@@ -81,10 +81,6 @@ bool IsWhole(const Json::Value& value) {
   return value.type() == Json::intValue || value.type() == Json::uintValue;
 }
 
-bool HasComponent(const std::string& path, const std::string& name) {
-  return (path + "/").find("/" + name + "/") != std::string::npos;
-}
-
 MonitoredFolder ReadFolder(const Json::Value& value) {
   MonitoredFolder folder;
   folder.path = ReadPath(value, kPath);
@@ -99,8 +95,6 @@ MonitoredFolder ReadFolder(const Json::Value& value) {
                 name.asString().find_first_of(std::string("/\0", 2)) == std::string::npos,
             "\"ignore\" must list names, without \"/\" and NUL");
     folder.ignore.push_back(name.asString());
-    Require(!HasComponent(folder.path, folder.ignore.back()),
-            "\"path\" must not lie in what \"ignore\" names");
   }
   return folder;
 }

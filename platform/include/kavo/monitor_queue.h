@@ -28,9 +28,8 @@ class MonitorQueue {
   // "queue" is the queue file and "path" a folder to watch with all below it, both absolute and
   // without ".", "..", doubled or trailing slashes; no "path" equals the queue,
   // and of equal ones the first holds. "mask" is a whole number of 32 bits: the event bits that are
-  // wanted. "ignore", which may be left out, lists names: what is called so, at any depth, is
-  // neither watched nor reported, so no component of "path" may be among them. Other members are
-  // not kept.
+  // wanted. "ignore", which may be left out, lists names: what is called so, at any depth below
+  // "path", is neither watched nor reported. Other members are not kept.
   explicit MonitorQueue(const Json::Value& description);
 
   // Registers the queue for an application, or replaces what it had registered under the same queue

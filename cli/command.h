@@ -64,11 +64,13 @@ struct Command {
 // One a command family.
 std::vector<Command> ConfigCommands();
 std::vector<Command> ExplainCommands();
+std::vector<Command> FolderCommands();
 std::vector<Command> IndexCommands();
 std::vector<Command> PauseCommands();
 std::vector<Command> QueueCommands();
 std::vector<Command> SearchCommands();
 std::vector<Command> ShareCommands();
+std::vector<Command> StatusCommands();
 std::vector<Command> WatchCommands();
 
 // Finds the command, reads its arguments and runs it. `words` are the program's arguments without

@@ -4,7 +4,6 @@
 
 #include "cli/shares.h"
 #include "cli/text.h"
-#include "common/error.h"
 #include "fileindex/comm.h"
 #include "fileindex/paths.h"
 
@@ -18,29 +17,37 @@ namespace {
 
 }  // namespace
 
-void WithEngine(const std::function<void()>& work) {
+void RequireEngine() {
   if (access(fileindex::kElasticdSocketPath.Get().c_str(), F_OK) != 0) {
     FailWithoutEngine();
   }
+}
+
+void ExplainEngineError(const Error& error) {
+  const std::string reason = error.what();
+  if (error.GetErrorCode() == ERR_ELASTIC_REQUEST && reason == "Connect failed") {
+    FailWithoutEngine();
+  }
+  if (error.GetErrorCode() == ERR_SHARE_NOT_FOUND) {
+    CheckSharesFile();
+    throw Failure("there is no share '" + reason + "'; 'fileindex share list' lists them");
+  }
+  if (error.GetErrorCode() == ERR_DOC_NOT_FOUND) {
+    throw Failure("the path is not in the index");
+  }
+  constexpr std::string_view kPrefix = "Request failed, msg=";
+  if (reason.starts_with(kPrefix)) {
+    throw Failure("the search engine says: " + ForTerminal(reason.substr(kPrefix.size())) +
+                  " (error " + std::to_string(error.GetErrorCode()) + ")");
+  }
+}
+
+void WithEngine(const std::function<void()>& work) {
+  RequireEngine();
   try {
     work();
   } catch (const Error& error) {
-    const std::string reason = error.what();
-    if (error.GetErrorCode() == ERR_ELASTIC_REQUEST && reason == "Connect failed") {
-      FailWithoutEngine();
-    }
-    if (error.GetErrorCode() == ERR_SHARE_NOT_FOUND) {
-      CheckSharesFile();
-      throw Failure("there is no share '" + reason + "'; 'fileindex share list' lists them");
-    }
-    if (error.GetErrorCode() == ERR_DOC_NOT_FOUND) {
-      throw Failure("the path is not in the index");
-    }
-    constexpr std::string_view kPrefix = "Request failed, msg=";
-    if (reason.starts_with(kPrefix)) {
-      throw Failure("the search engine says: " + ForTerminal(reason.substr(kPrefix.size())) +
-                    " (error " + std::to_string(error.GetErrorCode()) + ")");
-    }
+    ExplainEngineError(error);
     throw;
   }
 }

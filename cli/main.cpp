@@ -12,7 +12,8 @@ int main(int argc, char** argv) {
   for (auto* const family :
        {vexlo::cli::WatchCommands, vexlo::cli::QueueCommands, vexlo::cli::ExplainCommands,
         vexlo::cli::ShareCommands, vexlo::cli::IndexCommands, vexlo::cli::SearchCommands,
-        vexlo::cli::PauseCommands, vexlo::cli::ConfigCommands}) {
+        vexlo::cli::PauseCommands, vexlo::cli::ConfigCommands, vexlo::cli::FolderCommands,
+        vexlo::cli::StatusCommands}) {
     const std::vector<Command> more = family();
     commands.insert(commands.end(), more.begin(), more.end());
   }

@@ -53,8 +53,7 @@ ExitStatus Change(const Console& console, Work change) {
     if (error.GetErrorCode() != ERR_SYSTEM || IsIndexDaemonRunning()) {
       throw;
     }
-    throw Failure(NoIndexDaemon() + "; the status file says: " + StateOnDisk() +
-                  ", and the daemon will go by it when it starts");
+    console.err << NoIndexDaemon() << "; it will go by the status file when it starts\n";
   }
   console.out << "indexing is " << StateOnDisk() << "\n";
   return kDone;
@@ -90,7 +89,7 @@ std::vector<Command> PauseCommands() {
       {"resume",
        "",
        "ends a pause",
-       "Ends a pause at once, saved before the daemon is told. Exit status as for 'pause'.\n"
+       "Ends a pause at once, also on disk.\n"
        "\n"
        "  fileindex resume\n",
        {},

@@ -1,5 +1,6 @@
 #include "cli/text.h"
 
+#include <algorithm>
 #include <filesystem>
 
 namespace vexlo::cli {
@@ -57,6 +58,29 @@ std::string AbsolutePath(const std::string& path) {
     absolute.pop_back();
   }
   return absolute;
+}
+
+std::string Table(const std::vector<std::vector<std::string>>& rows) {
+  const auto width = [](const std::string& text) {
+    return static_cast<size_t>(
+        std::count_if(text.begin(), text.end(), [](char c) { return (c & 0xC0) != 0x80; }));
+  };
+  std::vector<size_t> widths;
+  for (const std::vector<std::string>& row : rows) {
+    widths.resize(std::max(widths.size(), row.size()));
+    for (size_t i = 0; i < row.size(); ++i) {
+      widths[i] = std::max(widths[i], width(row[i]));
+    }
+  }
+  std::string table;
+  for (const std::vector<std::string>& row : rows) {
+    for (size_t i = 0; i < row.size(); ++i) {
+      table += row[i];
+      table.append(i + 1 < row.size() ? widths[i] + 2 - width(row[i]) : 0, ' ');
+    }
+    table += '\n';
+  }
+  return table;
 }
 
 }  // namespace vexlo::cli

@@ -27,6 +27,10 @@ std::string CauseOf(std::string_view reason);
 // text alone: nothing needs to exist.
 std::string AbsolutePath(const std::string& path);
 
+// Rows of cells as lines, the columns two spaces apart; the last cell of a row is not padded. Bytes
+// are counted but for those that continue a UTF-8 character.
+std::string Table(const std::vector<std::vector<std::string>>& rows);
+
 }  // namespace vexlo::cli
 
 #endif  // CLI_TEXT_H_

@@ -5,7 +5,9 @@
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
+#include <span>
 
+#include "support/program.h"
 #include "support/temp_folder.h"
 
 namespace {
@@ -58,7 +60,7 @@ const CliCase kCases[] = {
     {"AddUnknown", "queue add modify vol/photo", 2, "", "no event 'modify'"},
     {"AddBadData", "queue add write films --data {", 2, "", "no JSON: line 1, column 2"},
     {"AddNoShare", "queue add write vol", 3, "", "no share holds '"},
-    {"PauseAlone", "pause", 3, "", "the status file says: paused until 'fileindex resume',"},
+    {"PauseAlone", "pause", 0, "indexing is paused until 'fileindex resume'\n", "will go by"},
     {"PauseBadHours", "pause 0", 2, "", "'0' is no number of hours"},
     {"RemoveShare", "share remove films", 0, "*removed: films", ""},
     {"RemoveShareTwice", "share remove films", 3, "", "films"},
@@ -113,6 +115,51 @@ const CliCase kEngineCases[] = {
     {"ListNone", "index list", 1, "", ""},
 };
 
+// With the engine running, and a socket of the index daemon's that nobody listens on.
+const CliCase kFolderCases[] = {
+    {"AddNoFolder", "folder add queue", 3, "", "'queue' is no folder"},
+    {"Add", "folder add vol/docs --name 'My docs' --group work --types document", 0,
+     "added: /docs (document)\n", "made the share 'docs'"},
+    {"AddAgain", "folder add vol/docs", 3, "", "indexed already; 'fileindex folder set'"},
+    {"AddBelow", "folder add vol/docs/in", 0, "added: /docs/in (document,audio,video,photo)\n",
+     "fileindexd does not run"},
+    {"AddRefused", "folder add vol/docs/.git", 3, "", "/docs/.git cannot be indexed"},
+    {"AddBadType", "folder add vol/docs/in --types film", 2, "", "'film' is no type"},
+    {"List", "folder list --sort -path", 0,
+     "PATH      NAME     GROUP  TYPES                       STATUS\n"
+     "/docs/in  in              document,audio,video,photo  finished\n"
+     "/docs     My docs  work   document                    processing\n",
+     "2 folders of 2"},
+    {"ListJson", "folder list --json --find MY --limit 1", 0, "*\"offset\":0,\"total\":1}", ""},
+    {"ListNone", "folder list --group play", 1, "", "0 folders of 0"},
+    {"ListBadOrder", "folder list --sort size", 2, "", "'size' is no order"},
+    {"Get", "folder get vol/docs/", 0, "*types  document\n", ""},
+    {"GetJson", "folder get --json /docs/in", 0, "*\"path\":\"/docs/in\"", ""},
+    {"GetOther", "folder get vol/docs/none", 3, "", "'/docs/none' is no indexed folder"},
+    {"GetOutside", "folder get vol", 3, "", "'vol' lies in no share"},
+    {"Groups", "folder groups", 0, "work\n", ""},
+    {"Set", "folder set /docs --types none --group ''", 0, "changed: /docs (none)\n", ""},
+    {"SetNothing", "folder set /docs --types none", 1, "", "nothing to change"},
+    {"Reindex", "folder reindex vol/docs", 0, "to be indexed again: /docs\n", "waits for it"},
+    {"ReindexElsewhere", "folder reindex vol", 3, "", "'vol' lies in no share"},
+    {"Status", "status --json", 0, "\"processing\"\n", "fileindexd does not run"},
+    {"Summary", "summary", 0, "in       finished\nMy docs  processing\nin all   processing\n", ""},
+    {"SummaryJson", "summary --json", 0, "*\"status\":\"processing\"}", ""},
+    {"Delete", "folder delete vol/docs/in", 0, "deleted: /docs/in\n", ""},
+    {"DeleteOther", "folder delete /docs/in", 3, "", "'/docs/in' is no indexed folder"},
+    {"DeleteNone", "folder delete --share photo", 3, "", "no folder to delete"},
+    {"LoseTheIndex", "index delete docs", 0, "*deleted", ""},
+    {"DeleteLast", "folder delete --share docs", 0, "deleted: /docs\n", ""},
+    {"NoIndex", "index list", 1, "", ""},
+    {"AddBack", "folder add vol/docs", 0, "*added", ""},
+    {"LoseTheShare", "share remove docs", 0, "*removed", ""},
+    {"ListOfGoneShare", "folder list", 3, "", "is gone; 'fileindex folder prune'"},
+    {"Prune", "folder prune", 0, "pruned: /docs\n", ""},
+    {"PruneAgain", "folder prune", 1, "", "the share of every folder is there"},
+    {"IndexPruned", "index list", 1, "", ""},
+    {"GroupsOfNone", "folder groups", 1, "", ""},
+};
+
 // A run of the program, ended by timeout(1) if it would never end.
 class Cli : public testing::Test {
  protected:
@@ -155,6 +202,17 @@ class Cli : public testing::Test {
     EXPECT_TRUE(out_ == row.out || (row.out[0] == '*' && out_.find(&row.out[1]) < out_.size()))
         << out_;
     EXPECT_NE(err_.find(row.err), std::string::npos) << err_;
+  }
+
+  void CheckWithEngine(std::span<const CliCase> rows) {
+    Program engine("cd " + files_.Path() + "; export FILEINDEX_ROOT=$PWD/root",
+                   "timeout 60 " KAVOELASTICD_PROGRAM " 2>&1");
+    ASSERT_TRUE(engine.Await("ready")) << engine.text;
+    for (const CliCase& row : rows) {
+      Check(row);
+    }
+    EXPECT_EQ(engine.End(SIGTERM), 0);
+    EXPECT_FALSE(std::filesystem::exists(files_ / "root/var/run/kavoelasticd.sock"));
   }
 
   const TempFolder files_;
@@ -206,23 +264,20 @@ TEST_F(Cli, SearchesWhatItHasIndexed) {
   Start("search museum");
   EXPECT_EQ(End(), 3);
   EXPECT_NE(err_.find("kavoelasticd does not run"), std::string::npos) << err_;
-  // Ready when its line has come; ends when this test has read all.
-  const std::string command = "cd " + files_.Path() +
-                              "; FILEINDEX_ROOT=$PWD/root exec timeout 60 " + KAVOELASTICD_PROGRAM +
-                              " 2>&1";
-  FILE* const engine = popen(command.c_str(), "re");
-  char line[256] = {};
-  ASSERT_TRUE(fgets(line, sizeof(line), engine) != nullptr);
-  const std::string said = line;
-  ASSERT_NE(said.find("ready"), std::string::npos) << said;
-  for (const CliCase& row : kEngineCases) {
-    Check(row);
+  CheckWithEngine(kEngineCases);
+}
+
+TEST_F(Cli, AdministersFolders) {
+  std::filesystem::create_directories(files_ / "vol/docs/in");
+  std::filesystem::create_directories(files_ / "vol/docs/.git");
+  for (const char* needed :
+       {"var/packages/Vexlo/etc", "tmp", "var/lib/kavo/fileindex/queue", "var/run"}) {
+    std::filesystem::create_directories(files_ / "root/" + needed);
   }
-  kill(std::stoi(said.substr(said.find('[') + 1)), SIGTERM);
-  while (fgets(line, sizeof(line), engine) != nullptr) {
-  }
-  EXPECT_EQ(pclose(engine), 0);
-  EXPECT_FALSE(std::filesystem::exists(files_ / "root/var/run/kavoelasticd.sock"));
+  WriteText(files_ / "queue", "");
+  WriteText(files_ / "root/var/run/fileindexd.sock", "");
+  CheckWithEngine(kFolderCases);
+  EXPECT_EQ(ReadText(files_ / "root/var/lib/kavo/evnotify/fileindex.json"), "{\"queues\": [\n]}\n");
 }
 
 TEST_F(Cli, WatchDeliversWhatAnEarlierRunLeftAndThenWhatHappens) {

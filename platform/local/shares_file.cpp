@@ -4,7 +4,6 @@
 #include <json/reader.h>
 #include <json/value.h>
 #include <json/writer.h>
-#include <sys/file.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -17,13 +16,13 @@
 #include <string_view>
 #include <unordered_set>
 
+#include "platform/local/edit_file.h"
 #include "platform/local/fd.h"
 #include "platform/local/index_path.h"
 
 namespace kavo::local {
 namespace {
 
-constexpr size_t kMaxFileBytes = size_t{64} << 20;
 constexpr size_t kMaxNameBytes = 255;
 constexpr size_t kMaxShownBytes = 100;
 constexpr int kMaxNesting = 16;
@@ -63,22 +62,6 @@ std::string Quoted(std::string_view text) {
 
 bool Contains(std::string_view folder, std::string_view path) {
   return path.starts_with(folder) && (path.size() == folder.size() || path[folder.size()] == '/');
-}
-
-// True when the path is absolute and each component is a name.
-bool IsNormalised(std::string_view path) {
-  if (!path.starts_with('/')) {
-    return false;
-  }
-  while (!path.empty()) {
-    path.remove_prefix(1);
-    const std::string_view component = path.substr(0, path.find('/'));
-    if (component.empty() || component == "." || component == "..") {
-      return false;
-    }
-    path.remove_prefix(component.size());
-  }
-  return true;
 }
 
 // What is wrong with a share's name; "" when nothing is.
@@ -278,122 +261,22 @@ std::string Serialise(const std::vector<Share>& shares) {
   return out.str();
 }
 
-[[noreturn]] void ThrowSystem(const std::string& path, const char* deed) {
-  throw SharesError(path + ": " + deed + " failed: " + strerror(errno));
-}
-
-// Without the slash that ends it; "." for the working directory.
-std::string FolderOf(const std::string& file) {
-  const size_t slash = file.rfind('/');
-  return slash == std::string::npos ? "." : file.substr(0, std::max<size_t>(slash, 1));
-}
-
-void MakeFolders(const std::string& folder) {
-  for (size_t end = 0; end != std::string::npos;) {
-    end = folder.find('/', end + 1);
-    const std::string part = folder.substr(0, end);
-    struct stat info {};
-    if (mkdir(part.c_str(), 0755) != 0) {
-      const int error = errno;
-      if (stat(part.c_str(), &info) != 0 || !S_ISDIR(info.st_mode)) {
-        errno = error;
-        ThrowSystem(part, "mkdir");
-      }
-    }
-  }
-}
-
-// The new file in the making, under a name that is known: what a crash leaves goes with the next
-// edit. Only who holds the editors' lock makes one.
-class Temporary {
- public:
-  explicit Temporary(const std::string& file) : path_(file + ".tmp") { unlink(path_.c_str()); }
-  ~Temporary() { unlink(path_.c_str()); }
-  Temporary(const Temporary&) = delete;
-  Temporary& operator=(const Temporary&) = delete;
-
-  const std::string& Path() const { return path_; }
-
- private:
-  std::string path_;
-};
-
-void Replace(const std::string& file, const std::string& text) {
-  const Temporary temporary(file);
-  const std::string& path = temporary.Path();
-  ScopedFd fd(open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, 0644));
-  if (fd.Get() < 0) {
-    ThrowSystem(path, "open");
-  }
-  struct stat old {};
-  if (stat(file.c_str(), &old) == 0 && fchown(fd.Get(), old.st_uid, old.st_gid) != 0) {
-    // Only root gives files away; the file is then that of whoever edits it.
-  }
-  if (fchmod(fd.Get(), 0644) != 0) {  // Whatever the umask is.
-    ThrowSystem(path, "chmod");
-  }
-  if (!WriteAll(fd.Get(), text)) {
-    ThrowSystem(path, "write");
-  }
-  if (fsync(fd.Get()) != 0) {
-    ThrowSystem(path, "fsync");
-  }
-  if (!fd.Close()) {
-    ThrowSystem(path, "close");
-  }
-  if (rename(path.c_str(), file.c_str()) != 0) {
-    ThrowSystem(file, "rename");
-  }
-  const std::string folder = FolderOf(file);
-  const ScopedFd folder_fd(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (folder_fd.Get() < 0 || fsync(folder_fd.Get()) != 0) {
-    ThrowSystem(file,
-                "the change is made but may not outlive a power failure, as fsync of the folder");
-  }
-}
-
 // Replaces the list by what change(list) makes of it.
 void Edit(const std::string& file, const std::function<void(std::vector<Share>&)>& change) {
-  MakeFolders(FolderOf(file));
-  // Stays when the edit is over: a lock file that comes and goes would be two for two editors.
-  const std::string lock_path = file + ".lock";
-  const ScopedFd lock(open(lock_path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644));
-  if (lock.Get() < 0) {
-    ThrowSystem(lock_path, "open");
-  }
-  while (flock(lock.Get(), LOCK_EX) != 0) {
-    if (errno != EINTR) {
-      ThrowSystem(lock_path, "flock");
+  try {
+    MakeFolders(FolderOf(file));
+    const EditLock lock(file);
+    std::vector<Share> shares = ReadShares(file);
+    change(shares);
+    SharesText text;
+    text.exists = true;
+    text.text = Serialise(shares);
+    if (ParseShares(file, text) != shares) {
+      throw SharesError(file + ": the new list would not read back as it is");
     }
-  }
-  std::vector<Share> shares = ReadShares(file);
-  change(shares);
-  SharesText text;
-  text.exists = true;
-  text.text = Serialise(shares);
-  if (ParseShares(file, text) != shares) {
-    throw SharesError(file + ": the new list would not read back as it is");
-  }
-  Replace(file, text.text);
-}
-
-// Appends up to one byte more than is allowed. False with errno.
-bool ReadAll(int fd, size_t expected, std::string& text) {
-  size_t used = 0;
-  text.resize(std::min(expected, kMaxFileBytes) + 1);
-  while (true) {
-    const ssize_t count = read(fd, text.data() + used, text.size() - used);
-    if (count < 0 && errno != EINTR) {
-      return false;
-    }
-    used += static_cast<size_t>(std::max<ssize_t>(count, 0));
-    if (count == 0 || used > kMaxFileBytes) {
-      text.resize(used);
-      return true;
-    }
-    if (used == text.size()) {
-      text.resize(std::min(2 * used, kMaxFileBytes + 1));
-    }
+    ReplaceWhole(file, text.text);
+  } catch (const FileError& error) {
+    throw SharesError(error.what());
   }
 }
 

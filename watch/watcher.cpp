@@ -17,7 +17,6 @@ namespace {
 constexpr uint32_t kKernelMask = IN_CREATE | IN_CLOSE_WRITE | IN_ATTRIB | IN_DELETE |
                                  IN_MOVED_FROM | IN_MOVED_TO | IN_DELETE_SELF | IN_MOVE_SELF |
                                  IN_ONLYDIR | IN_EXCL_UNLINK;
-constexpr std::string_view kExtraFolder = "@eaDir";
 constexpr char kWatchLimitFile[] = "/proc/sys/fs/inotify/max_user_watches";
 
 // Events are taken out of the kernel's queue also while folders are walked, lest it overflow: it
@@ -38,7 +37,12 @@ Fd StartInotify() {
   return fd;
 }
 
-bool IsNormalised(const std::string& path) {
+bool IsAmong(const std::vector<std::string>& names, std::string_view name) {
+  return std::find(names.begin(), names.end(), name) != names.end();
+}
+
+// True when the path is absolute and each component is a name that is not ignored.
+bool IsNormalised(const std::string& path, const std::vector<std::string>& ignored_names) {
   if (path == "/") {
     return true;
   }
@@ -48,7 +52,7 @@ bool IsNormalised(const std::string& path) {
   for (size_t at = 1; at <= path.size();) {
     const size_t slash = std::min(path.find('/', at), path.size());
     const std::string_view name = std::string_view(path).substr(at, slash - at);
-    if (name.empty() || name == "." || name == ".." || name == kExtraFolder) {
+    if (name.empty() || name == "." || name == ".." || IsAmong(ignored_names, name)) {
       return false;
     }
     at = slash + 1;
@@ -116,11 +120,7 @@ Watcher::Watcher(const std::vector<std::string>& roots, WatchOptions options, Si
       changes_(options_.move_wait),
       next_rescan_(now + options_.rescan_interval) {
   for (const std::string& path : roots) {
-    VEXLO_CHECK(!IsNormalised(path), ERR_BAD_PARAMETER,
-                "not an absolute, normalised path outside \"@eaDir\", path=" + path);
-    const Fd fd = OpenDirectory(path);
-    VEXLO_CHECK(!fd, ERR_SYSTEM,
-                "cannot be watched as a folder, path=" + path + ", reason=" + strerror(errno));
+    CheckPath(path);
     if (std::none_of(roots_.begin(), roots_.end(),
                      [&](const Root& root) { return root.path == path; })) {
       roots_.push_back({path});
@@ -189,7 +189,15 @@ TimePoint Watcher::NextDeadline() const {
   if (!rescan_.empty() || !drained_) {
     return TimePoint::min();
   }
-  return std::min(next_rescan_, changes_.NextDeadline().value_or(TimePoint::max()));
+  return std::min(IsAtRest() ? TimePoint::max() : next_rescan_,
+                  changes_.NextDeadline().value_or(TimePoint::max()));
+}
+
+// Nothing is there that only time will tell.
+bool Watcher::IsAtRest() const {
+  return !options_.polls_roots && unwatched_.empty() && unreadable_.empty() &&
+         std::none_of(roots_.begin(), roots_.end(),
+                      [](const Root& root) { return root.folder == kNoFolder && !root.covered; });
 }
 
 FolderId Watcher::FolderOf(int wd) const {
@@ -402,6 +410,9 @@ bool Watcher::Walk(std::vector<Visit> visits, VisitMode mode) {
   Chain chain(*this);
   bool replaced = false;
   for (size_t count = 1; !visits.empty(); ++count) {
+    if (options_.stop.stop_requested()) {
+      break;
+    }
     const Visit visit = std::move(visits.back());
     visits.pop_back();
     if (count % kFoldersBetweenPulls == 0) {
@@ -680,6 +691,59 @@ void Watcher::RootGone(Root& root) {
   Drop(std::exchange(root.folder, kNoFolder));
 }
 
+void Watcher::CheckPath(const std::string& path) const {
+  VEXLO_CHECK(!IsNormalised(path, options_.ignored_names), ERR_BAD_PARAMETER,
+              "not an absolute, normalised path outside what is ignored, path=" + path);
+  const Fd fd = options_.takes_missing_roots ? Fd() : OpenDirectory(path);
+  VEXLO_CHECK(!fd && !options_.takes_missing_roots, ERR_SYSTEM,
+              "cannot be watched as a folder, path=" + path + ", reason=" + strerror(errno));
+}
+
+// Neither above nor below a root, nor one itself.
+bool Watcher::IsApart(const std::string& path) const {
+  return std::none_of(roots_.begin(), roots_.end(), [&](const Root& root) {
+    return root.path == path || IsBelow(root.path, path) || IsBelow(path, root.path);
+  });
+}
+
+bool Watcher::AddRoot(const std::string& path, TimePoint now) {
+  CheckPath(path);
+  if (!IsApart(path)) {
+    return false;
+  }
+  now_ = now;
+  roots_.push_back({path});
+  Walk({{kNoFolder, path, true}}, {});
+  roots_.back().folder = tree_.Find(kNoFolder, path);
+  LogChangedState();
+  return true;
+}
+
+bool Watcher::RemoveRoot(const std::string& path) {
+  const auto found = std::find_if(roots_.begin(), roots_.end(),
+                                  [&](const Root& root) { return root.path == path; });
+  if (found == roots_.end()) {
+    return false;
+  }
+  const Root root = *found;
+  roots_.erase(found);
+  if (!IsApart(path)) {
+    roots_.push_back(root);
+    return false;
+  }
+  if (root.folder != kNoFolder) {
+    Drop(root.folder);
+  }
+  LogChangedState();
+  return true;
+}
+
+void Watcher::CheckRoots(TimePoint now) {
+  now_ = now;
+  CheckRoots();
+  LogChangedState();
+}
+
 void Watcher::CheckRoots() {
   for (Root& root : roots_) {
     if (root.folder != kNoFolder && !Stands(root)) {
@@ -760,7 +824,7 @@ void Watcher::LogChangedState() {
 // --- Reporting
 
 bool Watcher::IsHidden(const std::string& path, std::string_view name) const {
-  return name == kExtraFolder || ignored_.count(path) != 0;
+  return IsAmong(options_.ignored_names, name) || ignored_.count(path) != 0;
 }
 
 Watcher::Standing Watcher::WhatStands(FolderId parent, const std::string& name) const {

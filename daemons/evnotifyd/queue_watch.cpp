@@ -5,7 +5,7 @@
 namespace vexlo::evnotifyd {
 namespace {
 
-constexpr std::chrono::milliseconds kPatienceAtEnd(500);
+constexpr std::chrono::milliseconds kPatienceAtEnd(300);
 
 }  // namespace
 

@@ -1,12 +1,15 @@
 #include "watch/watcher.h"
 
 #include <fcntl.h>
+#include <mntent.h>
 #include <sys/inotify.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <fstream>
+#include <iterator>
+#include <memory>
 
 #include "common/check.h"
 #include "common/error.h"
@@ -69,6 +72,24 @@ FolderIdentity IdentityOf(const struct stat& attributes) {
   return {attributes.st_dev, attributes.st_ino};
 }
 
+// What is mounted, each as its folder, a NUL, what is mounted there, and how often that came
+// before.
+std::set<std::string> MountsNow() {
+  std::set<std::string> mounts;
+  const std::unique_ptr<FILE, decltype(&endmntent)> table(setmntent("/proc/self/mounts", "re"),
+                                                          &endmntent);
+  struct mntent entry {};
+  std::vector<char> buffer(size_t{1} << 16);
+  while (table != nullptr && getmntent_r(table.get(), &entry, buffer.data(),
+                                         static_cast<int>(buffer.size())) != nullptr) {
+    const std::string mount = entry.mnt_dir + std::string(1, '\0') + entry.mnt_fsname + '\0';
+    for (size_t before = 0; !mounts.insert(mount + std::to_string(before)).second;) {
+      ++before;
+    }
+  }
+  return mounts;
+}
+
 std::string Count(size_t count, const char* what) {
   return std::to_string(count) + " " + what + (count == 1 ? "" : "s");
 }
@@ -118,7 +139,8 @@ Watcher::Watcher(const std::vector<std::string>& roots, WatchOptions options, Si
       now_(now),
       buffer_(size_t{1} << 16),
       changes_(options_.move_wait),
-      next_rescan_(now + options_.rescan_interval) {
+      next_rescan_(now + options_.rescan_interval),
+      mounts_(MountsNow()) {
   for (const std::string& path : roots) {
     CheckPath(path);
     if (std::none_of(roots_.begin(), roots_.end(),
@@ -172,6 +194,7 @@ void Watcher::Poll(TimePoint now) {
   }
   if (now >= next_rescan_) {
     next_rescan_ = now + options_.rescan_interval;
+    CheckMounts();
     CheckRoots();
     if (rescan_.empty()) {
       rescan_.assign(unreadable_.begin(), unreadable_.end());
@@ -740,8 +763,35 @@ bool Watcher::RemoveRoot(const std::string& path) {
 
 void Watcher::CheckRoots(TimePoint now) {
   now_ = now;
+  CheckMounts();
   CheckRoots();
   LogChangedState();
+}
+
+// A folder that something is mounted on, or no longer, is another one from then on, and no event
+// says so: it is looked at from the innermost folder that is known on its way.
+void Watcher::CheckMounts() {
+  std::set<std::string> mounts = MountsNow();
+  std::vector<std::string> changed;
+  std::set_symmetric_difference(mounts.begin(), mounts.end(), mounts_.begin(), mounts_.end(),
+                                std::back_inserter(changed));
+  mounts_ = std::move(mounts);
+  for (const std::string& mount : changed) {
+    const std::string path = mount.substr(0, mount.find('\0'));
+    for (const Root& root : roots_) {
+      if (root.folder != kNoFolder && IsBelow(path, root.path)) {
+        FolderId folder = root.folder;
+        size_t at = root.path.size() == 1 ? 0 : root.path.size();
+        for (FolderId next = folder; next != kNoFolder && at < path.size();) {
+          const size_t slash = std::min(path.find('/', at + 1), path.size());
+          next = tree_.Find(folder, std::string_view(path).substr(at + 1, slash - at - 1));
+          folder = next == kNoFolder ? folder : next;
+          at = slash;
+        }
+        unsettled_.insert(folder);
+      }
+    }
+  }
 }
 
 void Watcher::CheckRoots() {

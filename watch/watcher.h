@@ -7,6 +7,7 @@
 #include <cstdint>
 #include <functional>
 #include <optional>
+#include <set>
 #include <stop_token>
 #include <string>
 #include <string_view>
@@ -36,8 +37,8 @@ struct WatchOptions {
   // Take a root that does not stand at the start for one that is gone, instead of throwing.
   bool takes_missing_roots = false;
   // Look also while all is live, every `rescan_interval`, whether the roots still stand: no event
-  // tells of a mount over one, or of a move of a folder above. Without it there is no deadline at
-  // rest, and the caller calls CheckRoots() when it learns of such things.
+  // tells of a mount over one or below it, or of a move of a folder above. Without it there is no
+  // deadline at rest, and the caller calls CheckRoots() when it learns of such things.
   bool polls_roots = true;
   // Ends a walk under way when it is asked to stop. Of no use from then on, the watcher is only to
   // be destroyed.
@@ -101,7 +102,8 @@ class Watcher {
   bool AddRoot(const std::string& path, TimePoint now);
   bool RemoveRoot(const std::string& path);
 
-  // Looks at once which roots stand, as Poll() does every `rescan_interval`.
+  // Looks at once which roots stand and what is mounted below them, as Poll() does every
+  // `rescan_interval`.
   void CheckRoots(TimePoint now);
 
   WatchState State() const;
@@ -160,6 +162,7 @@ class Watcher {
   Root* RootOf(FolderId folder);
   void RootGone(Root& root);
   void CheckRoots();
+  void CheckMounts();
   void CheckPath(const std::string& path) const;
   bool IsApart(const std::string& path) const;
   bool IsAtRest() const;
@@ -191,6 +194,7 @@ class Watcher {
   std::unordered_set<FolderId> unsettled_;
   std::vector<FolderId> rescan_;  // What is left of the rescan under way.
   TimePoint next_rescan_;
+  std::set<std::string> mounts_;      // As they were at the last look, before anything was opened.
   std::vector<std::string> changed_;  // Folders to report for a reindex when the walk is over.
   size_t removed_watches_ = 0;
   std::string logged_;  // The state that was logged last; empty before the first.

@@ -45,24 +45,25 @@ Feeder::Feeder(std::string queue, const FeederOptions& options, std::stop_token 
 
 void Feeder::SetFolders(const std::vector<kavo::local::MonitoredFolder>& folders, TimePoint now) {
   PollWatchers(now);  // What has happened so far is told by the old list.
-  masks_.clear();
+  folders_.clear();
+  folders_.reserve(folders.size());
   roots_.clear();
   std::map<Names, std::set<std::string>> wanted;
   for (const kavo::local::MonitoredFolder& folder : folders) {
-    masks_.emplace_back(folder.path, folder.mask);
+    folders_.push_back({folder.path, folder.mask, {folder.ignore.begin(), folder.ignore.end()}});
     roots_.insert(folder.path);
-    wanted[Names(folder.ignore.begin(), folder.ignore.end())].insert(folder.path);
+    wanted[folders_.back().ignored].insert(folder.path);
   }
-  std::sort(masks_.begin(), masks_.end(), [](const auto& left, const auto& right) {
-    return left.first.size() > right.first.size();
+  std::sort(folders_.begin(), folders_.end(), [](const Folder& left, const Folder& right) {
+    return left.path.size() > right.path.size();
   });
   backlog_.SetRoots({roots_.begin(), roots_.end()});
   std::erase_if(groups_, [&](const auto& group) { return wanted.count(group.first) == 0; });
   for (const auto& [ignored, roots] : wanted) {
-    Group& group = groups_[ignored];
-    if (!Adjust(group, roots)) {
-      group.roots = roots;
-      Start(ignored, group);
+    const auto group = groups_.try_emplace(ignored).first;
+    if (!Adjust(group->second, roots)) {
+      group->second.roots = roots;
+      Start(group->first, group->second);
     }
   }
   Append();
@@ -83,7 +84,8 @@ void Feeder::Start(const Names& ignored, Group& group) {
   group.fault.clear();
   try {
     group.watcher = std::make_unique<Watcher>(
-        roots, std::move(options), [this](QueueEvent&& event) { Take(std::move(event)); }, now_);
+        roots, std::move(options),
+        [this, &ignored](QueueEvent&& event) { Take(ignored, std::move(event)); }, now_);
     ReindexStanding(group, roots);
   } catch (const Error& error) {
     // Nothing tells of changes: whoever reads the queue is told to look for them, time after time.
@@ -214,22 +216,19 @@ QueueStats Feeder::Stats() const {
 
 // --- What is told
 
-void Feeder::Take(QueueEvent&& event) {
+void Feeder::Take(const Names& ignored, QueueEvent&& event) {
   switch (event.mask) {
     case watch::kMaskCrashed:
     case watch::kMaskReindex:
       Add(event);
       return;
-    case watch::kMaskRename: {
-      const bool told_there = (MaskOf(event.path) & watch::kMaskRename) != 0;
-      if (told_there && (MaskOf(event.path_old) & watch::kMaskRename) != 0) {
-        Add(event);
+    case watch::kMaskRename:
+      if ((MaskOf(ignored, event.path) & MaskOf(ignored, event.path_old) & event.mask) == 0) {
+        Take(ignored, {watch::kMaskDelete, event.is_dir, std::move(event.path_old), ""});
+        Take(ignored, {watch::kMaskCreate, event.is_dir, std::move(event.path), ""});
         return;
       }
-      Take({watch::kMaskDelete, event.is_dir, std::move(event.path_old), ""});
-      Take({watch::kMaskCreate, event.is_dir, std::move(event.path), ""});
-      return;
-    }
+      break;
     case watch::kMaskCreate:
       if (event.is_dir && roots_.count(event.path) != 0) {
         event.mask = watch::kMaskReindex;  // It is back, with all that is in it.
@@ -240,7 +239,7 @@ void Feeder::Take(QueueEvent&& event) {
     default:
       break;
   }
-  if ((MaskOf(event.path) & event.mask) != 0) {
+  if ((MaskOf(ignored, event.path) & event.mask) != 0) {
     Add(event);
   }
 }
@@ -278,11 +277,11 @@ void Feeder::Append() {
   }
 }
 
-// The mask of the innermost folder that holds the path.
-uint32_t Feeder::MaskOf(const std::string& path) const {
-  for (const auto& [folder, mask] : masks_) {
-    if (IsWithin(path, folder)) {
-      return mask;
+// The mask of the innermost folder that holds the path; 0 when another Watcher tells of that one.
+uint32_t Feeder::MaskOf(const Names& ignored, const std::string& path) const {
+  for (const Folder& folder : folders_) {
+    if (IsWithin(path, folder.path)) {
+      return folder.ignored == ignored ? folder.mask : 0;
     }
   }
   return 0;

@@ -9,7 +9,6 @@
 #include <set>
 #include <stop_token>
 #include <string>
-#include <utility>
 #include <vector>
 
 #include "daemons/evnotifyd/backlog.h"
@@ -42,7 +41,9 @@ struct QueueStats {
 //   kMaskReindex line, behind which nothing is missed: the watches stand when it is written.
 // - Of an event, the bits that the folder's mask wants are told. kMaskCrashed and kMaskReindex are
 //   told whatever it wants. Where it wants no renames, a rename is a delete and a create.
-// - Folders with the same list of ignored names share a Watcher. A change of the registration
+// - Folders with the same list of ignored names share a Watcher. Where folders with different lists
+//   lie one in the other, each path is told of by the Watcher of the innermost one.
+// - A change of the registration
 //   leaves alone what it does not touch; only folders that are added above or below others make
 //   their Watcher start anew, and then each of its folders gets a reindex.
 // - Lines that cannot be appended wait, and are tried again after 10 ms, then ever later, up to a
@@ -75,6 +76,11 @@ class Feeder {
 
  private:
   using Names = std::set<std::string>;
+  struct Folder {
+    std::string path;
+    uint32_t mask;
+    Names ignored;
+  };
   struct Group {
     std::set<std::string> roots;
     std::unique_ptr<watch::Watcher> watcher;  // None when it could not be made:
@@ -82,21 +88,21 @@ class Feeder {
     TimePoint retry;                          // and when to try again.
   };
 
-  void Start(const Names& ignored, Group& group);
+  void Start(const Names& ignored, Group& group);  // Both as they stand in groups_.
   bool Adjust(Group& group, const std::set<std::string>& roots);
   void ReindexStanding(const Group& group, const std::vector<std::string>& roots);
   void PollWatchers(TimePoint now);
-  void Take(watch::QueueEvent&& event);
+  void Take(const Names& ignored, watch::QueueEvent&& event);
   void Add(const watch::QueueEvent& event);
   void Append();
-  uint32_t MaskOf(const std::string& path) const;
+  uint32_t MaskOf(const Names& ignored, const std::string& path) const;
 
   const std::string queue_;
   const FeederOptions options_;
   const std::stop_token stop_;
   TimePoint now_;
   std::map<Names, Group> groups_;
-  std::vector<std::pair<std::string, uint32_t>> masks_;  // By folder, inner ones first.
+  std::vector<Folder> folders_;  // Inner ones first.
   std::set<std::string> roots_;
 
   Backlog backlog_;

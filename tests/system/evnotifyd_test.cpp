@@ -321,8 +321,21 @@ TEST_F(EvnotifydTest, AShareThatIsMountedIsReadAnew) {
     AwaitLines("create share/f, write share/f", "q", 3);
   }
   AwaitLines("delete share/, reindex share/", "q", 5);
-  Do("share", "> g");
-  AwaitLines("create share/g, write share/g", "q", 7);
+  // Mounted in it.
+  Do("share", "mkdir -p d/e; > d/e/hidden");
+  EXPECT_TRUE(Await([&] { return Lines("q", 7).ends_with("write share/d/e/hidden"); })) << Lines();
+  const size_t count = CountLines();
+  {
+    const ScopedMount mount = ScopedMount::Tmpfs(kRoot / "share/d/e");
+    AwaitLines("reindex share/d/", "q", count);
+    Do("share", "> d/e/f");
+    AwaitLines("create share/d/e/f, write share/d/e/f", "q", count + 1);
+  }
+  // Both the folder that is gone and the mounts that are left may tell of it.
+  EXPECT_TRUE(Await([&] { return Lines("q", count + 3).starts_with("reindex share/d/"); }));
+  Do("share", "> d/e/g");
+  EXPECT_TRUE(Await([&] { return Lines().ends_with(", create share/d/e/g, write share/d/e/g"); }))
+      << Lines();
 }
 
 TEST_F(EvnotifydTest, AQueueThatCannotBeWrittenWaitsAlone) {

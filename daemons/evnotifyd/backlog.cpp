@@ -15,12 +15,13 @@ void Backlog::Add(const watch::QueueEvent& event) {
 void Backlog::Append(const watch::QueueEvent& event) {
   text_ += watch::QueueLine(event);
   ++lines_;
-  losses_ += event.mask == watch::kMaskCrashed ? 1 : 0;
+  crashed_ += event.mask == watch::kMaskCrashed ? 1 : 0;
 }
 
 void Backlog::Clear() {
   text_ = std::string();  // Gives the memory of a burst back.
   lines_ = 0;
+  crashed_ = 0;
 }
 
 }  // namespace vexlo::evnotifyd

@@ -26,11 +26,10 @@ class Backlog {
   // All that waits, as it goes into the queue.
   const std::string& Text() const { return text_; }
   uint64_t Lines() const { return lines_; }
+  uint64_t Crashed() const { return crashed_; }  // How many of them are of kMaskCrashed.
 
   // The lines have been appended.
   void Clear();
-
-  uint64_t Losses() const { return losses_; }  // Lines of kMaskCrashed so far.
 
  private:
   void Append(const watch::QueueEvent& event);
@@ -39,7 +38,7 @@ class Backlog {
   std::vector<std::string> roots_;
   std::string text_;
   uint64_t lines_ = 0;
-  uint64_t losses_ = 0;
+  uint64_t crashed_ = 0;
 };
 
 }  // namespace vexlo::evnotifyd

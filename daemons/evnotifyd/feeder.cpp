@@ -210,7 +210,7 @@ QueueStats Feeder::Stats() const {
     }
   }
   stats.lines = lines_;
-  stats.overflows = backlog_.Losses();
+  stats.overflows = overflows_;
   return stats;
 }
 
@@ -257,6 +257,7 @@ void Feeder::Append() {
   }
   if (TryAppendLines(queue_, backlog_.Text())) {
     lines_ += backlog_.Lines();
+    overflows_ += backlog_.Crashed();
     backlog_.Clear();
     pause_ = milliseconds(0);
     if (!fault_.empty()) {

@@ -34,7 +34,7 @@ struct QueueStats {
   bool live = false;
   std::string reason;      // Why it is not live, for people; empty when it is.
   uint64_t lines = 0;      // Appended so far.
-  uint64_t overflows = 0;  // Lines of kMaskCrashed so far.
+  uint64_t overflows = 0;  // Of these, lines of kMaskCrashed.
 };
 
 // - A folder that begins to be watched (at first, or when it is back) is told of by one
@@ -107,6 +107,7 @@ class Feeder {
 
   Backlog backlog_;
   uint64_t lines_ = 0;
+  uint64_t overflows_ = 0;
   std::chrono::milliseconds pause_{0};  // Before the next try; 0 while writing works.
   TimePoint retry_;
   std::string fault_;  // Why the queue cannot be written, once it is worth telling.

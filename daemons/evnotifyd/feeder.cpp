@@ -8,6 +8,7 @@
 #include "common/check.h"
 #include "common/error.h"
 #include "common/file.h"
+#include "common/string.h"
 
 namespace vexlo::evnotifyd {
 namespace {
@@ -21,10 +22,6 @@ constexpr milliseconds kFirstPause(10);
 constexpr milliseconds kLongestPause(1000);
 // Many events are appended in parts, so that the bound of the backlog is not for them.
 constexpr size_t kAppendBytes = size_t{1} << 20;
-
-bool IsWithin(const std::string& path, const std::string& folder) {
-  return path.starts_with(folder) && (path.size() == folder.size() || path[folder.size()] == '/');
-}
 
 void AddReason(std::string& reasons, const std::string& reason) {
   if (!reason.empty()) {
@@ -281,7 +278,7 @@ void Feeder::Append() {
 // The mask of the innermost folder that holds the path; 0 when another Watcher tells of that one.
 uint32_t Feeder::MaskOf(const Names& ignored, const std::string& path) const {
   for (const Folder& folder : folders_) {
-    if (IsWithin(path, folder.path)) {
+    if (IsSameOrBelow(path, folder.path)) {
       return folder.ignored == ignored ? folder.mask : 0;
     }
   }

@@ -2,6 +2,7 @@
 #ifndef DAEMONS_EVNOTIFYD_ROOT_PATHS_H_
 #define DAEMONS_EVNOTIFYD_ROOT_PATHS_H_
 
+#include <cstdint>
 #include <map>
 #include <set>
 #include <string>
@@ -11,8 +12,10 @@
 namespace vexlo::evnotifyd {
 
 // The kernel tells a watched folder nothing when a folder above it is moved, and of one that is
-// gone nobody tells when it is back. So each folder above a root is watched for the one name in it
-// that leads to the root.
+// gone nobody tells when it is back. So each folder above a root is watched for its own move, and
+// the one that holds the root, or the place of what is missing above it, for that one name in it.
+// Where links lead to a root, they and the way behind them are watched, too. What else happens in
+// these folders, which may be much, goes unheard but in the one.
 class RootPaths {
  public:
   // Watches what leads to these, and forgets what led to others.
@@ -29,9 +32,13 @@ class RootPaths {
   bool IsComplete() const { return complete_; }
 
  private:
+  void WatchWay(const std::string& root, int links);
+  int Watch(const std::string& path, uint32_t mask);
+
   daemon::UniqueFd fd_;
   std::map<int, std::set<std::string>> names_;  // That matter, by watch.
   bool complete_ = true;
+  int error_ = 0;  // Why not.
 };
 
 }  // namespace vexlo::evnotifyd

@@ -308,6 +308,32 @@ TEST_F(EvnotifydTest, AFolderThatIsGoneIsTakenUpAgain) {
   AwaitState("degraded", kRoot / "volume/photo is gone");
 }
 
+TEST_F(EvnotifydTest, TheWayToAFolderMayLeadOverLinks) {
+  kRoot.MakeFolder("disk/volume/photo");
+  kRoot.MakeFolder("disk2/photo");
+  Do("", "ln -s disk/volume link");
+  Register({{"link/photo", kMask}});
+  Start();
+  AwaitLines("reindex link/photo/");
+  size_t count = 1;
+  for (const char* const deeds : {"mv disk/volume disk/v", "ln -sfn disk2 link", "rm link",
+                                  "mv disk disk3", "mkdir disk; mv disk3/v disk/volume"}) {
+    // Another folder for what stood there before, or none, or one again.
+    const bool stood = CountLines() == 1 || Stats()["state"] == "live";
+    Do("", deeds);
+    const bool stands = std::filesystem::exists(kRoot / "link/photo");
+    const std::string want = std::string(stood ? "delete link/photo/" : "") +
+                             (stood && stands ? ", " : "") + (stands ? "reindex link/photo/" : "");
+    AwaitLines(want, "q", count);
+    count = CountLines();
+    if (deeds == std::string("rm link")) {
+      Do("", "ln -s disk/volume link");
+    }
+  }
+  Do("link/photo", "> f");
+  AwaitLines("create link/photo/f, write link/photo/f", "q", count);
+}
+
 TEST_F(EvnotifydTest, AShareThatIsMountedIsReadAnew) {
   Do("share", "> hidden");
   Register({{"share", kMask}});
@@ -322,7 +348,9 @@ TEST_F(EvnotifydTest, AShareThatIsMountedIsReadAnew) {
   }
   AwaitLines("delete share/, reindex share/", "q", 5);
   // Mounted in it.
-  Do("share", "mkdir -p d/e; > d/e/hidden");
+  Do("share", "mkdir -p d/e");
+  EXPECT_TRUE(Await([&] { return Lines("q", 7).ends_with("create share/d/e/"); })) << Lines();
+  Do("share", "> d/e/hidden");
   EXPECT_TRUE(Await([&] { return Lines("q", 7).ends_with("write share/d/e/hidden"); })) << Lines();
   const size_t count = CountLines();
   {

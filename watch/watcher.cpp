@@ -1,12 +1,15 @@
 #include "watch/watcher.h"
 
 #include <fcntl.h>
+#include <mntent.h>
 #include <sys/inotify.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <fstream>
+#include <iterator>
+#include <memory>
 
 #include "common/check.h"
 #include "common/error.h"
@@ -17,7 +20,6 @@ namespace {
 constexpr uint32_t kKernelMask = IN_CREATE | IN_CLOSE_WRITE | IN_ATTRIB | IN_DELETE |
                                  IN_MOVED_FROM | IN_MOVED_TO | IN_DELETE_SELF | IN_MOVE_SELF |
                                  IN_ONLYDIR | IN_EXCL_UNLINK;
-constexpr std::string_view kExtraFolder = "@eaDir";
 constexpr char kWatchLimitFile[] = "/proc/sys/fs/inotify/max_user_watches";
 
 // Events are taken out of the kernel's queue also while folders are walked, lest it overflow: it
@@ -38,7 +40,12 @@ Fd StartInotify() {
   return fd;
 }
 
-bool IsNormalised(const std::string& path) {
+bool IsAmong(const std::vector<std::string>& names, std::string_view name) {
+  return std::find(names.begin(), names.end(), name) != names.end();
+}
+
+// True when the path is absolute and each component is a name that is not ignored.
+bool IsNormalised(const std::string& path, const std::vector<std::string>& ignored_names) {
   if (path == "/") {
     return true;
   }
@@ -48,7 +55,7 @@ bool IsNormalised(const std::string& path) {
   for (size_t at = 1; at <= path.size();) {
     const size_t slash = std::min(path.find('/', at), path.size());
     const std::string_view name = std::string_view(path).substr(at, slash - at);
-    if (name.empty() || name == "." || name == ".." || name == kExtraFolder) {
+    if (name.empty() || name == "." || name == ".." || IsAmong(ignored_names, name)) {
       return false;
     }
     at = slash + 1;
@@ -63,6 +70,24 @@ bool IsBelow(const std::string& path, const std::string& folder) {
 
 FolderIdentity IdentityOf(const struct stat& attributes) {
   return {attributes.st_dev, attributes.st_ino};
+}
+
+// What is mounted, each as its folder, a NUL, what is mounted there, and how often that came
+// before.
+std::set<std::string> MountsNow() {
+  std::set<std::string> mounts;
+  const std::unique_ptr<FILE, decltype(&endmntent)> table(setmntent("/proc/self/mounts", "re"),
+                                                          &endmntent);
+  struct mntent entry {};
+  std::vector<char> buffer(size_t{1} << 16);
+  while (table != nullptr && getmntent_r(table.get(), &entry, buffer.data(),
+                                         static_cast<int>(buffer.size())) != nullptr) {
+    const std::string mount = entry.mnt_dir + std::string(1, '\0') + entry.mnt_fsname + '\0';
+    for (size_t before = 0; !mounts.insert(mount + std::to_string(before)).second;) {
+      ++before;
+    }
+  }
+  return mounts;
 }
 
 std::string Count(size_t count, const char* what) {
@@ -114,13 +139,10 @@ Watcher::Watcher(const std::vector<std::string>& roots, WatchOptions options, Si
       now_(now),
       buffer_(size_t{1} << 16),
       changes_(options_.move_wait),
-      next_rescan_(now + options_.rescan_interval) {
+      next_rescan_(now + options_.rescan_interval),
+      mounts_(MountsNow()) {
   for (const std::string& path : roots) {
-    VEXLO_CHECK(!IsNormalised(path), ERR_BAD_PARAMETER,
-                "not an absolute, normalised path outside \"@eaDir\", path=" + path);
-    const Fd fd = OpenDirectory(path);
-    VEXLO_CHECK(!fd, ERR_SYSTEM,
-                "cannot be watched as a folder, path=" + path + ", reason=" + strerror(errno));
+    CheckPath(path);
     if (std::none_of(roots_.begin(), roots_.end(),
                      [&](const Root& root) { return root.path == path; })) {
       roots_.push_back({path});
@@ -172,6 +194,7 @@ void Watcher::Poll(TimePoint now) {
   }
   if (now >= next_rescan_) {
     next_rescan_ = now + options_.rescan_interval;
+    CheckMounts();
     CheckRoots();
     if (rescan_.empty()) {
       rescan_.assign(unreadable_.begin(), unreadable_.end());
@@ -189,7 +212,15 @@ TimePoint Watcher::NextDeadline() const {
   if (!rescan_.empty() || !drained_) {
     return TimePoint::min();
   }
-  return std::min(next_rescan_, changes_.NextDeadline().value_or(TimePoint::max()));
+  return std::min(IsAtRest() ? TimePoint::max() : next_rescan_,
+                  changes_.NextDeadline().value_or(TimePoint::max()));
+}
+
+// Nothing is there that only time will tell.
+bool Watcher::IsAtRest() const {
+  return !options_.polls_roots && unwatched_.empty() && unreadable_.empty() &&
+         std::none_of(roots_.begin(), roots_.end(),
+                      [](const Root& root) { return root.folder == kNoFolder && !root.covered; });
 }
 
 FolderId Watcher::FolderOf(int wd) const {
@@ -402,6 +433,9 @@ bool Watcher::Walk(std::vector<Visit> visits, VisitMode mode) {
   Chain chain(*this);
   bool replaced = false;
   for (size_t count = 1; !visits.empty(); ++count) {
+    if (options_.stop.stop_requested()) {
+      break;
+    }
     const Visit visit = std::move(visits.back());
     visits.pop_back();
     if (count % kFoldersBetweenPulls == 0) {
@@ -680,6 +714,86 @@ void Watcher::RootGone(Root& root) {
   Drop(std::exchange(root.folder, kNoFolder));
 }
 
+void Watcher::CheckPath(const std::string& path) const {
+  VEXLO_CHECK(!IsNormalised(path, options_.ignored_names), ERR_BAD_PARAMETER,
+              "not an absolute, normalised path outside what is ignored, path=" + path);
+  const Fd fd = options_.takes_missing_roots ? Fd() : OpenDirectory(path);
+  VEXLO_CHECK(!fd && !options_.takes_missing_roots, ERR_SYSTEM,
+              "cannot be watched as a folder, path=" + path + ", reason=" + strerror(errno));
+}
+
+// Neither above nor below a root, nor one itself.
+bool Watcher::IsApart(const std::string& path) const {
+  return std::none_of(roots_.begin(), roots_.end(), [&](const Root& root) {
+    return root.path == path || IsBelow(root.path, path) || IsBelow(path, root.path);
+  });
+}
+
+bool Watcher::AddRoot(const std::string& path, TimePoint now) {
+  CheckPath(path);
+  if (!IsApart(path)) {
+    return false;
+  }
+  now_ = now;
+  roots_.push_back({path});
+  Walk({{kNoFolder, path, true}}, {});
+  roots_.back().folder = tree_.Find(kNoFolder, path);
+  LogChangedState();
+  return true;
+}
+
+bool Watcher::RemoveRoot(const std::string& path) {
+  const auto found = std::find_if(roots_.begin(), roots_.end(),
+                                  [&](const Root& root) { return root.path == path; });
+  if (found == roots_.end()) {
+    return false;
+  }
+  const Root root = *found;
+  roots_.erase(found);
+  if (!IsApart(path)) {
+    roots_.push_back(root);
+    return false;
+  }
+  if (root.folder != kNoFolder) {
+    Drop(root.folder);
+  }
+  LogChangedState();
+  return true;
+}
+
+void Watcher::CheckRoots(TimePoint now) {
+  now_ = now;
+  CheckMounts();
+  CheckRoots();
+  LogChangedState();
+}
+
+// A folder that something is mounted on, or no longer, is another one from then on, and no event
+// says so: it is looked at from the innermost folder that is known on its way.
+void Watcher::CheckMounts() {
+  std::set<std::string> mounts = MountsNow();
+  std::vector<std::string> changed;
+  std::set_symmetric_difference(mounts.begin(), mounts.end(), mounts_.begin(), mounts_.end(),
+                                std::back_inserter(changed));
+  mounts_ = std::move(mounts);
+  for (const std::string& mount : changed) {
+    const std::string path = mount.substr(0, mount.find('\0'));
+    for (const Root& root : roots_) {
+      if (root.folder != kNoFolder && IsBelow(path, root.path)) {
+        FolderId folder = root.folder;
+        size_t at = root.path.size() == 1 ? 0 : root.path.size();
+        for (FolderId next = folder; next != kNoFolder && at < path.size();) {
+          const size_t slash = std::min(path.find('/', at + 1), path.size());
+          next = tree_.Find(folder, std::string_view(path).substr(at + 1, slash - at - 1));
+          folder = next == kNoFolder ? folder : next;
+          at = slash;
+        }
+        unsettled_.insert(folder);
+      }
+    }
+  }
+}
+
 void Watcher::CheckRoots() {
   for (Root& root : roots_) {
     if (root.folder != kNoFolder && !Stands(root)) {
@@ -760,7 +874,7 @@ void Watcher::LogChangedState() {
 // --- Reporting
 
 bool Watcher::IsHidden(const std::string& path, std::string_view name) const {
-  return name == kExtraFolder || ignored_.count(path) != 0;
+  return IsAmong(options_.ignored_names, name) || ignored_.count(path) != 0;
 }
 
 Watcher::Standing Watcher::WhatStands(FolderId parent, const std::string& name) const {

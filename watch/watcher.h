@@ -7,6 +7,8 @@
 #include <cstdint>
 #include <functional>
 #include <optional>
+#include <set>
+#include <stop_token>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -30,6 +32,17 @@ struct WatchOptions {
   std::chrono::milliseconds move_wait{50};
   // Full paths that are never reported: the files that the caller writes the events into.
   std::vector<std::string> ignored = {};
+  // Names: what is called so, at any depth, is neither watched nor reported.
+  std::vector<std::string> ignored_names = {"@eaDir"};
+  // Take a root that does not stand at the start for one that is gone, instead of throwing.
+  bool takes_missing_roots = false;
+  // Look also while all is live, every `rescan_interval`, whether the roots still stand: no event
+  // tells of a mount over one or below it, or of a move of a folder above. Without it there is no
+  // deadline at rest, and the caller calls CheckRoots() when it learns of such things.
+  bool polls_roots = true;
+  // Ends a walk under way when it is asked to stop. Of no use from then on, the watcher is only to
+  // be destroyed.
+  std::stop_token stop = {};
 };
 
 struct WatchState {
@@ -41,8 +54,8 @@ struct WatchState {
   std::vector<std::string> gone;  // Roots that do not stand at the moment.
 };
 
-// - Symbolic links are reported as files and never followed. Folders (and anything else) named
-//   "@eaDir" and what is below them are neither watched nor reported. Mount points are crossed.
+// - Symbolic links are reported as files and never followed. What is named as `ignored_names` has
+//   it, and what is below, is neither watched nor reported. Mount points are crossed.
 // - An event has one bit. A rename has both paths; what is moved in from outside is a create, what
 //   is moved out a delete. Order is the kernel's.
 // - A folder that appears is watched and then read, and what is in it reported as created, so a
@@ -59,14 +72,15 @@ struct WatchState {
 // See FolderTree on memory. Not for concurrent use; has no thread of its own.
 class Watcher {
  public:
-  // Called from Poll() only. It must not throw and not call back.
+  // Called from Poll(), AddRoot() and CheckRoots() only. It must not throw and not call back.
   using Sink = std::function<void(QueueEvent&&)>;
 
   // Watches what is below `roots`, absolute paths without "." or ".." and without a slash at the
   // end (other than "/"). What is there already is not reported. A root below another one is
   // reported by it. Blocks until all folders are read. Throws Error 120 for a root that is no such
-  // path, 502 for one that cannot be opened as a folder (a symbolic link is none), 502 when the
-  // kernel has no more inotify instances or descriptors.
+  // path or lies in something ignored, 502 for one that cannot be opened as a folder (a symbolic
+  // link is none) unless `takes_missing_roots`, 502 when the kernel has no more inotify instances
+  // or descriptors.
   Watcher(const std::vector<std::string>& roots, WatchOptions options, Sink sink, TimePoint now);
   ~Watcher() = default;
   Watcher(const Watcher&) = delete;
@@ -81,6 +95,16 @@ class Watcher {
   void Poll(TimePoint now);
 
   TimePoint NextDeadline() const;
+
+  // Watches one more root, or one less, and nothing is missed of the others meanwhile. False, and
+  // nothing has changed, for one that is there already or is not there, and where one of two roots
+  // is below the other. AddRoot() blocks and throws as the constructor does.
+  bool AddRoot(const std::string& path, TimePoint now);
+  bool RemoveRoot(const std::string& path);
+
+  // Looks at once which roots stand and what is mounted below them, as Poll() does every
+  // `rescan_interval`.
+  void CheckRoots(TimePoint now);
 
   WatchState State() const;
 
@@ -138,6 +162,10 @@ class Watcher {
   Root* RootOf(FolderId folder);
   void RootGone(Root& root);
   void CheckRoots();
+  void CheckMounts();
+  void CheckPath(const std::string& path) const;
+  bool IsApart(const std::string& path) const;
+  bool IsAtRest() const;
   void Rescan();
   void LogChangedState();
 
@@ -166,6 +194,7 @@ class Watcher {
   std::unordered_set<FolderId> unsettled_;
   std::vector<FolderId> rescan_;  // What is left of the rescan under way.
   TimePoint next_rescan_;
+  std::set<std::string> mounts_;      // As they were at the last look, before anything was opened.
   std::vector<std::string> changed_;  // Folders to report for a reindex when the walk is over.
   size_t removed_watches_ = 0;
   std::string logged_;  // The state that was logged last; empty before the first.

@@ -83,6 +83,29 @@ bool DressLike(int fd, const std::string& path) {
   return fchmod(fd, 0644) == 0;
 }
 
+// For the holder of the file's lock. The call that failed, with errno, or nullptr.
+const char* AppendUnderLock(const std::string& path, const std::string& lines) {
+  ScopedFd fd(open(path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0644));
+  struct stat info {};
+  if (!fd.IsOpen() || fstat(fd.Get(), &info) != 0) {
+    return "open";
+  }
+  char last = '\n';
+  if (info.st_size > 0 && pread(fd.Get(), &last, 1, info.st_size - 1) != 1) {
+    return "read";
+  }
+  // One write, so that a reader without the lock sees as little of a part as can be.
+  if (!(last == '\n' ? WriteAll(fd.Get(), lines) : WriteAll(fd.Get(), "\n" + lines))) {
+    const int saved = errno;
+    if (ftruncate(fd.Get(), info.st_size) != 0) {
+      LogFailure({VEXLO_SOURCE, __LINE__, __func__, "ftruncate(fd, size) != 0"}, errno);
+    }
+    errno = saved;
+    return "write";
+  }
+  return fd.Close() ? nullptr : "write";
+}
+
 }  // namespace
 
 std::string RealPath(const std::string& path) {
@@ -178,24 +201,14 @@ bool ReplaceFile(const std::string& path, const std::string& content) {
 
 void AppendLines(const std::string& path, const std::string& lines) {
   const LockFile lock(path, /*exclusive=*/true);
-  ScopedFd fd(open(path.c_str(), O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0644));
-  struct stat info {};
-  VEXLO_CHECK(!fd.IsOpen() || fstat(fd.Get(), &info) != 0, ERR_SYSTEM,
-              "open failed, path=" + path + ", reason=" + strerror(errno));
-  char last = '\n';
-  VEXLO_CHECK(info.st_size > 0 && pread(fd.Get(), &last, 1, info.st_size - 1) != 1, ERR_SYSTEM,
-              "read failed, path=" + path + ", reason=" + strerror(errno));
-  // One write, so that a reader without the lock sees as little of a part as can be.
-  const bool written = last == '\n' ? WriteAll(fd.Get(), lines) : WriteAll(fd.Get(), "\n" + lines);
-  if (!written) {
-    const int saved = errno;
-    if (ftruncate(fd.Get(), info.st_size) != 0) {
-      LogFailure({VEXLO_SOURCE, __LINE__, __func__, "ftruncate(fd, size) != 0"}, errno);
-    }
-    errno = saved;
-  }
-  VEXLO_CHECK(!written || !fd.Close(), ERR_SYSTEM,
-              "write failed, path=" + path + ", reason=" + strerror(errno));
+  const char* const failed = AppendUnderLock(path, lines);
+  VEXLO_CHECK(failed != nullptr, ERR_SYSTEM,
+              std::string(failed) + " failed, path=" + path + ", reason=" + strerror(errno));
+}
+
+bool TryAppendLines(const std::string& path, const std::string& lines) {
+  const LockFile lock(path, /*exclusive=*/true, std::try_to_lock);
+  return lock.IsHeld() && AppendUnderLock(path, lines) == nullptr;
 }
 
 }  // namespace vexlo

@@ -89,6 +89,27 @@ LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(pat
   throw Error(ERR_LOCK, "Exceed max retry, path=" + path_);
 }
 
+LockFile::LockFile(const std::string& path, bool exclusive, std::try_to_lock_t)
+    : fd_(-1), path_(path) {
+  for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
+    const int fd = OpenLockFile(path_.c_str());
+    if (fd < 0) {
+      return;
+    }
+    const bool locked = flock(fd, (exclusive ? LOCK_EX : LOCK_SH) | LOCK_NB) == 0;
+    if (locked && IsStillAt(fd, path_.c_str())) {
+      fd_ = fd;
+      return;
+    }
+    const int error = locked ? EWOULDBLOCK : errno;
+    close(fd);
+    errno = error;
+    if (!locked) {
+      return;
+    }
+  }
+}
+
 LockFile::~LockFile() {
   if (fd_ >= 0) {
     flock(fd_, LOCK_UN);

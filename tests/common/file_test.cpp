@@ -7,6 +7,7 @@
 #include <tuple>
 
 #include "common/error.h"
+#include "common/lock.h"
 #include "kavo/acl.h"
 #include "support/faults.h"
 #include "support/syslog_capture.h"
@@ -112,10 +113,14 @@ TEST_F(File, AFailureLeavesTheOldContentAndNothingElse) {
     SCOPED_TRACE(function);
     WriteText(path_, "old\ntorn");
     max_write = 1;
-    for (const bool append : {false, true}) {
+    for (const char* const deed : {"replace", "append", "try"}) {
       const ScopedFault fault(function, error, nth);
-      if (append && error == ENOSPC) {
+      const bool append = deed != std::string("replace");
+      if (deed == std::string("append") && error == ENOSPC) {
         EXPECT_THROW(AppendLines(path_, "a\nb\n"), Error);
+      } else if (append && error == ENOSPC) {
+        EXPECT_FALSE(TryAppendLines(path_, "a\nb\n"));
+        EXPECT_EQ(errno, ENOSPC);
       } else if (!append) {
         EXPECT_FALSE(ReplaceFile(path_, "a\nb\n"));
         EXPECT_EQ(errno, error);
@@ -133,6 +138,11 @@ TEST_F(File, AppendedLinesStandAlone) {
     WriteText(path_, before);
     AppendLines(path_, "new\n");
     EXPECT_EQ(ReadText(path_), before + (before.ends_with("o") ? "\nnew\n" : "new\n"));
+    EXPECT_TRUE(TryAppendLines(path_, "newer\n"));
+    const LockFile lock(path_, /*exclusive=*/true);
+    EXPECT_FALSE(TryAppendLines(path_, "newest\n"));
+    EXPECT_EQ(errno, EWOULDBLOCK);
+    EXPECT_TRUE(ReadText(path_).ends_with("new\nnewer\n"));
   }
 }
 

@@ -82,6 +82,9 @@ TEST(Lock, SharedOnesCoexistAndAnExclusiveOneWaitsForAll) {
   };
   const LockFile exclusive(kPath, /*exclusive=*/true);
   EXPECT_EQ(pauses.size(), 66U);
+  EXPECT_FALSE(LockFile(kPath, /*exclusive=*/false, std::try_to_lock).IsHeld());
+  EXPECT_EQ(errno, EWOULDBLOCK);
+  EXPECT_EQ(pauses.size(), 66U) << "trying does not wait";
 }
 
 TEST(Lock, WhatCannotBeOpenedOrLockedFailsAtOnce) {
@@ -113,6 +116,14 @@ TEST(Lock, LocksTheFileThatThePathNamesNow) {
     EXPECT_TRUE(pauses.empty()) << "nobody to wait for";
     EXPECT_NE(Failure(kPath, true), "") << "a second holder";
     pauses.clear();
+  }
+  for (const auto& move : moves) {
+    WriteText(kPath, "");
+    WriteText(kFolder / "new", "");
+    before_flock = move;
+    const LockFile lock(kPath, /*exclusive=*/true, std::try_to_lock);
+    EXPECT_TRUE(lock.IsHeld());
+    EXPECT_FALSE(LockFile(kPath, /*exclusive=*/true, std::try_to_lock).IsHeld());
   }
   EXPECT_EQ(Failure(kFolder / "snapshot", true), "");
 }

@@ -182,6 +182,41 @@ TEST_F(WatcherTest, RootThatGoesAndComesBack) {
   }
 }
 
+TEST_F(WatcherTest, RootsComeAndGoWithoutAGapForTheOthers) {
+  Do("mkdir a b b/c; > a/f");
+  Start({in_ + "/a"}, {.ignored_names = {"bin"}, .takes_missing_roots = true});
+  Do("mkdir a/d; mkdir b/bin b/@eaDir");
+  EXPECT_TRUE(watcher_->AddRoot(in_ + "/b", now_));
+  EXPECT_TRUE(watcher_->AddRoot(in_ + "/later", now_));
+  for (const char* const path : {"/b", "/b/c", ""}) {
+    EXPECT_FALSE(watcher_->AddRoot(in_ + path, now_)) << path;
+  }
+  EXPECT_ANY_THROW(watcher_->AddRoot(in_ + "/bin/x", now_));
+  EXPECT_EQ(watcher_->State().gone, std::vector<std::string>{in_ + "/later"});
+  Do("> b/c/f; > b/bin/f; > b/@eaDir/f; mkdir later");
+  watcher_->CheckRoots(now_);
+  EXPECT_EQ(Text(Take()),
+            "create later/, create a/d/, create b/c/f, write b/c/f, create b/@eaDir/f, write "
+            "b/@eaDir/f");
+  EXPECT_TRUE(watcher_->RemoveRoot(in_ + "/a"));
+  EXPECT_FALSE(watcher_->RemoveRoot(in_ + "/a"));
+  Do("> a/g; > b/g");
+  EXPECT_EQ(Text(Take()), "create b/g, write b/g");
+}
+
+TEST_F(WatcherTest, WithoutPollingOfRootsThereIsNoDeadlineAtRest) {
+  Do("mkdir a");
+  Start({in_ + "/a", in_ + "/b"}, {.takes_missing_roots = true, .polls_roots = false});
+  Take();
+  EXPECT_NE(watcher_->NextDeadline(), TimePoint::max()) << "one is gone";
+  Do("mkdir b");
+  EXPECT_EQ(Text(Take(kRescan)), "create b/");
+  EXPECT_EQ(watcher_->NextDeadline(), TimePoint::max());
+  Do("> a/f");
+  Take();
+  EXPECT_EQ(watcher_->NextDeadline(), TimePoint::max());
+}
+
 TEST_F(WatcherTest, AnotherFolderInARootsPlaceIsANewOne) {
   Clear();
   Do("mkdir -p r/d");

@@ -11,7 +11,7 @@
 namespace EVNOTIFYD {
 
 // Stored in registrations: never renumber.
-enum MonitorQueueType {
+enum MonitorQueueType : int {
   MONITOR_QUEUE_TYPE_APPLICATION = 1,
 };
 

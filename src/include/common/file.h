@@ -69,6 +69,11 @@ VEXLO_EXPORT bool ReplaceFile(const std::string& path, const std::string& conten
 // there.
 VEXLO_EXPORT void AppendLines(const std::string& path, const std::string& lines);
 
+// The same for those who cannot wait and try again later: false when the lock is held by somebody
+// else (errno EWOULDBLOCK), and at any failure. Nothing is logged, but a file that could not be cut
+// back.
+VEXLO_EXPORT bool TryAppendLines(const std::string& path, const std::string& lines);
+
 }  // namespace vexlo
 
 #endif  // COMMON_FILE_H_

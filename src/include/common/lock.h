@@ -4,6 +4,7 @@
 
 #include <pthread.h>
 
+#include <mutex>
 #include <string>
 
 #include "common/export.h"
@@ -52,9 +53,14 @@ class VEXLO_EXPORT LockFile {
   // `exclusive`. Throws Error 506 when the path cannot be opened (a symbolic link is refused) or
   // locked, or the tries are used up.
   LockFile(const std::string& path, bool exclusive);
+  // Takes the lock if it is free now; IsHeld() says whether it was. Where it was not, errno is
+  // EWOULDBLOCK while somebody holds it, else what open or flock failed with. Nothing is logged.
+  LockFile(const std::string& path, bool exclusive, std::try_to_lock_t);
   ~LockFile();
   LockFile(const LockFile&) = delete;
   LockFile& operator=(const LockFile&) = delete;
+
+  bool IsHeld() const { return fd_ >= 0; }
 
  private:
   int fd_;

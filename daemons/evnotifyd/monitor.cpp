@@ -1,0 +1,196 @@
+#include "daemons/evnotifyd/monitor.h"
+
+#include <fcntl.h>
+#include <sys/inotify.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <filesystem>
+#include <string_view>
+#include <utility>
+
+#include "common/check.h"
+#include "common/error.h"
+
+namespace vexlo::evnotifyd {
+namespace {
+
+using kavo::local::RegisteredQueue;
+
+// Several registrations that are changed one after the other are one change.
+constexpr std::chrono::milliseconds kDebounce(50);
+constexpr uint32_t kFolderMask =
+    IN_MOVED_TO | IN_MOVED_FROM | IN_CLOSE_WRITE | IN_DELETE | IN_ONLYDIR;
+
+}  // namespace
+
+Monitor::Monitor(const FeederOptions& options)
+    : options_(options),
+      folder_(kavo::local::MonitorQueuesFolder()),
+      registrations_(inotify_init1(IN_NONBLOCK | IN_CLOEXEC)),
+      mounts_(open("/proc/self/mountinfo", O_RDONLY | O_CLOEXEC)) {
+  std::error_code error;
+  std::filesystem::create_directories(folder_, error);
+  VEXLO_CHECK(static_cast<bool>(error), ERR_SYSTEM,
+              "the folder cannot be made, path=" + folder_ + ", reason=" + error.message());
+  WatchFolder();
+  Read();
+  thread_ = std::jthread([this](const std::stop_token& stop) { Run(stop); });
+}
+
+Monitor::~Monitor() {
+  thread_.request_stop();
+  wake_.Raise();
+  thread_.join();
+  std::vector<Queue> queues;
+  for (auto& [key, queue] : queues_) {
+    queues.push_back(std::move(queue));
+  }
+  Stop(std::move(queues), /*discard=*/false);
+}
+
+void Monitor::Run(const std::stop_token& stop) {
+  TimePoint read_at = TimePoint::max();
+  while (!stop.stop_requested()) {
+    // Without a watch there is only time to go by.
+    const bool blind = !folder_watched_ || !root_paths_.IsComplete();
+    const TimePoint look_at = blind ? Clock::now() + options_.rescan : TimePoint::max();
+    std::vector<pollfd> fds = {{registrations_.Get(), POLLIN, 0},
+                               {mounts_.Get(), POLLPRI, 0},
+                               {root_paths_.fd(), POLLIN, 0}};
+    wake_.Wait(fds, std::min(read_at, look_at));
+    if (TakeFolderEvents()) {
+      read_at = std::min(read_at, Clock::now() + kDebounce);
+    }
+    const bool looks = blind && Clock::now() >= look_at;
+    if (looks || Clock::now() >= read_at) {
+      read_at = TimePoint::max();
+      WatchFolder();
+      Read();
+    }
+    if (root_paths_.HasChanged() || fds[1].revents != 0 || looks) {
+      CheckRoots();
+    }
+  }
+}
+
+// The folder is made anew when somebody has removed it; where it was watched before, nothing
+// changes.
+void Monitor::WatchFolder() {
+  std::error_code error;
+  std::filesystem::create_directories(folder_, error);
+  const bool was_watched = std::exchange(
+      folder_watched_, inotify_add_watch(registrations_.Get(), folder_.c_str(), kFolderMask) >= 0);
+  if (!folder_watched_ && was_watched) {
+    LogLine(VEXLO_SOURCE, __LINE__,
+            "registrations are looked at time after time, as they cannot be watched, path=" +
+                folder_ + ", reason=" + std::system_category().message(errno));
+  }
+}
+
+// True when a registration may have changed.
+bool Monitor::TakeFolderEvents() {
+  bool changed = false;
+  alignas(inotify_event) char events[1 << 12];
+  ssize_t length = 0;
+  while ((length = read(registrations_.Get(), events, sizeof(events))) > 0 ||
+         (length < 0 && errno == EINTR)) {
+    for (ssize_t at = 0; at < length;) {
+      const auto* event = reinterpret_cast<const inotify_event*>(events + at);
+      // Without a name it is about the folder.
+      changed = changed || event->len == 0 ||
+                std::string_view(static_cast<const char*>(event->name)).ends_with(".json");
+      at += static_cast<ssize_t>(sizeof(inotify_event) + event->len);
+    }
+  }
+  return changed;
+}
+
+void Monitor::Read() {
+  kavo::local::MonitorQueues read;
+  try {
+    read = kavo::local::ReadMonitorQueues();
+  } catch (const kavo::local::MonitorQueuesError& error) {
+    LogLine(VEXLO_SOURCE, __LINE__, error.what());
+    return;
+  }
+  for (const auto& [app, fault] : read.unreadable) {
+    if (unreadable_[app] != fault) {
+      LogLine(VEXLO_SOURCE, __LINE__, fault + "; its queues stay as they were");
+    }
+  }
+  unreadable_ = read.unreadable;
+  std::map<Key, RegisteredQueue> wanted;
+  for (RegisteredQueue& queue : read.queues) {
+    wanted.emplace(Key(queue.app, queue.queue, queue.type), std::move(queue));
+  }
+  std::vector<Queue> ended;
+  {
+    const std::lock_guard<std::mutex> lock(mutex_);
+    for (auto queue = queues_.begin(); queue != queues_.end();) {
+      const bool stays =
+          wanted.count(queue->first) != 0 || unreadable_.count(queue->second.registered.app) != 0;
+      if (!stays) {
+        ended.push_back(std::move(queue->second));
+      }
+      queue = stays ? std::next(queue) : queues_.erase(queue);
+    }
+    for (auto& [key, registered] : wanted) {
+      Queue& queue = queues_[key];
+      if (queue.watch == nullptr) {
+        queue.watch = std::make_unique<QueueWatch>(registered, options_);
+      } else if (queue.registered != registered) {
+        queue.watch->SetFolders(registered.folders);
+      }
+      queue.registered = std::move(registered);
+    }
+  }
+  Stop(std::move(ended), /*discard=*/true);
+  CheckRoots();
+}
+
+// All at once, so that they are not waited for one by one.
+void Monitor::Stop(std::vector<Queue> queues, bool discard) {
+  for (const Queue& queue : queues) {
+    queue.watch->RequestStop(discard);
+  }
+}
+
+// What is watched on the way comes first: a root that comes between the two is seen by both.
+void Monitor::CheckRoots() {
+  std::set<std::string> roots;
+  for (const auto& [key, queue] : queues_) {
+    for (const kavo::local::MonitoredFolder& folder : queue.registered.folders) {
+      roots.insert(folder.path);
+    }
+  }
+  root_paths_.Set(roots);
+  for (const auto& [key, queue] : queues_) {
+    queue.watch->CheckRoots();
+  }
+}
+
+Json::Value Monitor::Stats() const {
+  Json::Value queues(Json::arrayValue);
+  const std::lock_guard<std::mutex> lock(mutex_);
+  for (const auto& [key, queue] : queues_) {
+    const QueueStats stats = queue.watch->Stats();
+    Json::Value value(Json::objectValue);
+    value["queue"] = stats.queue;
+    value["roots"] = Json::arrayValue;
+    for (const std::string& root : stats.roots) {
+      value["roots"].append(root);
+    }
+    value["watches"] = Json::UInt64{stats.watches};
+    value["state"] = stats.live ? "live" : "degraded";
+    value["reason"] = stats.reason;
+    value["lines"] = Json::UInt64{stats.lines};
+    value["overflows"] = Json::UInt64{stats.overflows};
+    queues.append(std::move(value));
+  }
+  Json::Value answer(Json::objectValue);
+  answer["queues"] = std::move(queues);
+  return answer;
+}
+
+}  // namespace vexlo::evnotifyd

@@ -1,0 +1,449 @@
+// The notify daemon as a service manager runs it, on real folders.
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <chrono>
+#include <fstream>
+#include <functional>
+#include <map>
+#include <optional>
+#include <thread>
+#include <vector>
+
+#include "common/json.h"
+#include "common/lock.h"
+#include "kavo/monitor_queue.h"
+#include "support/private_mounts.h"
+#include "support/private_root.h"
+#include "support/program.h"
+#include "support/raw_client.h"
+
+namespace {
+
+using namespace std::chrono_literals;
+using EVNOTIFYD::MONITOR_QUEUE_TYPE_APPLICATION;
+using EVNOTIFYD::MonitorQueue;
+
+constexpr uint32_t kMask = 0xFFCC;
+const PrivateRoot kRoot;
+
+class EvnotifydTest : public testing::Test {
+ protected:
+  void SetUp() override {
+    for (const auto& entry : std::filesystem::directory_iterator(kRoot.Path())) {
+      std::filesystem::remove_all(entry);
+    }
+    kRoot.MakeFolder("var/lib/kavo/fileindex/queue");
+    kRoot.MakeFolder("share");
+  }
+  void TearDown() override {
+    if (program_.has_value()) {
+      EXPECT_EQ(program_->End(SIGTERM), 0) << program_->text;
+    }
+  }
+
+  void Start(const std::string& arguments = "") {
+    program_.emplace("export FILEINDEX_ROOT=" + kRoot.Path(),
+                     EVNOTIFYD_PROGRAM " " + arguments + " 2>&1");
+    ASSERT_TRUE(program_->Await("ready\n")) << program_->text;
+  }
+  int End(int signal) {
+    const int status = program_->End(signal);
+    program_.reset();
+    return status;
+  }
+  // Runs the commands in the folder of this name.
+  void Do(const std::string& folder, const std::string& commands) const {
+    const std::string all = "set -e; cd '" + kRoot / folder + "';" + commands;
+    EXPECT_EQ(system(all.c_str()), 0) << commands;
+  }
+
+  std::string Queue(const std::string& name = "q") const {
+    return kRoot / ("var/lib/kavo/fileindex/queue/" + name);
+  }
+  // Registers these folders, each with its mask.
+  void Register(const std::map<std::string, uint32_t>& folders, const std::string& queue = "q") {
+    Json::Value description;
+    description["queue"] = Queue(queue);
+    for (const auto& [folder, mask] : folders) {
+      Json::Value entry;
+      entry["path"] = kRoot / folder;
+      entry["mask"] = mask;
+      entry["ignore"].append("@eaDir");
+      description["config"].append(entry);
+    }
+    ASSERT_TRUE(
+        MonitorQueue::Upsert(MonitorQueue(description), "app", MONITOR_QUEUE_TYPE_APPLICATION));
+  }
+
+  // The queue as "create f, rename d/ e/", with paths as they are seen from the root, without the
+  // first `skip` lines.
+  std::string Lines(const std::string& queue = "q", size_t skip = 0) const {
+    static const std::map<uint32_t, std::string> kNames = {
+        {0x4, "attr"},     {0x8, "write"},     {0x40, "create"},    {0x80, "delete"},
+        {0x100, "rename"}, {0x200, "crashed"}, {0x10000, "reindex"}};
+    const std::string all = ReadText(Queue(queue));
+    // A line that is being written is none yet.
+    std::istringstream queued(all.substr(0, all.rfind('\n') + 1));
+    std::string text;
+    for (std::string line; std::getline(queued, line);) {
+      if (skip > 0) {
+        --skip;
+        continue;
+      }
+      Json::Value event;
+      EXPECT_TRUE(vexlo::JsonFromString(event, line)) << line;
+      EXPECT_TRUE(event["data"].isNull());
+      text += (text.empty() ? "" : ", ") + kNames.at(event["event"].asUInt());
+      for (const std::string& path : {event["path_old"].asString(), event["path"].asString()}) {
+        EXPECT_TRUE(path.empty() || path.starts_with(kRoot.Path() + "/")) << line;
+        text += path.empty() ? "" : " " + path.substr(kRoot.Path().size() + 1);
+        text += event["is_dir"].asBool() && !path.empty() ? "/" : "";
+      }
+    }
+    return text;
+  }
+  size_t CountLines(const std::string& queue = "q") const {
+    const std::string text = ReadText(Queue(queue));
+    return static_cast<size_t>(std::count(text.begin(), text.end(), '\n'));
+  }
+
+  // Waits until it holds, for as long as a busy machine may take.
+  static bool Await(const std::function<bool()>& holds) {
+    const auto deadline = std::chrono::steady_clock::now() + 20s;
+    while (!holds()) {
+      if (std::chrono::steady_clock::now() > deadline) {
+        return false;
+      }
+      std::this_thread::sleep_for(2ms);
+    }
+    return true;
+  }
+  // Waits until the queue, without its first lines, is this.
+  void AwaitLines(const std::string& want, const std::string& queue = "q", size_t skip = 0) const {
+    EXPECT_TRUE(Await([&] { return Lines(queue, skip) == want; }))
+        << "the queue holds " << Lines(queue, skip) << "\nand shall hold   " << want;
+  }
+
+  // The daemon's answer about one queue.
+  Json::Value Stats(const std::string& queue = "q") const {
+    Json::Value answer;
+    EXPECT_TRUE(vexlo::JsonFromString(
+        answer, Ask(kRoot / "var/run/evnotifyd.sock", R"({"command":"stats"})")));
+    for (const Json::Value& stats : answer["queues"]) {
+      if (stats["queue"] == Queue(queue)) {
+        return stats;
+      }
+    }
+    return {};
+  }
+  void AwaitState(const std::string& state, const std::string& reason) const {
+    EXPECT_TRUE(Await([&] {
+      const Json::Value stats = Stats();
+      return stats["state"] == state &&
+             stats["reason"].asString().find(reason) != std::string::npos;
+    })) << vexlo::JsonToString(Stats());
+  }
+
+  std::optional<Program> program_;
+};
+
+TEST_F(EvnotifydTest, DeedsAndTheirLines) {
+  Start();
+  // What is there when the share is registered, what is done then, and what the queue holds. The
+  // kernel makes one of two events that are alike and follow each other.
+  const char* const cases[][4] = {
+      {"File", "", "> f; chmod 600 f; echo >> f; rm f",
+       "create s/f, write s/f, attr s/f, write s/f, delete s/f"},
+      {"Renamed", "mkdir d; > f", "mv f g; mv g d; mv d e",
+       "rename s/f s/g, rename s/g s/d/g, rename s/d/ s/e/"},
+      {"MovedInAndOut", "> f; mkdir d; > ../out/g", "mv f ../out/h; mv ../out/g .; mv d ../out",
+       "delete s/f, create s/g, delete s/d/"},
+      {"HardLink", "> f", "ln f g", "create s/g"},
+      {"Folder", "", "mkdir a; mkdir a/b; > a/b/f; rm -r a",
+       "create s/a/, create s/a/b/, create s/a/b/f, write s/a/b/f, delete s/a/b/f, delete s/a/b/, "
+       "delete s/a/"},
+      {"OddNames", "> 'a b'", "mv 'a b' '\n\"'; ln '\n\"' $(printf '\\351'); rm $(printf '\\351')",
+       "rename s/a b s/\n\", create s/\xE9, delete s/\xE9"},
+      {"ExtraFolder", "> f", "mkdir @eaDir; > @eaDir/f; mv f @eaDir", "delete s/f"},
+  };
+  for (const auto& [name, before, deeds, want] : cases) {
+    SCOPED_TRACE(name);
+    std::filesystem::remove_all(kRoot / "out");
+    Do(kRoot.MakeFolder("out").substr(kRoot.Path().size() + 1), "");
+    Do(kRoot.MakeFolder("s").substr(kRoot.Path().size() + 1), before);
+    Register({{"s", kMask}}, name);
+    AwaitLines("reindex s/", name);
+    // A folder that is new is known before more happens in it, or what is in it may come twice.
+    std::string step;
+    for (std::istringstream steps(deeds); std::getline(steps, step, ';');) {
+      const size_t count = CountLines(name);
+      Do("s", step);
+      if (step.find("mkdir a") != std::string::npos) {
+        EXPECT_TRUE(Await([&] { return CountLines(name) > count; }));
+      }
+    }
+    AwaitLines(std::string("reindex s/, ") + want, name);
+    ASSERT_TRUE(MonitorQueue::Delete(Queue(name), "app", MONITOR_QUEUE_TYPE_APPLICATION));
+    EXPECT_TRUE(Await([&] { return Stats(name).isNull(); }));
+    std::filesystem::remove_all(kRoot / "s");
+    EXPECT_EQ(Lines(name), std::string("reindex s/, ") + want) << "nobody wants to know any more";
+  }
+}
+
+TEST_F(EvnotifydTest, ARegistrationThatGrowsLeavesTheRestAlone) {
+  kRoot.MakeFolder("other");
+  kRoot.MakeFolder("share/inner");
+  Register({{"share", kMask}});
+  Start();
+  AwaitLines("reindex share/");
+  Register({{"share", kMask}, {"other", kMask & ~0x100U}, {"later", kMask}});
+  AwaitLines("reindex share/, reindex other/");
+  AwaitState("degraded", kRoot / "later is gone");
+  Do("other", "> f; mv f g; mv g ../share");
+  AwaitLines(
+      "create other/f, write other/f, delete other/f, create other/g, delete other/g, "
+      "create share/g",
+      "q", 2);
+  kRoot.MakeFolder("later");
+  AwaitLines("reindex later/", "q", 8);
+  AwaitState("live", "");
+  // A file that is broken by hand costs nothing.
+  const std::string file = kRoot / "var/lib/kavo/evnotify/app.json";
+  const std::string good = ReadText(file);
+  WriteText(file, good.substr(0, good.size() / 2));
+  ASSERT_TRUE(program_->Await("its queues stay as they were\n"));
+  Do("share", "> f");
+  AwaitLines("create share/f, write share/f", "q", 9);
+  WriteText(file, good);
+  Register({{"share/inner", kMask}, {"share", kMask}});
+  AwaitLines("reindex share/, reindex share/inner/", "q", 11);
+  Do("share", "> inner/f; > ../other/f");
+  AwaitLines("create share/inner/f, write share/inner/f", "q", 13);
+  EXPECT_EQ(Stats()["roots"].size(), 2U);
+  EXPECT_EQ(Stats()["lines"], 15);
+}
+
+TEST_F(EvnotifydTest, ALimitOfWatchesIsSaidAndMadeUpFor) {
+  Do("share", "mkdir a b c");
+  Register({{"share", kMask}});
+  Start("--max-watches 3 --rescan 1");
+  AwaitState("degraded",
+             "1 folder of 4 not watched, but looked at every 1 s: 4 watches are needed, "
+             "3 allowed to this watcher");
+  EXPECT_EQ(Stats()["watches"], 3);
+  Do("share", "for d in a b c; do > $d/f; done");
+  EXPECT_TRUE(Await([&] {
+    const std::string lines = Lines();
+    return std::all_of(std::begin("abc"), std::end("abc") - 1, [&](char folder) {
+      const std::string path = std::string("share/") + folder + "/";
+      return lines.find("create " + path + "f, write " + path + "f") != std::string::npos ||
+             lines.find(", reindex " + path) != std::string::npos;
+    });
+  })) << Lines();
+  Do("share", "rm -r b");
+  AwaitState("live", "");
+  EXPECT_EQ(Stats()["watches"], 3);
+}
+
+TEST_F(EvnotifydTest, EventsThatTheKernelLosesAreTold) {
+  int limit = 0;
+  std::ifstream("/proc/sys/fs/inotify/max_queued_events") >> limit;
+  if (limit > 1'000'000) {
+    GTEST_SKIP() << "this system keeps " << limit << " events";
+  }
+  kRoot.MakeFolder("other");
+  Register({{"share", kMask}});
+  Register({{"other", kMask}}, "other");
+  Start();
+  AwaitLines("reindex share/");
+  AwaitLines("reindex other/", "other");
+  kill(program_->pid, SIGSTOP);
+  Do("share", "mkdir late; i=0; while [ $i -lt " + std::to_string(limit / 2 + 10) +
+                  " ]; do > f$i; i=$((i+1)); done; > late/f");
+  Do("other", "> f");
+  kill(program_->pid, SIGCONT);
+  AwaitLines("reindex other/, create other/f, write other/f", "other");
+  EXPECT_TRUE(Await([&] { return Lines().ends_with(", crashed share/"); })) << CountLines();
+  const size_t count = CountLines();
+  EXPECT_EQ(Stats()["overflows"], 1);
+  Do("share", "> late/g");
+  AwaitLines("create share/late/g, write share/late/g", "q", count);
+}
+
+TEST_F(EvnotifydTest, WhatHappensWhileItDoesNotRunIsMadeUpFor) {
+  Register({{"share", kMask}});
+  Start();
+  AwaitLines("reindex share/");
+  Do("share", "> f");
+  AwaitLines("reindex share/, create share/f, write share/f");
+  EXPECT_EQ(End(SIGKILL), 128 + SIGKILL);
+  Do("share", "mkdir d; > d/f");
+  std::ofstream(Queue(), std::ios::app) << R"({"event":8,"is_dir":fa)";
+  Start();
+  EXPECT_TRUE(Await([&] { return ReadText(Queue()).ends_with("\n"); }));
+  EXPECT_NE(ReadText(Queue()).find("\"is_dir\":fa\n{\"event\":65536,"), std::string::npos);
+  Do("share", "> d/g");
+  AwaitLines("create share/d/g, write share/d/g", "q", 5);
+}
+
+TEST_F(EvnotifydTest, AFolderThatIsGoneIsTakenUpAgain) {
+  kRoot.MakeFolder("volume/photo");
+  Register({{"volume/photo", kMask}});
+  std::filesystem::rename(kRoot / "volume", kRoot / "away");
+  Start();
+  AwaitState("degraded", kRoot / "volume/photo is gone");
+  EXPECT_EQ(Lines(), "");
+  std::filesystem::rename(kRoot / "away", kRoot / "volume");
+  AwaitLines("reindex volume/photo/");
+  Do("volume", "mv photo other; mkdir photo");
+  AwaitLines("delete volume/photo/, reindex volume/photo/", "q", 1);
+  Do("volume", "> photo/g");
+  AwaitLines("create volume/photo/g, write volume/photo/g", "q", 3);
+  Do("", "mv volume away");
+  AwaitLines("delete volume/photo/", "q", 5);
+  Do("", "> away/photo/h; mkdir -p volume/photo");
+  AwaitLines("reindex volume/photo/", "q", 6);
+  Do("volume", "rmdir photo; rmdir ../volume");
+  AwaitLines("delete volume/photo/", "q", 7);
+  AwaitState("degraded", kRoot / "volume/photo is gone");
+}
+
+TEST_F(EvnotifydTest, TheWayToAFolderMayLeadOverLinks) {
+  kRoot.MakeFolder("disk/volume/photo");
+  kRoot.MakeFolder("disk2/photo");
+  Do("", "ln -s disk/volume link");
+  Register({{"link/photo", kMask}});
+  Start();
+  AwaitLines("reindex link/photo/");
+  size_t count = 1;
+  for (const char* const deeds : {"mv disk/volume disk/v", "ln -sfn disk2 link", "rm link",
+                                  "mv disk disk3", "mkdir disk; mv disk3/v disk/volume"}) {
+    // Another folder for what stood there before, or none, or one again.
+    const bool stood = CountLines() == 1 || Stats()["state"] == "live";
+    Do("", deeds);
+    const bool stands = std::filesystem::exists(kRoot / "link/photo");
+    const std::string want = std::string(stood ? "delete link/photo/" : "") +
+                             (stood && stands ? ", " : "") + (stands ? "reindex link/photo/" : "");
+    AwaitLines(want, "q", count);
+    count = CountLines();
+    if (deeds == std::string("rm link")) {
+      Do("", "ln -s disk/volume link");
+    }
+  }
+  Do("link/photo", "> f");
+  AwaitLines("create link/photo/f, write link/photo/f", "q", count);
+}
+
+TEST_F(EvnotifydTest, AShareThatIsMountedIsReadAnew) {
+  Do("share", "> hidden");
+  Register({{"share", kMask}});
+  Start();
+  AwaitLines("reindex share/");
+  {
+    const ScopedMount mount = ScopedMount::Tmpfs(kRoot / "share");
+    SKIP_IF_REFUSED(mount);
+    AwaitLines("delete share/, reindex share/", "q", 1);
+    Do("share", "> f");
+    AwaitLines("create share/f, write share/f", "q", 3);
+  }
+  AwaitLines("delete share/, reindex share/", "q", 5);
+  // Mounted in it.
+  Do("share", "mkdir -p d/e");
+  EXPECT_TRUE(Await([&] { return Lines("q", 7).ends_with("create share/d/e/"); })) << Lines();
+  Do("share", "> d/e/hidden");
+  EXPECT_TRUE(Await([&] { return Lines("q", 7).ends_with("write share/d/e/hidden"); })) << Lines();
+  const size_t count = CountLines();
+  {
+    const ScopedMount mount = ScopedMount::Tmpfs(kRoot / "share/d/e");
+    AwaitLines("reindex share/d/", "q", count);
+    Do("share", "> d/e/f");
+    AwaitLines("create share/d/e/f, write share/d/e/f", "q", count + 1);
+  }
+  // Both the folder that is gone and the mounts that are left may tell of it.
+  EXPECT_TRUE(Await([&] { return Lines("q", count + 3).starts_with("reindex share/d/"); }));
+  Do("share", "> d/e/g");
+  EXPECT_TRUE(Await([&] { return Lines().ends_with(", create share/d/e/g, write share/d/e/g"); }))
+      << Lines();
+}
+
+TEST_F(EvnotifydTest, AQueueThatCannotBeWrittenWaitsAlone) {
+  kRoot.MakeFolder("other");
+  Register({{"share", kMask}});
+  Register({{"other", kMask}}, "other");
+  Start();
+  AwaitLines("reindex share/");
+  AwaitLines("reindex other/", "other");
+  {
+    const vexlo::LockFile lock(Queue(), /*exclusive=*/true);
+    Do("share", "> f");
+    AwaitState("degraded", "another process holds its lock");
+    Do("other", "> f");
+    AwaitLines("create other/f, write other/f", "other", 1);
+    EXPECT_EQ(Lines(), "reindex share/");
+    // As the index daemon takes what there is.
+    std::filesystem::rename(Queue(), Queue() + ".tmp");
+  }
+  AwaitLines("create share/f, write share/f");
+  AwaitState("live", "");
+}
+
+TEST_F(EvnotifydTest, AFullDiskLosesNothing) {
+  const ScopedMount disk = ScopedMount::Tmpfs(kRoot / "var/lib/kavo/fileindex/queue", "size=64k");
+  SKIP_IF_REFUSED(disk);
+  Register({{"share", kMask}});
+  Start();
+  AwaitLines("reindex share/");
+  EXPECT_FALSE(std::ofstream(disk / "filler") << std::string(1 << 20, 'x') << std::flush);
+  Do("share", "i=0; while [ $i -lt 100 ]; do > f$i; i=$((i+1)); done");
+  AwaitState("degraded", "No space left on device");
+  std::filesystem::remove(disk / "filler");
+  EXPECT_TRUE(Await([&] { return CountLines() == 201; })) << CountLines();
+  AwaitState("live", "");
+  EXPECT_EQ(Stats()["overflows"], 0);
+}
+
+TEST_F(EvnotifydTest, ItEndsSoonAndWithEverythingAppended) {
+  constexpr size_t kFiles = 3000;
+  Register({{"share", kMask}});
+  Register({{"share", kMask}}, "locked");
+  Start();
+  AwaitLines("reindex share/");
+  AwaitLines("reindex share/", "locked");
+  for (const bool locked : {false, true}) {
+    const std::optional<vexlo::LockFile> lock =
+        locked ? std::optional<vexlo::LockFile>(std::in_place, Queue("locked"), true)
+               : std::nullopt;
+    const size_t before = CountLines();
+    Do("share", "i=0; while [ $i -lt " + std::to_string(kFiles) + " ]; do > f$i" +
+                    (locked ? ".l" : "") + "; i=$((i+1)); done; > ../out; mv f0 ../out");
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_EQ(End(SIGTERM), 0);
+    EXPECT_LT(std::chrono::steady_clock::now() - start, 1s);
+    EXPECT_EQ(CountLines(), before + 2 * kFiles + 1);
+    EXPECT_TRUE(Lines().ends_with(", delete share/f0"));
+    if (!locked) {
+      EXPECT_EQ(CountLines("locked"), CountLines());
+      Do("share", "> f0");
+      Start();
+      EXPECT_TRUE(Await([&] { return CountLines() == before + 2 * kFiles + 2; }));
+      EXPECT_TRUE(Await([&] { return CountLines("locked") == CountLines(); }));
+    }
+  }
+}
+
+TEST_F(EvnotifydTest, SaysWhatItDoesNotTake) {
+  for (const char* const arguments :
+       {"--rescan", "--rescan 0", "--rescan 86401", "--max-watches x", "--max-watches 0", "more"}) {
+    Program program("export FILEINDEX_ROOT=" + kRoot.Path(),
+                    EVNOTIFYD_PROGRAM " " + std::string(arguments) + " 2>&1");
+    EXPECT_EQ(program.End(), 2) << arguments;
+    EXPECT_TRUE(program.text.starts_with("usage: evnotifyd [--rescan SECONDS]")) << arguments;
+  }
+  Start();
+  const std::string socket = kRoot / "var/run/evnotifyd.sock";
+  EXPECT_EQ(Ask(socket, R"({"command":"stats"})"), R"({"queues":[]})");
+  EXPECT_TRUE(Ask(socket, "stats").starts_with(R"({"error":{"code":120,)"));
+}
+
+}  // namespace

@@ -128,7 +128,7 @@ void Cycle::Carry(const fileindex::OP& op, const std::string& path) {
 
 void Cycle::Delete(const std::string& path) {
   indexer_.Drain();  // What was taken before must not come behind.
-  taken_.clear();
+  ForgetTaken(path);
   deletes_.append(DeleteItem(id_, path));
   deletes_.append(DeleteBelowItem(id_, path));
   if (deletes_.size() >= kMostDeletes) {
@@ -184,7 +184,8 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
   facts.old_inode = InodeOf(StampOfPath(path_old, /*content=*/false));
   facts.new_inode = InodeOf(now);
   const RenameStep step = PlanRename(facts);
-  taken_.clear();
+  ForgetTaken(path);
+  ForgetTaken(path_old);
   if (step == RenameStep::kMove) {
     has_sent_ = true;
     elastic::IndexRename(share_, path, path_old);
@@ -340,6 +341,12 @@ void Cycle::Submit(const std::string& path) {
     taken_[path] = *now;
   }
   indexer_.Upsert(path, content);
+}
+
+void Cycle::ForgetTaken(const std::string& path) {
+  taken_.erase(path);
+  // What lies below stands together, from "/" on and up to the byte behind it.
+  taken_.erase(taken_.lower_bound(path + "/"), taken_.lower_bound(path + "0"));
 }
 
 void Cycle::FlushDeletes() {

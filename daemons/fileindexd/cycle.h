@@ -9,7 +9,6 @@
 #include <memory>
 #include <optional>
 #include <string>
-#include <unordered_map>
 #include <vector>
 
 #include "daemons/fileindexd/crawl.h"
@@ -62,6 +61,7 @@ class Cycle {
   // Whether the path belongs into the index. One that does not exist does not.
   bool IsWanted(const std::string& path) const;
   void Submit(const std::string& path);
+  void ForgetTaken(const std::string& path);
   void FlushDeletes();
   // Returns when the engine has everything that was taken.
   void Settle();
@@ -83,7 +83,7 @@ class Cycle {
   bool state_changed_ = false;
   // What was taken in this cycle, as it was then: an editor's save is one rename and one change of
   // the same file.
-  std::unordered_map<std::string, Stamp> taken_;
+  std::map<std::string, Stamp> taken_;
   std::map<int, unsigned> failures_;
 };
 

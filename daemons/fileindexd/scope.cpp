@@ -61,7 +61,7 @@ bool Scope::Allows(const std::string& path) const {
 
 void Scope::CheckShare() const {
   const sdk::SDKShare share(share_);
-  if (!share.CanBeIndexed() || !IsDirExist(share_path_, /*follow_link=*/false)) {
+  if (!IsDirExist(share_path_, /*follow_link=*/false) || !share.CanBeIndexed()) {
     throw Error(ERR_SHARE_NOT_FOUND, share_ + " cannot be indexed at present");
   }
 }

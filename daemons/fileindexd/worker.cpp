@@ -8,6 +8,7 @@
 
 #include "common/check.h"
 #include "common/error.h"
+#include "common/file.h"
 #include "common/sdk/share.h"
 #include "daemons/fileindexd/consequence.h"
 #include "daemons/fileindexd/cycle.h"
@@ -153,7 +154,8 @@ Worker::Outcome Worker::RunCycle() {
   if (pause_.IsOn()) {
     return Outcome::kPaused;
   }
-  if (!share.CanBeIndexed()) {
+  // The folder first: of one that is not there the platform cannot tell whether it is read-only.
+  if (!IsDirExist(share.GetPath(), /*follow_link=*/false) || !share.CanBeIndexed()) {
     return Outcome::kUnavailable;
   }
   watch_.Forget();
@@ -163,22 +165,20 @@ Worker::Outcome Worker::RunCycle() {
   queue.PrepareTmpQueue();
   Cycle cycle(share_, share.GetPath(), SnapshotName(queue_path + ".tmp"), state_, stats_,
               [this] { return IsInterrupted(); });
-  const int entries = queue.ProcessOP(
-      [&cycle](std::shared_ptr<fileindex::OP> op) { cycle.Handle(*op); }, /*use_tmp=*/true);
+  queue.ProcessOP([&cycle](std::shared_ptr<fileindex::OP> op) { cycle.Handle(*op); },
+                  /*use_tmp=*/true);
   if (fills) {
     cycle.ReconcileShare();
   } else {
     cycle.ReconcileNewFolders();
   }
   cycle.Finish();
-  if (entries > 0) {
-    queue.DeleteTmp();
-  }
   if (fills) {
     StatusMgr().UnsetShareStatus(share_, kBothBits);
     state_.rebuilt = false;
     SaveShareState(ShareStateFile(share_), state_);
   }
+  queue.DeleteTmp();  // Also where its lines came down to nothing.
   wait_ = std::chrono::seconds(0);
   space_is_told_ = false;
   return Outcome::kDone;

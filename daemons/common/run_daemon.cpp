@@ -210,10 +210,10 @@ void Daemon::Ready() {
   syslog(LOG_NOTICE, "ready");
 }
 
-void Daemon::EndAtOnce(const std::string& reason) {
-  syslog(LOG_ERR, "ended at once: %s", reason.c_str());
+void Daemon::EndAtOnce(const std::string& reason, ExitStatus status) {
+  syslog(status == kEnded ? LOG_NOTICE : LOG_ERR, "ended at once: %s", reason.c_str());
   unlink(options_.pid_file.c_str());
-  _exit(kFailed);
+  _exit(status);
 }
 
 int RunDaemon(const DaemonOptions& options, int argc, char** argv,

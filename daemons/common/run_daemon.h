@@ -40,8 +40,9 @@ class Daemon {
   // Tells the service manager ($NOTIFY_SOCKET) and the log that clients may come now.
   void Ready();
 
-  // Ends the process without destructors, for work that cannot be brought to an end.
-  [[noreturn]] void EndAtOnce(const std::string& reason);
+  // Ends the process without destructors, for work that cannot be brought to an end; with kEnded
+  // where that is in order, as it is done again from what is on disk.
+  [[noreturn]] void EndAtOnce(const std::string& reason, ExitStatus status = kFailed);
 
  private:
   friend int RunDaemon(const DaemonOptions& options, int argc, char** argv,

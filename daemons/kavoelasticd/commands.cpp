@@ -73,11 +73,14 @@ Json::Value GetByQuery(Session& session, const Json::Value& data) {
     }
     names.push_back(name.asString());
   }
-  const size_t from = PageNumber(query, "from", 0);
-  const size_t size = PageNumber(query, "size", kDefaultPage);
+  if (!query["after"].isNull() && !query["after"].isString()) {
+    throw Failure(Code::kBadRequest, "after is no path");
+  }
+  const Page page = {query["after"].asString(), PageNumber(query, "from", 0),
+                     PageNumber(query, "size", kDefaultPage)};
   const Selection selection = session.Select(names);
   Json::Value hits(Json::arrayValue);
-  for (const int64_t id : Find(session, conditions, from, size)) {
+  for (const int64_t id : Find(session, conditions, page)) {
     if (auto document = session.Load(id)) {
       hits.append(session.Fields(&*document, selection));
     }

@@ -199,25 +199,28 @@ bool Fits(Session& session, StoredDocument* document, const Condition& condition
 }
 
 // One condition on the path: the order of the index is the order that is asked for.
-std::vector<int64_t> FindByPath(Session& session, const Condition& condition, size_t from,
-                                size_t size) {
+std::vector<int64_t> FindByPath(Session& session, const Condition& condition, const Page& page) {
   std::vector<int64_t> ids;
   const std::string text = condition.value.asString();
+  // One bound, as the database uses no more of them to find the first row.
+  const std::string begin = page.after < text ? text : page.after + '\0';
   std::string end;
   const auto collect = [&](Sql& rows) {
-    rows.Int(static_cast<int64_t>(size)).Int(static_cast<int64_t>(from));
+    rows.Int(static_cast<int64_t>(page.size)).Int(static_cast<int64_t>(page.from));
     Collect(rows, &ids);
   };
   if (!condition.prefix) {
-    Sql rows(session.db, "SELECT id FROM docs WHERE path = ? LIMIT ? OFFSET ?");
-    collect(rows.Blob(text));
+    if (page.after < text) {
+      Sql rows(session.db, "SELECT id FROM docs WHERE path = ? LIMIT ? OFFSET ?");
+      collect(rows.Blob(text));
+    }
   } else if (EndOfPrefix(text, &end)) {
     Sql rows(session.db,
              "SELECT id FROM docs WHERE path >= ? AND path < ? ORDER BY path LIMIT ? OFFSET ?");
-    collect(rows.Blob(text).Blob(end));
+    collect(rows.Blob(begin).Blob(end));
   } else {
     Sql rows(session.db, "SELECT id FROM docs WHERE path >= ? ORDER BY path LIMIT ? OFFSET ?");
-    collect(rows.Blob(text));
+    collect(rows.Blob(begin));
   }
   return ids;
 }
@@ -269,11 +272,10 @@ std::vector<int64_t> FindGrams(Session& session, const std::string& part) {
   return ids;
 }
 
-std::vector<int64_t> Find(Session& session, const Conditions& conditions, size_t from,
-                          size_t size) {
+std::vector<int64_t> Find(Session& session, const Conditions& conditions, const Page& page) {
   if (conditions.size() == 1 && conditions[0].field == session.schema.Key() &&
       conditions[0].value.isString()) {
-    return FindByPath(session, conditions[0], from, size);
+    return FindByPath(session, conditions[0], page);
   }
   const auto driver = std::min_element(
       conditions.begin(), conditions.end(),
@@ -281,14 +283,15 @@ std::vector<int64_t> Find(Session& session, const Conditions& conditions, size_t
   std::vector<std::pair<std::string, int64_t>> found;
   for (const int64_t id : Candidates(session, *driver)) {
     auto document = session.Load(id);
-    if (document && std::all_of(conditions.begin(), conditions.end(),
-                                [&](const Condition& c) { return Fits(session, &*document, c); })) {
+    if (document && (page.after.empty() || document->path > page.after) &&
+        std::all_of(conditions.begin(), conditions.end(),
+                    [&](const Condition& c) { return Fits(session, &*document, c); })) {
       found.emplace_back(std::move(document->path), id);
     }
   }
   std::sort(found.begin(), found.end());
   std::vector<int64_t> ids;
-  for (size_t i = from; i < found.size() && ids.size() < size; ++i) {
+  for (size_t i = page.from; i < found.size() && ids.size() < page.size; ++i) {
     ids.push_back(found[i].second);
   }
   return ids;

@@ -25,11 +25,18 @@ using Conditions = std::vector<Condition>;
 // in one object. Throws Failure kUnknownQuery for anything else, and for an empty query.
 Conditions ParseQuery(const Json::Value& qsl);
 
+// Which of the documents that were found.
+struct Page {
+  std::string after = {};  // Only paths behind this one; "" for all.
+  size_t from = 0;
+  size_t size = 0;
+};
+
 // The documents for which all hold, in the order of their paths as bytes, `size` of them from the
-// one numbered `from`. Conditions on the path alone read only what they return; conditions on
-// words, parts of names and whole values read what one of them finds; conditions on numbers read
-// every document. Throws Failure.
-std::vector<int64_t> Find(Session& session, const Conditions& conditions, size_t from, size_t size);
+// one numbered `from`. Conditions on the path alone read only what they return, and what `from`
+// passes over; conditions on words, parts of names and whole values read what one of them finds;
+// conditions on numbers read every document. Throws Failure.
+std::vector<int64_t> Find(Session& session, const Conditions& conditions, const Page& page);
 
 // The documents with a file name that may hold `part`, in the order of their numbers; for parts of
 // up to three characters, that do.

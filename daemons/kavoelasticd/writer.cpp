@@ -287,7 +287,7 @@ size_t Writer::DeleteWhere(const Conditions& conditions) {
   size_t deleted = 0;
   for (;;) {
     // What is deleted is found no more, so every slice begins at the front.
-    std::vector<int64_t> ids = Find(session_, conditions, 0, kDeleteSlice);
+    std::vector<int64_t> ids = Find(session_, conditions, {.after = "", .size = kDeleteSlice});
     // FTS5 writes out what it has gathered whenever a lower number follows a higher one.
     std::sort(ids.begin(), ids.end());
     for (const int64_t id : ids) {

@@ -67,6 +67,8 @@ TEST(Engine, AnswersEveryRequest) {
       {"PrefixNumber", kDelete, R"({"query":{"qsl":{"prefix":{"a":1}}}})", "2001"},
       {"PageIsText", kQuery, R"({"query":{"qsl":{"term":{"KAVOMDPath":"/v/a"}},"size":"all"}})",
        "2000"},
+      {"AfterIsNoPath", kQuery, R"({"query":{"qsl":{"term":{"KAVOMDPath":"/v/a"}},"after":1}})",
+       "2000"},
       {"SetMissing", kSet, R"({"doc_id":"/v/b","data":{}})", "2006"},
       {"SetPathToNothing", kSet, R"({"doc_id":"/v/a","data":{"KAVOMDPath":""}})", "2007"},
       {"NoDocument", kUpsert, R"({"doc_id":"/v/b"})", "2007"},
@@ -201,6 +203,15 @@ TEST(Engine, PagesAreInTheOrderOfPaths) {
   EXPECT_EQ(engine.Documents(below).size(), 10U);
   EXPECT_EQ(engine.Query(below, R"({"from":23,"size":10000})"), "/v/d/x /v/d/y");
   EXPECT_EQ(engine.Query(R"({"term":{"KAVOMDParent":"/v/d"}})", R"({"from":24})"), "/v/d/y");
+  const std::string parent = R"({"term":{"KAVOMDParent":"/v/d"}})";
+  for (const std::string& query : {below, parent}) {
+    EXPECT_EQ(engine.Query(query, R"({"after":"/v/d/w"})"), "/v/d/x /v/d/y") << query;
+    EXPECT_EQ(engine.Query(query, R"({"after":"/v/d/x"})"), "/v/d/y") << query;
+    EXPECT_EQ(engine.Query(query, R"({"after":"/v/d/w","from":1,"size":1})"), "/v/d/y") << query;
+    EXPECT_EQ(engine.Query(query, R"({"after":"/v/a"})"), engine.Query(query)) << query;
+    EXPECT_EQ(engine.Query(query, R"({"after":"/w"})"), "") << query;
+  }
+  EXPECT_EQ(engine.Query(R"({"term":{"KAVOMDPath":"/v/d/x"}})", R"({"after":"/v/d/x"})"), "");
   EXPECT_EQ(engine.Query(below, R"({"size":0})"), "");
   EXPECT_EQ(engine.Do("document_del_by_query", R"({"query":{"qsl":)" + below + "}}"), "ok");
   EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/"}})"), "/v/d0");

@@ -1,0 +1,175 @@
+#include "daemons/fileindexd/crawl.h"
+
+#include <chrono>
+
+#include "common/string.h"
+
+namespace vexlo::fileindexd {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+constexpr unsigned kPage = 2000;
+constexpr size_t kMostGone = 10000;
+// From one committed point to the next: whichever comes first.
+constexpr unsigned kCheckpointFiles = 4000;
+constexpr std::chrono::seconds kCheckpointTime{5};
+constexpr unsigned kProgressStep = 256;
+
+// One pass over the folder.
+class Pass {
+ public:
+  Pass(const std::string& id, CrawlPoint* point, const WalkRules& rules, const CrawlDeeds& deeds)
+      : point_(*point),
+        deeds_(deeds),
+        was_cut_short_(!point->after.empty()),
+        walk_(point->root, point->after, rules),
+        listing_(id, point->root, point->after),
+        gone_(kMostGone) {}
+
+  // Whether another pass is wanted.
+  bool Run() {
+    const bool noted_before = was_cut_short_ && point_.saw_gone;
+    MergeByPath([this] { return walk_.Next(); }, [this] { return listing_.Next(); },
+                [this](const DiskEntry& entry, const IndexedPath* indexed) {
+                  deeds_.compare(entry, indexed, point_.pass == 1);
+                  Advance(entry.path);
+                },
+                [this](const IndexedPath& indexed) {
+                  MeetGone(indexed.path);
+                  Advance(indexed.path);
+                });
+    deeds_.commit();
+    Remove();
+    deeds_.progress(done_, /*is_end=*/true);
+    return point_.pass == 1 && (noted_before || has_overflowed_);
+  }
+
+  CrawlResult Result() const { return {walk_.UnknownCount(), walk_.LastError()}; }
+
+ private:
+  void MeetGone(const std::string& path) {
+    if (walk_.IsUnknown(path) || gone_.Contains(path)) {
+      return;
+    }
+    point_.saw_gone = true;
+    if (gone_.IsFull()) {
+      if (point_.pass == 1) {
+        has_overflowed_ = true;
+        return;
+      }
+      Remove();
+    }
+    gone_.Add(path, deeds_.is_gone(path));
+  }
+
+  void Remove() {
+    std::vector<GoneList::Gone> gone = gone_.Take();
+    if (!gone.empty()) {
+      deeds_.remove(std::move(gone));
+      deeds_.commit();
+    }
+  }
+
+  void Advance(const std::string& path) {
+    deeds_.check();
+    if (++done_ % kProgressStep == 0) {
+      deeds_.progress(done_, /*is_end=*/false);
+    }
+    // The clock is asked now and then only.
+    const bool is_due = ++since_ >= kCheckpointFiles ||
+                        (since_ % 16 == 0 && Clock::now() - last_ >= kCheckpointTime);
+    if (is_due) {
+      deeds_.commit();
+      point_.after = path;
+      deeds_.save(point_);
+      since_ = 0;
+      last_ = Clock::now();
+    }
+  }
+
+  CrawlPoint& point_;
+  const CrawlDeeds& deeds_;
+  const bool was_cut_short_;
+  DiskWalk walk_;
+  IndexListing listing_;
+  GoneList gone_;
+  bool has_overflowed_ = false;
+  uint64_t done_ = 0;
+  unsigned since_ = 0;
+  Clock::time_point last_ = Clock::now();
+};
+
+}  // namespace
+
+IndexListing::IndexListing(std::string id, std::string root, std::string after)
+    : id_(std::move(id)),
+      root_(std::move(root)),
+      after_(std::move(after)),
+      is_root_done_(root_ <= after_) {}
+
+std::optional<IndexedPath> IndexListing::Next() {
+  if (!is_root_done_) {
+    is_root_done_ = true;
+    if (auto found = FindDocument(id_, root_)) {
+      return found;
+    }
+  }
+  if (page_.empty() && !is_last_page_) {
+    for (IndexedPath& indexed : ListBelow(id_, root_, after_, kPage)) {
+      page_.push_back(std::move(indexed));
+    }
+    is_last_page_ = page_.size() < kPage;
+    if (!page_.empty()) {
+      after_ = page_.back().path;
+    }
+  }
+  if (page_.empty()) {
+    return std::nullopt;
+  }
+  std::optional<IndexedPath> next(std::move(page_.front()));
+  page_.pop_front();
+  return next;
+}
+
+bool GoneList::Add(const std::string& path, bool with_all_below) {
+  if (IsFull()) {
+    return false;
+  }
+  list_.push_back({path, with_all_below});
+  if (with_all_below) {
+    folders_.insert(path);
+  }
+  return true;
+}
+
+bool GoneList::Contains(const std::string& path) const {
+  for (size_t slash = path.rfind('/'); slash != std::string::npos && slash > 0;
+       slash = path.rfind('/', slash - 1)) {
+    if (folders_.contains(path.substr(0, slash))) {
+      return true;
+    }
+  }
+  return false;
+}
+
+std::vector<GoneList::Gone> GoneList::Take() {
+  folders_.clear();
+  return std::exchange(list_, {});
+}
+
+CrawlResult Crawl(const std::string& id, CrawlPoint point, const WalkRules& rules,
+                  const CrawlDeeds& deeds) {
+  for (;;) {
+    Pass pass(id, &point, rules, deeds);
+    const bool wants_another = pass.Run();
+    if (!wants_another) {
+      return pass.Result();
+    }
+    point.pass = 2;
+    point.after.clear();
+    deeds.save(point);
+  }
+}
+
+}  // namespace vexlo::fileindexd

@@ -1,0 +1,404 @@
+#include "daemons/fileindexd/cycle.h"
+
+#include <algorithm>
+#include <set>
+#include <system_error>
+#include <utility>
+#include <vector>
+
+#include "common/check.h"
+#include "common/error.h"
+#include "common/json.h"
+#include "common/string.h"
+#include "daemons/fileindexd/consequence.h"
+#include "daemons/fileindexd/documents.h"
+#include "daemons/fileindexd/rename_plan.h"
+#include "fileindex/elastic_control/documents.h"
+#include "fileindex/elastic_control/schema.h"
+#include "fileindex/elastic_control/share_index.h"
+#include "fileindex/util/file_type.h"
+
+namespace vexlo::fileindexd {
+namespace {
+
+namespace elastic = fileindex::elastic;
+using fileindex::GetFileTypeByFullPath;
+using fileindex::GetFileTypeName;
+
+constexpr Json::ArrayIndex kMostDeletes = 500;
+constexpr size_t kMostTaken = 10000;
+constexpr unsigned kMostLogged = 10;      // Of one code, in a cycle.
+constexpr char kByItself[] = "settings";  // The cause of a crawl that no operation asked for.
+
+Json::Value DeleteItem(const std::string& id, const std::string& path) {
+  Json::Value item;
+  item["command"] = "document_del_by_id";
+  item["data"]["id"] = id;
+  item["data"]["doc_id"] = path;
+  return item;
+}
+
+Json::Value DeleteBelowItem(const std::string& id, const std::string& path) {
+  Json::Value item;
+  item["command"] = "document_del_by_query";
+  item["data"]["id"] = id;
+  item["data"]["query"]["qsl"]["prefix"][elastic::field::KAVOMDPath] = path + "/";
+  return item;
+}
+
+bool IsTrue(const Json::Value& types, const char* name) {
+  return types.isObject() && types[name].isBool() && types[name].asBool();
+}
+
+std::optional<uint64_t> InodeOf(const std::optional<Stamp>& stamp) {
+  return stamp ? std::optional(stamp->inode) : std::nullopt;
+}
+
+}  // namespace
+
+Cycle::Cycle(const std::string& share, const std::string& share_path, std::string cause,
+             ShareState& state, Stats& stats, std::function<bool()> is_interrupted)
+    : share_(share),
+      id_(elastic::GetFileIndexID(share)),
+      cause_(std::move(cause)),
+      scope_(share, share_path),
+      state_(state),
+      stats_(stats),
+      is_interrupted_(std::move(is_interrupted)),
+      indexer_(id_, stats, is_interrupted_) {}
+
+void Cycle::Handle(const fileindex::OP& op) {
+  Check();
+  const std::shared_ptr<fileindex::OPNode> node = op.node.lock();
+  if (node == nullptr) {
+    return;
+  }
+  const std::string path = node->GetPath();
+  stats_.CountOperation();
+  try {
+    Carry(op, path);
+  } catch (const Error& error) {
+    if (OfOperation(error.GetErrorCode()) != Consequence::kGoOn) {
+      throw;
+    }
+    Count(error.GetErrorCode(), error.what(), path);
+  } catch (const std::exception& error) {
+    Count(ERR_INTERNAL, error.what(), path);
+  }
+}
+
+void Cycle::Carry(const fileindex::OP& op, const std::string& path) {
+  if (op.op == fileindex::OP_QUEUE_CRASHED) {
+    ReconcileShare();
+    return;
+  }
+  for (const std::string* const each : {&path, &op.path_old}) {
+    const bool may_miss = each == &op.path_old && op.op != fileindex::OP_RENAME;
+    if (!may_miss && (each->empty() || each->find('\0') != std::string::npos)) {
+      throw Error(ERR_BAD_PARAMETER, "not a path");
+    }
+  }
+  if (!scope_.IsInShare(path)) {
+    throw Error(ERR_BAD_PARAMETER, "the path lies outside of the share");
+  }
+  switch (op.op) {
+    case fileindex::OP_DELETE:
+      Delete(path);
+      break;
+    case fileindex::OP_UPSERT:
+      Upsert(path);
+      break;
+    case fileindex::OP_ATTR:
+      UpdateAttributes(path);
+      break;
+    case fileindex::OP_UPDATE_DIRECTORY:
+      Reconcile(path, op.data);
+      break;
+    case fileindex::OP_RENAME:
+      Rename(path, op.path_old);
+      break;
+    case fileindex::OP_REINDEX:
+      Reconcile(path, Json::Value());
+      break;
+    case fileindex::OP_NONE:
+    case fileindex::OP_QUEUE_CRASHED:
+      break;
+  }
+}
+
+void Cycle::Delete(const std::string& path) {
+  indexer_.Drain();  // What was taken before must not come behind.
+  ForgetTaken(path);
+  deletes_.append(DeleteItem(id_, path));
+  deletes_.append(DeleteBelowItem(id_, path));
+  if (deletes_.size() >= kMostDeletes) {
+    FlushDeletes();
+  }
+}
+
+void Cycle::Upsert(const std::string& path) {
+  if (!IsWanted(path)) {
+    Delete(path);
+    return;
+  }
+  FlushDeletes();
+  Submit(path);
+}
+
+void Cycle::UpdateAttributes(const std::string& path) {
+  if (!IsWanted(path)) {
+    Delete(path);
+    return;
+  }
+  Settle();
+  const bool content = scope_.WantsContent(path);
+  const std::optional<Stamp> now = StampOfPath(path, content);
+  const std::optional<IndexedPath> document = FindDocument(id_, path);
+  // A change of the content whose own event was lost would go unseen for good once the document
+  // has the new dates.
+  if (!now || !document || !document->stamp || document->stamp->content != content ||
+      !HasSameContent(*document->stamp, *now)) {
+    Submit(path);
+    return;
+  }
+  Json::Value requests(Json::arrayValue);
+  requests.append(MakeAttributes(id_, path, *now));
+  has_sent_ = true;
+  for (const FailedItem& failed : SendList(std::move(requests))) {
+    throw Error(static_cast<ErrorCode>(failed.code), failed.reason);
+  }
+}
+
+void Cycle::Rename(const std::string& path, const std::string& path_old) {
+  if (!scope_.IsInShare(path_old)) {
+    Reconcile(path, Json::Value());
+    return;
+  }
+  Settle();
+  const std::optional<IndexedPath> document = FindDocument(id_, path_old);
+  const std::optional<Stamp> now = StampOfPath(path, scope_.WantsContent(path));
+  RenameFacts facts;
+  facts.new_is_wanted = now ? IsWanted(path) : scope_.Covers(path);
+  facts.has_document = document.has_value();
+  facts.document_inode = document ? InodeOf(document->stamp) : std::nullopt;
+  facts.old_inode = InodeOf(StampOfPath(path_old, /*content=*/false));
+  facts.new_inode = InodeOf(now);
+  const RenameStep step = PlanRename(facts);
+  ForgetTaken(path);
+  ForgetTaken(path_old);
+  if (step == RenameStep::kMove) {
+    has_sent_ = true;
+    elastic::IndexRename(share_, path, path_old);
+    FinishMove(path, path_old, document->stamp, now);
+  } else if (step == RenameStep::kReconcile) {
+    Reconcile(path, Json::Value());
+  } else {
+    Delete(path);
+  }
+  Delete(path_old);
+}
+
+// The renamed object's own document: its dates are new, and its type may be.
+void Cycle::FinishMove(const std::string& path, const std::string& path_old,
+                       const std::optional<Stamp>& before, const std::optional<Stamp>& now) {
+  if (!now) {
+    return;
+  }
+  if (!before || before->content != now->content || !HasSameContent(*before, *now)) {
+    Submit(path);
+  } else {
+    Json::Value requests(Json::arrayValue);
+    requests.append(MakeAttributes(id_, path, *now));
+    SendList(std::move(requests));
+  }
+  // What lies below keeps what it was indexed with, unless another folder's settings hold now.
+  if (!scope_.HaveSameSettings(path, path_old)) {
+    Reconcile(path, Json::Value());
+  }
+}
+
+void Cycle::ReconcileShare() { Reconcile(scope_.SharePath(), Json::Value(), kByItself); }
+
+void Cycle::ReconcileNewFolders() {
+  const std::set<std::string> crawled = state_.crawled;
+  const std::vector<std::string>& folders = scope_.Folders();
+  for (const std::string& folder : crawled) {
+    if (!std::binary_search(folders.begin(), folders.end(), folder)) {
+      Reconcile(folder, Json::Value(), kByItself);
+      state_.crawled.erase(folder);
+      state_changed_ = true;
+    }
+  }
+  for (const std::string& folder : folders) {
+    if (!state_.crawled.contains(folder)) {
+      Reconcile(folder, Json::Value(), kByItself);
+    }
+  }
+}
+
+void Cycle::Reconcile(const std::string& root, const Json::Value& types, const char* cause) {
+  Settle();
+  scope_.CheckShare();
+  stats_.SetState(WorkerState::kCrawling);
+  CrawlPoint point;
+  point.root = root;
+  point.cause = (cause == nullptr ? cause_ : cause) + (types.isNull() ? "" : JsonToString(types));
+  if (state_.crawl && state_.crawl->root == root && state_.crawl->cause == point.cause) {
+    point = *state_.crawl;
+  }
+  const WalkRules rules = {
+      [this](const std::string& path) { return scope_.Covers(path); },
+      [this](const std::string& path) { return scope_.LeadsToFolder(path); },
+      [this](const std::string& path) { return scope_.IsInShare(path) && scope_.Allows(path); }};
+  CrawlDeeds deeds;
+  deeds.check = [this] { Check(); };
+  deeds.compare = [&](const DiskEntry& entry, const IndexedPath* indexed, bool first_pass) {
+    Compare(entry, indexed, first_pass ? types : Json::Value::nullSingleton());
+  };
+  deeds.is_gone = IsGone;
+  deeds.remove = [this](std::vector<GoneList::Gone> gone) { Remove(gone); };
+  deeds.commit = [this] { Commit(); };
+  deeds.save = [this](const CrawlPoint& reached) {
+    state_.crawl = reached;
+    SaveShareState(ShareStateFile(share_), state_);
+  };
+  deeds.progress = [this](uint64_t found, bool is_end) {
+    stats_.SetProgress(is_end ? found : found - std::min<uint64_t>(found, indexer_.InWork()),
+                       found);
+  };
+  const CrawlResult result = Crawl(id_, point, rules, deeds);
+  if (result.unknown > 0) {
+    Count(ERR_SYSTEM,
+          std::to_string(result.unknown) + " folders or files cannot be read, the last: " +
+              std::generic_category().message(result.last_error),
+          root);
+  }
+  state_.crawl.reset();
+  MarkCrawled(root);
+  stats_.SetState(WorkerState::kProcessing);
+}
+
+// Makes the document where it is missing, or is another one's, or its type is asked for.
+void Cycle::Compare(const DiskEntry& entry, const IndexedPath* indexed, const Json::Value& types) {
+  const bool content = scope_.WantsContent(entry.path);
+  const bool is_asked_for =
+      IsTrue(types, "basic") ||
+      (!S_ISDIR(entry.info.st_mode) &&
+       IsTrue(types, std::string(GetFileTypeName(GetFileTypeByFullPath(entry.path))).c_str()));
+  if (is_asked_for || indexed == nullptr ||
+      !IsCurrent(indexed->stamp, StampOf(entry.info, content, timespec{}))) {
+    Submit(entry.path);
+  }
+}
+
+void Cycle::Remove(const std::vector<GoneList::Gone>& gone) {
+  // A share that has just been taken away looks as if all were gone.
+  scope_.CheckShare();
+  for (const auto& [path, with_all_below] : gone) {
+    const bool is_gone = IsGone(path);
+    if (is_gone && with_all_below) {
+      Delete(path);
+    } else if (is_gone || !IsWanted(path)) {
+      deletes_.append(DeleteItem(id_, path));
+    }
+    if (deletes_.size() >= kMostDeletes) {
+      FlushDeletes();
+    }
+  }
+}
+
+// A folder counts as crawled when everything in it was compared, whatever was asked for besides.
+void Cycle::MarkCrawled(const std::string& root) {
+  for (const std::string& folder : scope_.Folders()) {
+    if (IsSameOrBelow(folder, root) && state_.crawled.insert(folder).second) {
+      state_changed_ = true;
+    }
+  }
+}
+
+void Cycle::Check() {
+  if (is_interrupted_()) {
+    throw Interrupted{};
+  }
+}
+
+bool Cycle::IsWanted(const std::string& path) const {
+  return scope_.Covers(path) && scope_.Allows(path);
+}
+
+void Cycle::Submit(const std::string& path) {
+  const bool content = scope_.WantsContent(path);
+  std::optional<Stamp> now = StampOfPath(path, content);
+  if (now) {
+    now->is_young = false;  // That says when it was looked at.
+    const auto taken = taken_.find(path);
+    if (taken != taken_.end() && taken->second == *now) {
+      return;
+    }
+    if (taken_.size() >= kMostTaken) {
+      taken_.clear();
+    }
+    taken_[path] = *now;
+  }
+  indexer_.Upsert(path, content);
+}
+
+void Cycle::ForgetTaken(const std::string& path) {
+  taken_.erase(path);
+  // What lies below stands together, from "/" on and up to the byte behind it.
+  taken_.erase(taken_.lower_bound(path + "/"), taken_.lower_bound(path + "0"));
+}
+
+void Cycle::FlushDeletes() {
+  if (deletes_.empty()) {
+    return;
+  }
+  has_sent_ = true;
+  for (const FailedItem& failed :
+       SendList(std::exchange(deletes_, Json::Value(Json::arrayValue)))) {
+    if (OfOperation(failed.code) != Consequence::kGoOn) {
+      throw Error(static_cast<ErrorCode>(failed.code), failed.reason);
+    }
+    Count(failed.code, failed.reason, "");
+  }
+}
+
+void Cycle::Settle() {
+  FlushDeletes();
+  indexer_.Drain();
+}
+
+void Cycle::Commit() {
+  Settle();
+  if (indexer_.TakeWasUsed() || has_sent_) {
+    has_sent_ = true;  // Until it is done.
+    elastic::IndexCommit(share_);
+    has_sent_ = false;
+  }
+}
+
+void Cycle::Finish() {
+  Commit();
+  if (state_changed_) {
+    SaveShareState(ShareStateFile(share_), state_);
+    state_changed_ = false;
+  }
+  for (const auto& [code, count] : failures_) {
+    if (count > kMostLogged) {
+      LogLine(VEXLO_SOURCE, __LINE__,
+              share_ + ": " + std::to_string(count) +
+                  " operations failed, code=" + std::to_string(code));
+    }
+  }
+}
+
+void Cycle::Count(int code, const std::string& reason, const std::string& path) {
+  stats_.CountError(code, reason);
+  if (++failures_[code] <= kMostLogged) {
+    LogLine(VEXLO_SOURCE, __LINE__,
+            share_ + ": passed over, path=" + path + ", code=" + std::to_string(code) +
+                ", reason=" + reason);
+  }
+}
+
+}  // namespace vexlo::fileindexd

@@ -1,0 +1,92 @@
+// One turn of a share's worker: the operations that its queue came down to, carried out.
+#ifndef DAEMONS_FILEINDEXD_CYCLE_H_
+#define DAEMONS_FILEINDEXD_CYCLE_H_
+
+#include <json/value.h>
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "daemons/fileindexd/crawl.h"
+#include "daemons/fileindexd/indexer.h"
+#include "daemons/fileindexd/scope.h"
+#include "daemons/fileindexd/share_state.h"
+#include "daemons/fileindexd/stamp.h"
+#include "daemons/fileindexd/stats.h"
+#include "fileindex/optree/op.h"
+
+namespace vexlo::fileindexd {
+
+// For one thread. Every call may throw Interrupted, and Error for what must end the cycle: see
+// OfCycle() for what to do then.
+class Cycle {
+ public:
+  // `cause` tells this cycle's work from that of others, so that a crawl that was cut short goes on
+  // only for who began it. `state` is saved to the share's file as crawls proceed. Both references
+  // outlive the cycle. Throws as Scope does.
+  Cycle(const std::string& share, const std::string& share_path, std::string cause,
+        ShareState& state, Stats& stats, std::function<bool()> is_interrupted);
+
+  // Carries out one operation. What is wrong with it alone is logged, counted, and passed over.
+  void Handle(const fileindex::OP& op);
+
+  // Compares all folders of the share with the index.
+  void ReconcileShare();
+  // Those that were never crawled, and those that were and are not configured any more.
+  void ReconcileNewFolders();
+
+  // Returns when everything is in the index, and on disk. Then the state is saved.
+  void Finish();
+
+ private:
+  void Carry(const fileindex::OP& op, const std::string& path);
+  void Delete(const std::string& path);
+  void Upsert(const std::string& path);
+  void UpdateAttributes(const std::string& path);
+  void Rename(const std::string& path, const std::string& path_old);
+  void FinishMove(const std::string& path, const std::string& path_old,
+                  const std::optional<Stamp>& before, const std::optional<Stamp>& now);
+
+  // Compares what is at and below the path with the index. `types` names the types of files that
+  // are indexed anew even so, or is null. The cycle's cause where `cause` is null.
+  void Reconcile(const std::string& root, const Json::Value& types, const char* cause = nullptr);
+  void Compare(const DiskEntry& entry, const IndexedPath* indexed, const Json::Value& types);
+  void Remove(const std::vector<GoneList::Gone>& gone);
+  void MarkCrawled(const std::string& root);
+
+  // Whether the path belongs into the index. One that does not exist does not.
+  bool IsWanted(const std::string& path) const;
+  void Submit(const std::string& path);
+  void ForgetTaken(const std::string& path);
+  void FlushDeletes();
+  // Returns when the engine has everything that was taken.
+  void Settle();
+  void Commit();
+  void Check();
+  void Count(int code, const std::string& reason, const std::string& path);
+
+  const std::string share_;
+  const std::string id_;
+  const std::string cause_;
+  const Scope scope_;
+  ShareState& state_;
+  Stats& stats_;
+  const std::function<bool()> is_interrupted_;
+  Indexer indexer_;
+
+  Json::Value deletes_ = Json::Value(Json::arrayValue);  // Wait to be sent as one request.
+  bool has_sent_ = false;                                // Something to be committed.
+  bool state_changed_ = false;
+  // What was taken in this cycle, as it was then: an editor's save is one rename and one change of
+  // the same file.
+  std::map<std::string, Stamp> taken_;
+  std::map<int, unsigned> failures_;
+};
+
+}  // namespace vexlo::fileindexd
+
+#endif  // DAEMONS_FILEINDEXD_CYCLE_H_

@@ -1,0 +1,165 @@
+#include "daemons/fileindexd/documents.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <ctime>
+#include <utility>
+
+#include "common/check.h"
+#include "common/json.h"
+#include "fileindex/comm.h"
+#include "fileindex/elastic_control/schema.h"
+#include "fileindex/paths.h"
+#include "kavo/content_extract.h"
+
+namespace vexlo::fileindexd {
+namespace {
+
+namespace field = fileindex::elastic::field;
+
+Json::Value MakeItem(const char* command, const std::string& id, const std::string& path) {
+  Json::Value item;
+  item["command"] = command;
+  item["data"]["id"] = id;
+  item["data"]["doc_id"] = path;
+  return item;
+}
+
+// At once where the engine does not run: the library would wait for it for half a minute, and this
+// daemon is to stop before.
+void Send(Json::Value* response, const Json::Value& request) {
+  const std::string socket = fileindex::kElasticdSocketPath.Get();
+  VEXLO_CHECK(access(socket.c_str(), F_OK) != 0, ERR_ELASTIC_REQUEST,
+              "the engine does not run, path=" + socket);
+  SendRequestImpl(*response, request);
+}
+
+std::vector<IndexedPath> Query(const std::string& id, Json::Value query) {
+  Json::Value request;
+  request["command"] = "document_get_by_query";
+  request["data"]["id"] = id;
+  query["load_field"].append(field::KAVOMDPath);
+  query["load_field"].append(kStampField);
+  request["data"]["query"] = std::move(query);
+  Json::Value response;
+  Send(&response, request);
+  const Json::Value& hits = response["data"];
+  VEXLO_CHECK(!hits.isArray(), ERR_BAD_RESPONSE, "the engine's reply has no list");
+  std::vector<IndexedPath> found;
+  found.reserve(hits.size());
+  for (const Json::Value& hit : hits) {
+    if (hit.isObject() && hit[field::KAVOMDPath].isString()) {
+      found.push_back({hit[field::KAVOMDPath].asString(), StampFrom(hit[kStampField])});
+    }
+  }
+  return found;
+}
+
+bool Stat(const std::string& path, struct stat* info) {
+  return fstatat(AT_FDCWD, path.c_str(), info, AT_SYMLINK_NOFOLLOW) == 0;
+}
+
+bool Parse(const std::string& path, bool content, Json::Value* fields) {
+  Json::Value options;
+  options[fileindex::elastic::extraction::kOptionNeedMeta] = content;
+  *fields = Json::Value(Json::objectValue);
+  try {
+    KAVO::CONTENT_EXTRACT::ParseFile(path, options, *fields);
+    return fields->isObject();
+  } catch (...) {  // The platform's may throw anything.
+    return false;
+  }
+}
+
+void AddCopies(Json::Value* fields) {
+  const Json::Value& extracted = *fields;
+  (*fields)[field::KAVOMDSearchFileName] = extracted[field::KAVOMDFSName];
+  (*fields)[field::KAVOMDSearchAncestor] = extracted[field::KAVOMDParent];
+}
+
+}  // namespace
+
+std::optional<IndexedPath> FindDocument(const std::string& id, const std::string& path) {
+  Json::Value query;
+  query["qsl"]["term"][field::KAVOMDPath] = path;
+  std::vector<IndexedPath> found = Query(id, std::move(query));
+  return found.empty() ? std::nullopt : std::optional(std::move(found.front()));
+}
+
+std::vector<IndexedPath> ListBelow(const std::string& id, const std::string& folder,
+                                   const std::string& after, unsigned count) {
+  Json::Value query;
+  query["qsl"]["prefix"][field::KAVOMDPath] = folder + "/";
+  query["size"] = count;
+  if (!after.empty()) {
+    query["after"] = after;
+  }
+  return Query(id, std::move(query));
+}
+
+Json::Value MakePut(const std::string& id, const std::string& path, bool content) {
+  // The stamp first: a change while the file is read makes the document look old, never new.
+  const std::optional<Stamp> stamp = StampOfPath(path, content);
+  Json::Value fields;
+  if (!stamp || (!Parse(path, content, &fields) && !(content && Parse(path, false, &fields)))) {
+    VEXLO_CHECK(stamp && !IsGone(path), ERR_PARSE_FILE, "Parse failed, path=" + path);
+    return MakeItem("document_del_by_id", id, path);
+  }
+  AddCopies(&fields);
+  fields[kStampField] = ToJson(*stamp);
+  Json::Value item = MakeItem("document_upsert_by_id", id, path);
+  item["data"]["data"] = std::move(fields);
+  return item;
+}
+
+Json::Value MakeAttributes(const std::string& id, const std::string& path, const Stamp& stamp) {
+  Json::Value fields;
+  VEXLO_CHECK(!Parse(path, /*content=*/false, &fields), ERR_PARSE_FILE,
+              "Parse failed, path=" + path);
+  AddCopies(&fields);
+  fields[kStampField] = ToJson(stamp);
+  Json::Value item = MakeItem("document_set_by_id", id, path);
+  item["data"]["data"] = std::move(fields);
+  return item;
+}
+
+std::optional<Stamp> StampOfPath(const std::string& path, bool content) {
+  struct stat info {};
+  if (!Stat(path, &info)) {
+    VEXLO_CHECK(errno != ENOENT && errno != ENOTDIR, ERR_SYSTEM, "lstat failed, path=" + path);
+    return std::nullopt;
+  }
+  timespec now{};
+  clock_gettime(CLOCK_REALTIME, &now);
+  return StampOf(info, content, now);
+}
+
+bool IsGone(const std::string& path) {
+  struct stat info {};
+  return !Stat(path, &info) && (errno == ENOENT || errno == ENOTDIR);
+}
+
+std::vector<FailedItem> SendList(Json::Value requests) {
+  Json::Value request;
+  request["compound"] = std::move(requests);
+  Json::Value response;
+  Send(&response, request);
+  const Json::Value& results = response["data"];
+  VEXLO_CHECK(!results.isArray(), ERR_BAD_RESPONSE, "the engine's reply has no list");
+  std::vector<FailedItem> failed;
+  for (Json::ArrayIndex i = 0; i < results.size(); ++i) {
+    const Json::Value& result = results[i];
+    if (!result["success"].isBool() || !result["success"].asBool()) {
+      const Json::Value& code = result["error"]["code"];
+      const Json::Value& reason = result["error"]["msg"];
+      failed.push_back(
+          {i, code.isInt() ? code.asInt() : 0, reason.isString() ? reason.asString() : ""});
+    }
+  }
+  return failed;
+}
+
+}  // namespace vexlo::fileindexd

@@ -1,0 +1,59 @@
+// The documents of a share, as this daemon makes and reads them: those of the library, each with
+// the stamp of its file.
+#ifndef DAEMONS_FILEINDEXD_DOCUMENTS_H_
+#define DAEMONS_FILEINDEXD_DOCUMENTS_H_
+
+#include <json/value.h>
+
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "daemons/fileindexd/stamp.h"
+
+namespace vexlo::fileindexd {
+
+struct IndexedPath {
+  std::string path;
+  std::optional<Stamp> stamp;
+};
+
+// `id` is the index's everywhere. Those that send throw Error 913 and what the engine answers, as
+// SendRequestImpl() does, and 916 for a reply without a list.
+
+// The document of the path, when there is one.
+std::optional<IndexedPath> FindDocument(const std::string& id, const std::string& path);
+
+// Up to `count` documents below `folder`, those behind the path `after` ("" for the first ones), in
+// the order of their paths as bytes.
+std::vector<IndexedPath> ListBelow(const std::string& id, const std::string& folder,
+                                   const std::string& after, unsigned count);
+
+// The request that puts what the path holds now in the place of its document; the one that removes
+// the document when nothing is there any more. A file whose content cannot be read is indexed by
+// what the file system tells. Throws Error 914 when that cannot be told either.
+Json::Value MakePut(const std::string& id, const std::string& path, bool content);
+
+// The request that updates what can be told without reading the content; `stamp` goes with it.
+Json::Value MakeAttributes(const std::string& id, const std::string& path, const Stamp& stamp);
+
+// The stamp that the path would get now; none when nothing is there. Throws Error 502 when that
+// cannot be told.
+std::optional<Stamp> StampOfPath(const std::string& path, bool content);
+
+// Whether nothing is at the path, for certain.
+bool IsGone(const std::string& path);
+
+// A failure of one request of a list.
+struct FailedItem {
+  size_t at;
+  int code;
+  std::string reason;
+};
+
+// Sends the requests as one; those that failed. Throws as above for the list as a whole.
+std::vector<FailedItem> SendList(Json::Value requests);
+
+}  // namespace vexlo::fileindexd
+
+#endif  // DAEMONS_FILEINDEXD_DOCUMENTS_H_

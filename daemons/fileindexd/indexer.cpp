@@ -1,0 +1,203 @@
+#include "daemons/fileindexd/indexer.h"
+
+#include <linux/ioprio.h>
+#include <sys/resource.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <utility>
+
+#include "common/check.h"
+#include "common/error.h"
+#include "common/json.h"
+#include "daemons/fileindexd/consequence.h"
+#include "daemons/fileindexd/documents.h"
+
+namespace vexlo::fileindexd {
+namespace {
+
+constexpr size_t kThreads = 3;
+constexpr size_t kMostWaiting = 256;
+constexpr Json::ArrayIndex kMostInRequest = 64;
+// Of text; what else is in a document is small.
+constexpr size_t kEnoughBytes = size_t{1} << 20;
+constexpr int kNice = 10;
+constexpr int kLowestOfBestEffort = 7;
+
+size_t TextBytes(const Json::Value& item) {
+  const Json::Value& fields = item["data"]["data"];
+  size_t bytes = 0;
+  for (const Json::Value& value : fields) {
+    const char* begin = nullptr;
+    const char* end = nullptr;
+    if (value.isString() && value.getString(&begin, &end)) {
+      bytes += static_cast<size_t>(end - begin);
+    }
+  }
+  return bytes;
+}
+
+}  // namespace
+
+void LowerPriority() {
+  // Both are a thread's own on Linux. Where they are refused the work is done all the same.
+  const auto thread = static_cast<id_t>(gettid());
+  setpriority(PRIO_PROCESS, thread, kNice);
+  syscall(SYS_ioprio_set, IOPRIO_WHO_PROCESS, 0,
+          IOPRIO_PRIO_VALUE(IOPRIO_CLASS_BE, kLowestOfBestEffort));
+}
+
+struct Indexer::Batch {
+  Json::Value requests = Json::Value(Json::arrayValue);
+  std::vector<std::string> paths;
+  size_t bytes = 0;
+};
+
+Indexer::Indexer(std::string id, Stats& stats, std::function<bool()> is_interrupted)
+    : id_(std::move(id)), stats_(stats), is_interrupted_(std::move(is_interrupted)) {
+  threads_.reserve(kThreads);
+  for (size_t i = 0; i < kThreads; ++i) {
+    threads_.emplace_back([this] { Work(); });
+  }
+}
+
+Indexer::~Indexer() {
+  {
+    const std::lock_guard lock(mutex_);
+    ending_ = true;
+  }
+  changed_.notify_all();
+  for (std::thread& thread : threads_) {
+    thread.join();
+  }
+}
+
+void Indexer::Upsert(const std::string& path, bool content) {
+  std::unique_lock lock(mutex_);
+  // The same file twice at a time might end with the older of two readings.
+  changed_.wait(lock, [&] {
+    return failure_ != nullptr || (waiting_.size() < kMostWaiting && !in_work_.contains(path));
+  });
+  ThrowFailure();
+  was_used_ = true;
+  in_work_.insert(path);
+  waiting_.push_back({path, content});
+  lock.unlock();
+  changed_.notify_all();
+}
+
+void Indexer::Drain() {
+  std::unique_lock lock(mutex_);
+  changed_.wait(lock, [this] { return failure_ != nullptr || in_work_.empty(); });
+  ThrowFailure();
+}
+
+size_t Indexer::InWork() {
+  const std::lock_guard lock(mutex_);
+  return in_work_.size();
+}
+
+bool Indexer::TakeWasUsed() {
+  const std::lock_guard lock(mutex_);
+  return std::exchange(was_used_, false);
+}
+
+void Indexer::ThrowFailure() {
+  if (failure_ != nullptr) {
+    std::rethrow_exception(failure_);
+  }
+}
+
+void Indexer::Fail(std::exception_ptr failure) {
+  {
+    const std::lock_guard lock(mutex_);
+    if (failure_ == nullptr) {
+      failure_ = std::move(failure);
+    }
+    waiting_.clear();
+  }
+  changed_.notify_all();
+}
+
+void Indexer::Work() {
+  LowerPriority();
+  Batch batch;
+  Job job;
+  for (;;) {
+    const bool has_job = TakeJob(/*may_wait=*/batch.paths.empty(), &job);
+    if (!has_job && batch.paths.empty()) {
+      return;
+    }
+    try {
+      if (is_interrupted_()) {
+        throw Interrupted{};
+      }
+      if (has_job) {
+        Extract(job, &batch);
+      }
+      if (!has_job || batch.bytes >= kEnoughBytes || batch.requests.size() >= kMostInRequest) {
+        Send(&batch);
+      }
+    } catch (...) {
+      Fail(std::current_exception());
+      batch.requests.clear();
+    }
+    // What was sent is answered, and what a failure left will not be.
+    if (batch.requests.empty()) {
+      Finish(std::exchange(batch.paths, {}));
+    }
+  }
+}
+
+bool Indexer::TakeJob(bool may_wait, Job* job) {
+  std::unique_lock lock(mutex_);
+  if (may_wait) {
+    changed_.wait(lock, [this] { return ending_ || !waiting_.empty(); });
+  }
+  if (waiting_.empty() || ending_) {
+    return false;
+  }
+  *job = std::move(waiting_.front());
+  waiting_.pop_front();
+  return true;
+}
+
+void Indexer::Extract(const Job& job, Batch* batch) {
+  batch->paths.push_back(job.path);
+  try {
+    Json::Value item = MakePut(id_, job.path, job.content);
+    batch->bytes += TextBytes(item);
+    batch->requests.append(std::move(item));
+  } catch (const Error& error) {
+    stats_.CountError(error.GetErrorCode(), error.what());
+  }
+}
+
+void Indexer::Send(Batch* batch) {
+  Json::Value requests = std::exchange(batch->requests, Json::Value(Json::arrayValue));
+  batch->bytes = 0;
+  if (requests.empty()) {
+    return;
+  }
+  const uint64_t count = requests.size();
+  const std::vector<FailedItem> failed = SendList(std::move(requests));
+  stats_.CountFiles(count - failed.size());
+  for (const FailedItem& item : failed) {
+    stats_.CountError(item.code, item.reason);
+    if (OfOperation(item.code) != Consequence::kGoOn) {
+      throw Error(static_cast<ErrorCode>(item.code), item.reason);
+    }
+  }
+}
+
+void Indexer::Finish(const std::vector<std::string>& paths) {
+  {
+    const std::lock_guard lock(mutex_);
+    for (const std::string& path : paths) {
+      in_work_.erase(path);
+    }
+  }
+  changed_.notify_all();
+}
+
+}  // namespace vexlo::fileindexd

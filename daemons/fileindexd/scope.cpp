@@ -1,0 +1,69 @@
+#include "daemons/fileindexd/scope.h"
+
+#include <algorithm>
+#include <utility>
+
+#include "common/error.h"
+#include "common/file.h"
+#include "common/sdk/share.h"
+#include "common/string.h"
+#include "fileindex/util/path_policy.h"
+#include "fileindex/util/share_path.h"
+
+namespace vexlo::fileindexd {
+
+Scope::Scope(std::string share, std::string share_path)
+    : share_(std::move(share)), share_path_(std::move(share_path)) {
+  for (const std::string& name : folders_.GetIndexedShares()) {
+    if (name != share_) {
+      folders_.DeleteByShare(name);
+    }
+  }
+  full_paths_.reserve(folders_.GetFolders().size());
+  for (const auto& folder : folders_.GetFolders()) {
+    full_paths_.push_back(folder->GetFullPath());
+  }
+  std::sort(full_paths_.begin(), full_paths_.end());
+  full_paths_.erase(std::unique(full_paths_.begin(), full_paths_.end()), full_paths_.end());
+}
+
+bool Scope::IsInShare(const std::string& path) const {
+  if (!IsSameOrBelow(path, share_path_)) {
+    return false;
+  }
+  // Shares may lie inside each other: the innermost has the path.
+  std::string name;
+  std::string directory;
+  fileindex::GetShareNamePathByFullPath(name, directory, path);
+  return name == share_;
+}
+
+bool Scope::LeadsToFolder(const std::string& path) const {
+  return std::any_of(full_paths_.begin(), full_paths_.end(), [&](const std::string& folder) {
+    return folder != path && IsSameOrBelow(folder, path);
+  });
+}
+
+bool Scope::HaveSameSettings(const std::string& a, const std::string& b) const {
+  const auto at_a = folders_.GetMostSuitableCfg(a);
+  const auto at_b = folders_.GetMostSuitableCfg(b);
+  return at_a == at_b ||
+         (at_a != nullptr && at_b != nullptr && at_a->GetIndexCfg() == at_b->GetIndexCfg());
+}
+
+bool Scope::Allows(const std::string& path) const {
+  if (fileindex::CanFullPathBeIndexed(path)) {
+    return true;
+  }
+  CheckShare();
+  return false;
+}
+
+void Scope::CheckShare() const {
+  const sdk::SDKShare share(share_);
+  if (!IsDirExist(share_path_, /*follow_link=*/false) || !share.CanBeIndexed()) {
+    throw Error(ERR_SHARE_NOT_FOUND, share_ + " cannot be indexed at present");
+  }
+}
+
+}  // namespace vexlo::fileindexd

@@ -1,0 +1,50 @@
+// What of a share is indexed: its folders, as they were when a cycle began, and the path policy.
+#ifndef DAEMONS_FILEINDEXD_SCOPE_H_
+#define DAEMONS_FILEINDEXD_SCOPE_H_
+
+#include <string>
+#include <vector>
+
+#include "fileindex/folder_mgr.h"
+
+namespace vexlo::fileindexd {
+
+// For one thread.
+class Scope {
+ public:
+  // Loads the list of folders and keeps the share's: one of another share that is unknown by now
+  // makes every question fail else. `share_path` is the share's directory. Throws as FolderMgr and
+  // Folder::GetFullPath() do.
+  Scope(std::string share, std::string share_path);
+
+  const std::string& SharePath() const { return share_path_; }
+  // Full paths, each once, in order.
+  const std::vector<std::string>& Folders() const { return full_paths_; }
+
+  // Whether the path lies in the share's directory, or is it.
+  bool IsInShare(const std::string& path) const;
+  bool Covers(const std::string& path) const { return folders_.IsFullPathIndexed(path); }
+  // Whether an indexed folder lies below the path.
+  bool LeadsToFolder(const std::string& path) const;
+  // Whether what stands in the file is to be indexed, too.
+  bool WantsContent(const std::string& path) const { return folders_.IsFullPathNeedMeta(path); }
+  // Whether files of every type are treated alike at both paths.
+  bool HaveSameSettings(const std::string& a, const std::string& b) const;
+
+  // Asks the policy. Throws Error 800 when it refuses because the share cannot be indexed now: that
+  // says nothing about the path.
+  bool Allows(const std::string& path) const;
+
+  // Throws Error 800 when the share is gone, locked, read-only, or its directory is not there.
+  void CheckShare() const;
+
+ private:
+  const std::string share_;
+  const std::string share_path_;
+  fileindex::FolderMgr folders_;
+  std::vector<std::string> full_paths_;
+};
+
+}  // namespace vexlo::fileindexd
+
+#endif  // DAEMONS_FILEINDEXD_SCOPE_H_

@@ -1,0 +1,274 @@
+#include "daemons/fileindexd/service.h"
+
+#include <charconv>
+#include <cstdio>
+#include <utility>
+
+#include "common/check.h"
+#include "common/error.h"
+#include "common/json.h"
+#include "daemons/common/frame_server.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/paths.h"
+
+namespace vexlo::fileindexd {
+namespace {
+
+constexpr fileindex::FixedPath kPidFile("/var/run/fileindexd.pid");
+constexpr uint64_t kMostCommandBytes = uint64_t{64} << 10;
+constexpr int kLongestCoalescing = 3'600'000;
+constexpr std::chrono::milliseconds kStopTime{1500};
+
+Json::Value Refusal(const std::string& reason) {
+  Json::Value answer(Json::objectValue);
+  answer["success"] = false;
+  answer["error"]["code"] = static_cast<int>(ERR_BAD_PARAMETER);
+  answer["error"]["msg"] = reason;
+  return answer;
+}
+
+Json::Value Success() {
+  Json::Value answer(Json::objectValue);
+  answer["success"] = true;
+  return answer;
+}
+
+std::string ShareOf(const Json::Value& data) {
+  std::string share;
+  GetJsonValue(share, data, "share_name", /*required=*/true);
+  return share;
+}
+
+}  // namespace
+
+bool ReadArguments(const std::vector<std::string>& arguments, ServiceOptions* options) {
+  if (arguments.empty()) {
+    return true;
+  }
+  if (arguments.size() != 2 || arguments[0] != "--cycle") {
+    return false;
+  }
+  const std::string& text = arguments[1];
+  int milliseconds = 0;
+  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), milliseconds);
+  options->coalescing = std::chrono::milliseconds(milliseconds);
+  return error == std::errc() && end == text.data() + text.size() && milliseconds >= 0 &&
+         milliseconds <= kLongestCoalescing;
+}
+
+Service::Service(ServiceOptions options) : options_(options), thread_([this] { Run(); }) {
+  Post([this] { StartIndexedShares(); });
+}
+
+Service::~Service() {
+  Stop(std::chrono::milliseconds(0));
+  thread_.join();
+}
+
+std::string Service::Answer(const std::string& request) {
+  std::string text = request;
+  if (text.ends_with('\0')) {
+    text.pop_back();
+  }
+  Json::Value answer;
+  try {
+    Json::Value command;
+    std::string type;
+    if (!JsonFromString(command, text) || !command.isObject()) {
+      answer = Refusal("the command is no JSON object");
+    } else {
+      GetJsonValue(type, command, "type", /*required=*/true);
+      answer = Carry(type, command["data"]);
+    }
+  } catch (const Error& error) {
+    answer = Refusal(error.what());
+  }
+  return JsonToString(answer);
+}
+
+Json::Value Service::Carry(const std::string& type, const Json::Value& data) {
+  if (type == "stats") {
+    return Describe();
+  }
+  if (type == "pause" || type == "resume") {
+    long resume_time = -1;
+    if (type == "pause") {
+      GetJsonValue(resume_time, data, "resume_time", /*required=*/true);
+    }
+    pause_.Set(resume_time);
+    KickAll();
+  } else if (type == "worker_create") {
+    Post([this, share = ShareOf(data)] { Create(share); });
+  } else if (type == "worker_delete") {
+    Post([this, share = ShareOf(data)] { Delete(share); });
+  } else if (type == "notify_setting_changed") {
+    bool is_upsert = false;
+    GetJsonValue(is_upsert, data, "is_upsert", /*required=*/false);
+    Post([this, share = ShareOf(data), is_upsert] {
+      if (const auto worker = Find(share)) {
+        worker->Kick();
+      } else if (is_upsert) {
+        Create(share);
+      }
+    });
+  } else {
+    LogLine(VEXLO_SOURCE, __LINE__, "an unknown command is ignored: " + JsonToString(type));
+    return Refusal("the command is not known: " + type);
+  }
+  return Success();
+}
+
+Json::Value Service::Describe() {
+  Json::Value answer = Success();
+  answer["shares"] = Json::Value(Json::arrayValue);
+  const std::lock_guard lock(mutex_);
+  for (const auto& [share, worker] : workers_) {
+    answer["shares"].append(worker->Describe());
+  }
+  return answer;
+}
+
+void Service::Post(Task task) {
+  {
+    const std::lock_guard lock(mutex_);
+    tasks_.push_back(std::move(task));
+  }
+  changed_.notify_all();
+}
+
+void Service::Run() {
+  std::unique_lock lock(mutex_);
+  for (;;) {
+    changed_.wait(lock, [this] { return ending_ || !tasks_.empty(); });
+    if (ending_) {
+      return;
+    }
+    const Task task = std::move(tasks_.front());
+    tasks_.pop_front();
+    lock.unlock();
+    try {
+      task();
+    } catch (const std::exception& error) {
+      LogLine(VEXLO_SOURCE, __LINE__, std::string("a command failed, reason=") + error.what());
+    }
+    lock.lock();
+  }
+}
+
+void Service::StartIndexedShares() {
+  try {
+    pause_.Reload();
+  } catch (const Error& error) {
+    LogLine(VEXLO_SOURCE, __LINE__, std::string("the pause is not known, reason=") + error.what());
+  }
+  for (const std::string& share : fileindex::FolderMgr().GetIndexedShares()) {
+    Create(share);
+  }
+}
+
+void Service::Create(const std::string& share) {
+  if (const auto worker = Find(share)) {
+    worker->Kick();
+    return;
+  }
+  auto worker = std::make_shared<Worker>(share, pause_, options_.coalescing);
+  const std::lock_guard lock(mutex_);
+  if (ending_) {
+    worker->Stop();
+  }
+  workers_.emplace(share, std::move(worker));
+}
+
+void Service::Delete(const std::string& share) {
+  std::shared_ptr<Worker> worker;
+  {
+    const std::lock_guard lock(mutex_);
+    const auto found = workers_.find(share);
+    if (found == workers_.end()) {
+      return;
+    }
+    worker = std::move(found->second);
+    workers_.erase(found);
+  }
+  worker->Stop();
+  worker.reset();
+  // A share that is indexed no more starts from nothing when it comes back.
+  if (!fileindex::FolderMgr().IsShareIndexed(share)) {
+    (void)remove(ShareStateFile(share).c_str());
+  }
+}
+
+void Service::KickAll() {
+  const std::lock_guard lock(mutex_);
+  for (const auto& [share, worker] : workers_) {
+    worker->Kick();
+  }
+}
+
+std::shared_ptr<Worker> Service::Find(const std::string& share) {
+  const std::lock_guard lock(mutex_);
+  const auto found = workers_.find(share);
+  return found == workers_.end() ? nullptr : found->second;
+}
+
+bool Service::Stop(std::chrono::milliseconds time) {
+  const auto until = std::chrono::steady_clock::now() + time;
+  Workers workers;
+  {
+    const std::lock_guard lock(mutex_);
+    ending_ = true;
+    workers = workers_;
+  }
+  changed_.notify_all();
+  for (const auto& [share, worker] : workers) {
+    worker->Stop();
+  }
+  bool all_ended = true;
+  for (const auto& [share, worker] : workers) {
+    all_ended = worker->AwaitEnd(until) && all_ended;
+  }
+  return all_ended;
+}
+
+void Serve(daemon::Daemon& daemon, const ServiceOptions& options) {
+  Service service(options);
+  daemon::FrameServerOptions server_options;
+  server_options.socket_path = fileindex::kFileIndexDaemonSocketPath.Get();
+  server_options.handler = [&service](const std::string& request) {
+    return service.Answer(request);
+  };
+  // A client waits for an answer for ever, also where its connection is closed.
+  server_options.refusal = [](daemon::Refusal refusal) {
+    return JsonToString(Refusal(refusal == daemon::Refusal::kTooLong
+                                    ? "the command is too long"
+                                    : "the command made the daemon fail"));
+  };
+  server_options.workers = 2;
+  server_options.max_request_bytes = kMostCommandBytes;
+  server_options.max_total_bytes = size_t{16} << 20;
+  server_options.stop_timeout = std::chrono::milliseconds(200);
+  daemon::FrameServer server(std::move(server_options));
+  daemon.Ready();
+  const bool all_answered = server.Run(daemon.StopFd());
+  if (!service.Stop(kStopTime) || !all_answered) {
+    daemon.EndAtOnce("work is under way, and is done again by the next start", daemon::kEnded);
+  }
+}
+
+daemon::DaemonOptions FileindexdOptions(ServiceOptions* options) {
+  daemon::DaemonOptions daemon_options;
+  daemon_options.name = "fileindexd";
+  daemon_options.pid_file = kPidFile.Get();
+  daemon_options.usage =
+      "[--cycle MILLISECONDS]\n\nKeeps the indexes of the shares up to date with what is queued "
+      "for "
+      "them. Runs in the\nforeground until SIGTERM or SIGINT and takes commands on " +
+      fileindex::kFileIndexDaemonSocketPath.Get() +
+      ".\n\n  --cycle MILLISECONDS  from the first new line of a queue to its work (1000)";
+  daemon_options.arguments = [options](const std::vector<std::string>& arguments) {
+    return ReadArguments(arguments, options);
+  };
+  return daemon_options;
+}
+
+}  // namespace vexlo::fileindexd

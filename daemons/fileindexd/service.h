@@ -1,0 +1,81 @@
+// The daemon's workers, and the commands that come to it.
+#ifndef DAEMONS_FILEINDEXD_SERVICE_H_
+#define DAEMONS_FILEINDEXD_SERVICE_H_
+
+#include <json/value.h>
+
+#include <chrono>
+#include <condition_variable>
+#include <deque>
+#include <functional>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <thread>
+
+#include "daemons/common/run_daemon.h"
+#include "daemons/fileindexd/worker.h"
+
+namespace vexlo::fileindexd {
+
+struct ServiceOptions {
+  // From the first new line of a queue to the cycle that takes it.
+  std::chrono::milliseconds coalescing{1000};
+};
+
+// Reads the command line; false when it is wrong.
+bool ReadArguments(const std::vector<std::string>& arguments, ServiceOptions* options);
+
+// One thread starts and ends workers, so that whoever takes a command never waits for one.
+class Service {
+ public:
+  // Starts a worker for each share with an indexed folder.
+  explicit Service(ServiceOptions options);
+  ~Service();
+  Service(const Service&) = delete;
+  Service& operator=(const Service&) = delete;
+
+  // Answers a command, a JSON text that a NUL may follow, at once: what it brings about begins when
+  // this has returned. Any thread.
+  std::string Answer(const std::string& request);
+
+  // Ends the workers; false when one of them is still under way then.
+  bool Stop(std::chrono::milliseconds time);
+
+ private:
+  using Task = std::function<void()>;
+  using Workers = std::map<std::string, std::shared_ptr<Worker>>;
+
+  Json::Value Carry(const std::string& type, const Json::Value& data);
+  Json::Value Describe();
+  void Post(Task task);
+  void Run();
+  void StartIndexedShares();
+  void Create(const std::string& share);
+  void Delete(const std::string& share);
+  void KickAll();
+  std::shared_ptr<Worker> Find(const std::string& share);
+
+  const ServiceOptions options_;
+  Pause pause_;
+  std::mutex mutex_;
+  std::condition_variable changed_;
+  // Guarded by mutex_, which is held for moments:
+  Workers workers_;
+  std::deque<Task> tasks_;
+  bool ending_ = false;
+
+  std::thread thread_;
+};
+
+// The daemon's work: serves the command socket until the daemon is to end. What a worker has not
+// finished within two seconds is cut short, and done again by the next start.
+void Serve(daemon::Daemon& daemon, const ServiceOptions& options);
+
+// The daemon's name, pid file and usage.
+daemon::DaemonOptions FileindexdOptions(ServiceOptions* options);
+
+}  // namespace vexlo::fileindexd
+
+#endif  // DAEMONS_FILEINDEXD_SERVICE_H_

@@ -1,0 +1,75 @@
+#include "daemons/fileindexd/share_state.h"
+
+#include <cerrno>
+#include <filesystem>
+#include <system_error>
+#include <vector>
+
+#include "common/check.h"
+#include "common/error.h"
+#include "common/file.h"
+#include "common/json.h"
+#include "fileindex/paths.h"
+
+namespace vexlo::fileindexd {
+namespace {
+
+constexpr fileindex::FixedPath kFolder("/var/lib/kavo/fileindexd");
+
+ShareState FromJson(const Json::Value& value) {
+  ShareState state;
+  const std::vector<std::string> crawled = JsonArr2Vec<std::string>(value["crawled"]);
+  state.crawled.insert(crawled.begin(), crawled.end());
+  GetJsonValue(state.rebuilt, value, "rebuilt", /*required=*/false);
+  if (const Json::Value& crawl = value["crawl"]; !crawl.isNull()) {
+    CrawlPoint& point = state.crawl.emplace();
+    GetJsonValue(point.root, crawl, "root", /*required=*/true);
+    GetJsonValue(point.cause, crawl, "cause", /*required=*/true);
+    GetJsonValue(point.after, crawl, "after", /*required=*/true);
+    GetJsonValue(point.pass, crawl, "pass", /*required=*/true);
+    GetJsonValue(point.saw_gone, crawl, "saw_gone", /*required=*/true);
+  }
+  return state;
+}
+
+}  // namespace
+
+std::string ShareStateFile(const std::string& share) {
+  return kFolder.Get() + "/" + share + ".json";
+}
+
+ShareState LoadShareState(const std::string& file) {
+  if (!IsFileExist(file)) {
+    return {};
+  }
+  try {
+    Json::Value value;
+    VEXLO_CHECK(!JsonFromFile(value, file) || !value.isObject(), ERR_LOAD, file);
+    return FromJson(value);
+  } catch (const Error& error) {
+    LogLine(VEXLO_SOURCE, __LINE__, "starting without " + file + ", reason=" + error.what());
+    return {};
+  }
+}
+
+void SaveShareState(const std::string& file, const ShareState& state) {
+  Json::Value value(Json::objectValue);
+  value["crawled"] = Vec2JsonArr<std::string>({state.crawled.begin(), state.crawled.end()});
+  value["rebuilt"] = state.rebuilt;
+  if (state.crawl) {
+    Json::Value& crawl = value["crawl"];
+    crawl["root"] = state.crawl->root;
+    crawl["cause"] = state.crawl->cause;
+    crawl["after"] = state.crawl->after;
+    crawl["pass"] = state.crawl->pass;
+    crawl["saw_gone"] = state.crawl->saw_gone;
+  }
+  std::error_code ignored;
+  std::filesystem::create_directories(std::filesystem::path(file).parent_path(), ignored);
+  errno = 0;
+  if (!JsonToFile(value, file)) {
+    LogFailure({VEXLO_SOURCE, __LINE__, __func__, "!JsonToFile(value, file)"}, file, errno);
+  }
+}
+
+}  // namespace vexlo::fileindexd

@@ -1,0 +1,65 @@
+#include "daemons/fileindexd/stats.h"
+
+namespace vexlo::fileindexd {
+namespace {
+
+constexpr const char* kStateNames[] = {"idle",   "processing",  "crawling",
+                                       "paused", "unavailable", "failing"};
+
+bool IsAtWork(WorkerState state) {
+  return state == WorkerState::kProcessing || state == WorkerState::kCrawling;
+}
+
+}  // namespace
+
+void Stats::SetState(WorkerState state) {
+  const std::lock_guard lock(mutex_);
+  if (IsAtWork(state) && !IsAtWork(state_)) {
+    began_ = Clock::now();
+    files_before_ = files_;
+  }
+  state_ = state;
+}
+
+void Stats::CountOperation() {
+  const std::lock_guard lock(mutex_);
+  ++operations_;
+}
+
+void Stats::CountFiles(uint64_t count) {
+  const std::lock_guard lock(mutex_);
+  files_ += count;
+}
+
+void Stats::CountError(int code, const std::string& reason) {
+  const std::lock_guard lock(mutex_);
+  ++errors_[code];
+  last_error_ = reason;
+}
+
+void Stats::SetProgress(uint64_t done, uint64_t found) {
+  const std::lock_guard lock(mutex_);
+  done_ = done;
+  found_ = found;
+}
+
+Json::Value Stats::ToJson() const {
+  const std::lock_guard lock(mutex_);
+  Json::Value value(Json::objectValue);
+  value["state"] = kStateNames[static_cast<size_t>(state_)];
+  value["operations"] = static_cast<Json::UInt64>(operations_);
+  value["files"] = static_cast<Json::UInt64>(files_);
+  const std::chrono::duration<double> seconds = Clock::now() - began_;
+  const bool has_rate = IsAtWork(state_) && seconds.count() > 0;
+  value["rate"] = has_rate ? static_cast<double>(files_ - files_before_) / seconds.count() : 0.0;
+  value["errors"] = Json::Value(Json::objectValue);
+  for (const auto& [code, count] : errors_) {
+    value["errors"][std::to_string(code)] = static_cast<Json::UInt64>(count);
+  }
+  value["last_error"] = last_error_;
+  value["progress"]["done"] = static_cast<Json::UInt64>(done_);
+  value["progress"]["found"] = static_cast<Json::UInt64>(found_);
+  return value;
+}
+
+}  // namespace vexlo::fileindexd

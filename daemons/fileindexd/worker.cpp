@@ -1,0 +1,294 @@
+#include "daemons/fileindexd/worker.h"
+
+#include <sys/stat.h>
+
+#include <ctime>
+#include <exception>
+#include <utility>
+
+#include "common/check.h"
+#include "common/error.h"
+#include "common/file.h"
+#include "common/sdk/share.h"
+#include "daemons/fileindexd/consequence.h"
+#include "daemons/fileindexd/cycle.h"
+#include "fileindex/elastic_control/share_index.h"
+#include "fileindex/queue_mgr.h"
+#include "fileindex/status_mgr.h"
+#include "fileindex/util/notification.h"
+
+namespace vexlo::fileindexd {
+namespace {
+
+using fileindex::StatusMgr;
+
+using Clock = std::chrono::steady_clock;
+
+constexpr std::chrono::seconds kSpaceWait{60};
+constexpr int kBothBits = fileindex::SS_NEED_REINDEX | fileindex::SS_NEED_REBUILD;
+
+// The engine's answers that make creating or deleting what is there, or not there, no failure.
+constexpr int kIndexMissing = 2002;
+constexpr int kIndexExists = 2003;
+
+template <typename Deed>
+void Unless(int code, const Deed& deed) {
+  try {
+    deed();
+  } catch (const Error& error) {
+    if (error.GetErrorCode() != code) {
+      throw;
+    }
+  }
+}
+
+uint64_t BytesOf(const std::string& file) {
+  struct stat info {};
+  return lstat(file.c_str(), &info) == 0 ? static_cast<uint64_t>(info.st_size) : 0;
+}
+
+// Tells one snapshot from the next, also after a restart.
+std::string SnapshotName(const std::string& file) {
+  struct stat info {};
+  if (lstat(file.c_str(), &info) != 0) {
+    return "none";
+  }
+  return std::to_string(info.st_ino) + "-" + std::to_string(info.st_size) + "-" +
+         std::to_string(info.st_mtim.tv_sec) + "." + std::to_string(info.st_mtim.tv_nsec);
+}
+
+}  // namespace
+
+void Pause::Reload() {
+  const long in_file = StatusMgr().GetPauseInfo();
+  if (in_file_.exchange(in_file) != in_file) {
+    resume_time_ = in_file;
+  }
+}
+
+bool Pause::IsOn() const {
+  const long resume_time = resume_time_;
+  return resume_time == 0 || resume_time > time(nullptr);
+}
+
+std::optional<long> Pause::End() const {
+  const long resume_time = resume_time_;
+  return IsOn() && resume_time != 0 ? std::optional(resume_time) : std::nullopt;
+}
+
+Worker::Worker(std::string share, const Pause& pause, std::chrono::milliseconds coalescing)
+    : share_(std::move(share)),
+      pause_(pause),
+      coalescing_(coalescing),
+      has_ended_(ended_.get_future()) {
+  thread_ = std::thread([this] {
+    LowerPriority();
+    Run();
+    ended_.set_value();
+  });
+}
+
+Worker::~Worker() {
+  Stop();
+  thread_.join();
+}
+
+void Worker::Kick() {
+  kicked_ = true;
+  watch_.Wake();
+}
+
+void Worker::Stop() {
+  stopping_ = true;
+  watch_.Wake();
+}
+
+bool Worker::AwaitEnd(Clock::time_point until) {
+  return has_ended_.wait_until(until) == std::future_status::ready;
+}
+
+Json::Value Worker::Describe() const {
+  std::string queue_path;
+  {
+    const std::lock_guard lock(queue_path_mutex_);
+    queue_path = queue_path_;
+  }
+  Json::Value value = stats_.ToJson();
+  value["share"] = share_;
+  value["queue_bytes"] =
+      static_cast<Json::UInt64>(BytesOf(queue_path) + BytesOf(queue_path + ".tmp"));
+  return value;
+}
+
+void Worker::Run() {
+  state_ = LoadShareState(ShareStateFile(share_));
+  while (!stopping_) {
+    kicked_ = false;
+    const Outcome outcome = RunGuarded();
+    if (!stopping_) {
+      WaitAfter(outcome);
+    }
+  }
+}
+
+Worker::Outcome Worker::RunGuarded() {
+  try {
+    return RunCycle();
+  } catch (const Interrupted&) {
+    return pause_.IsOn() ? Outcome::kPaused : Outcome::kDone;
+  } catch (const Error& error) {
+    return Judge(error.GetErrorCode(), error.what());
+  } catch (const std::exception& error) {
+    return Judge(ERR_INTERNAL, error.what());
+  }
+}
+
+Worker::Outcome Worker::RunCycle() {
+  const sdk::SDKShare share(share_);
+  const std::string queue_path = share.GetQueuePath();
+  {
+    const std::lock_guard lock(queue_path_mutex_);
+    queue_path_ = queue_path;
+  }
+  watch_.Watch(queue_path);
+  if (pause_.IsOn()) {
+    return Outcome::kPaused;
+  }
+  // The folder first: of one that is not there the platform cannot tell whether it is read-only.
+  if (!IsDirExist(share.GetPath(), /*follow_link=*/false) || !share.CanBeIndexed()) {
+    return Outcome::kUnavailable;
+  }
+  watch_.Forget();
+  stats_.SetState(WorkerState::kProcessing);
+  const bool fills = MakeIndexIfAsked();
+  fileindex::QueueMgr queue(queue_path);
+  queue.PrepareTmpQueue();
+  Cycle cycle(share_, share.GetPath(), SnapshotName(queue_path + ".tmp"), state_, stats_,
+              [this] { return IsInterrupted(); });
+  queue.ProcessOP([&cycle](std::shared_ptr<fileindex::OP> op) { cycle.Handle(*op); },
+                  /*use_tmp=*/true);
+  if (fills) {
+    cycle.ReconcileShare();
+  } else {
+    cycle.ReconcileNewFolders();
+  }
+  cycle.Finish();
+  if (fills) {
+    StatusMgr().UnsetShareStatus(share_, kBothBits);
+    state_.rebuilt = false;
+    SaveShareState(ShareStateFile(share_), state_);
+  }
+  queue.DeleteTmp();  // Also where its lines came down to nothing.
+  wait_ = std::chrono::seconds(0);
+  space_is_told_ = false;
+  return Outcome::kDone;
+}
+
+// Whether everything is to be compared, in an index that may be new.
+bool Worker::MakeIndexIfAsked() {
+  const unsigned bits = StatusMgr().GetShareStatus(share_);
+  if (index_is_missing_ || ((bits & fileindex::SS_NEED_REBUILD) != 0 && !state_.rebuilt)) {
+    // Made anew once: a crawl that is cut short goes on in the new one.
+    MakeIndex();
+    index_is_missing_ = false;
+    return true;
+  }
+  return (bits & kBothBits) != 0 || state_.rebuilt;
+}
+
+void Worker::MakeIndex() {
+  LogLine(VEXLO_SOURCE, __LINE__, share_ + ": making the index anew");
+  Unless(kIndexMissing, [this] { fileindex::elastic::ShareIndexDelete(share_); });
+  Unless(kIndexExists, [this] { fileindex::elastic::ShareIndexCreate(share_); });
+  state_ = ShareState();
+  state_.rebuilt = true;
+  SaveShareState(ShareStateFile(share_), state_);
+}
+
+Worker::Outcome Worker::Judge(int code, const std::string& reason) {
+  stats_.CountError(code, reason);
+  switch (OfCycle(code)) {
+    case Consequence::kUnavailable:
+      LogLine(VEXLO_SOURCE, __LINE__, share_ + ": waiting for the share, reason=" + reason);
+      return Outcome::kUnavailable;
+    case Consequence::kNoSpace:
+      if (!std::exchange(space_is_told_, true)) {
+        LogLine(VEXLO_SOURCE, __LINE__, share_ + ": waiting for space, reason=" + reason);
+        fileindex::SendQPXNotify();
+      }
+      return Outcome::kNoSpace;
+    case Consequence::kRebuild:
+      if (!std::exchange(index_is_missing_, true)) {
+        return Outcome::kAgain;
+      }
+      break;  // Making it failed, too.
+    case Consequence::kGoOn:
+    case Consequence::kRetry:
+      break;
+  }
+  wait_ = NextWait(wait_);
+  LogLine(VEXLO_SOURCE, __LINE__,
+          share_ + ": trying again in " + std::to_string(wait_.count()) +
+              " s, code=" + std::to_string(code) + ", reason=" + reason);
+  return Outcome::kRetry;
+}
+
+// Returns when there is reason for another cycle.
+void Worker::WaitAfter(Outcome outcome) {
+  const auto in = [](auto duration) { return std::optional(Clock::now() + duration); };
+  const auto is_called = [this] { return stopping_ || kicked_; };
+  switch (outcome) {
+    case Outcome::kDone:
+    case Outcome::kUnavailable: {
+      // A line in the queue of a share that was away tells that it is back.
+      const bool is_idle = outcome == Outcome::kDone;
+      stats_.SetState(is_idle ? WorkerState::kIdle : WorkerState::kUnavailable);
+      while (!is_called()) {
+        if (watch_.Wait(std::nullopt, /*for_queue=*/true)) {
+          watch_.Wait(in(coalescing_), /*for_queue=*/false);
+          return;
+        }
+      }
+      return;
+    }
+    case Outcome::kPaused: {
+      stats_.SetState(WorkerState::kPaused);
+      while (!is_called() && pause_.IsOn()) {
+        std::optional<Clock::time_point> until;
+        if (const auto end = pause_.End()) {
+          until = Clock::now() + std::chrono::seconds(*end - time(nullptr));
+        }
+        watch_.Wait(until, /*for_queue=*/false);
+      }
+      return;
+    }
+    case Outcome::kAgain:
+      return;
+    case Outcome::kRetry:
+      stats_.SetState(WorkerState::kFailing);
+      if (!is_called()) {
+        watch_.Wait(in(wait_), /*for_queue=*/false);
+      }
+      return;
+    case Outcome::kNoSpace:
+      stats_.SetState(WorkerState::kFailing);
+      do {
+        if (!is_called()) {
+          watch_.Wait(in(kSpaceWait), /*for_queue=*/false);
+        }
+      } while (!is_called() && !HasSpace());
+      return;
+  }
+}
+
+bool Worker::IsInterrupted() const { return stopping_ || pause_.IsOn(); }
+
+bool Worker::HasSpace() const {
+  try {
+    return sdk::SDKShare(share_).IsSpaceEnough();
+  } catch (const Error&) {
+    return true;  // The next cycle finds out what is wrong.
+  }
+}
+
+}  // namespace vexlo::fileindexd

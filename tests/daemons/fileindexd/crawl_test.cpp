@@ -1,0 +1,227 @@
+// The walk over a disk, and its comparison with what an index lists.
+#include "daemons/fileindexd/crawl.h"
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <filesystem>
+#include <map>
+#include <random>
+#include <set>
+
+#include "support/faults.h"
+#include "support/temp_folder.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+using vexlo::fileindexd::DiskEntry;
+using vexlo::fileindexd::DiskWalk;
+using vexlo::fileindexd::GoneList;
+using vexlo::fileindexd::IndexedPath;
+using vexlo::fileindexd::WalkRules;
+
+FAULTABLE(ssize_t, getdents64, (int fd, void* buffer, size_t size), (fd, buffer, size))
+FAULTABLE(int, fstatat, (int fd, const char* path, struct stat* info, int flags),
+          (fd, path, info, flags))
+
+WalkRules Everything() {
+  const auto yes = [](const std::string&) { return true; };
+  return {yes, yes, yes};
+}
+
+std::vector<std::string> PathsOf(DiskWalk& walk) {
+  std::vector<std::string> paths;
+  while (const auto entry = walk.Next()) {
+    paths.push_back(entry->path);
+  }
+  return paths;
+}
+
+// What is at and below a folder, by the library and in the order of bytes.
+std::vector<std::string> Listed(const std::string& root) {
+  std::vector<std::string> paths = {root};
+  for (const auto& entry : fs::recursive_directory_iterator(root)) {
+    if (!entry.is_symlink()) {
+      paths.push_back(entry.path());
+    }
+  }
+  std::sort(paths.begin(), paths.end());
+  return paths;
+}
+
+// Names that sort before and behind "/", and are each other's beginnings.
+void MakeRandomTree(const std::string& root, std::mt19937& random) {
+  const std::string names[] = {"a", "a!", "a.txt", "a0", "b", "b-", "b\xE9", "\xFF", " "};
+  std::vector<std::string> folders = {root};
+  for (int i = 0; i < 40; ++i) {
+    const std::string path = folders[random() % folders.size()] + "/" + names[random() % 9];
+    if (fs::exists(path)) {
+      continue;
+    }
+    if (random() % 2 == 0) {
+      fs::create_directory(path);
+      folders.push_back(path);
+    } else {
+      WriteText(path, "");
+    }
+  }
+}
+
+TEST(DiskWalk, GivesWhatIsThereInOrderFromAnywhereInAnyPortion) {
+  for (unsigned seed = 0; seed < 60; ++seed) {
+    SCOPED_TRACE(seed);
+    std::mt19937 random(seed);
+    const TempFolder folder;
+    MakeRandomTree(folder.Path(), random);
+    const std::vector<std::string> all = Listed(folder.Path());
+    const size_t portion = 1 + random() % 4;
+    DiskWalk walk(folder.Path(), "", Everything(), portion);
+    EXPECT_EQ(PathsOf(walk), all);
+    for (size_t i = 0; i < all.size(); ++i) {
+      DiskWalk rest(folder.Path(), all[i], Everything(), portion);
+      EXPECT_EQ(PathsOf(rest), std::vector(all.begin() + static_cast<ptrdiff_t>(i) + 1, all.end()))
+          << all[i];
+    }
+  }
+}
+
+TEST(DiskWalk, LeavesOutWhatTheRulesRefuse) {
+  const TempFolder folder;
+  for (const char* const path : {"in/deep/x", "in/@eaDir/x", "in/.git/x", "out/x", "way/in/x"}) {
+    fs::create_directories((folder / path).substr(0, (folder / path).rfind('/')));
+    WriteText(folder / path, "");
+  }
+  WriteText(folder / "in/Thumbs.db", "");
+  fs::create_directory(folder / "elsewhere");
+  fs::create_directory_symlink(folder / "elsewhere", folder / "in/link");
+  fs::create_directories(folder / "in/refused/x");
+  const WalkRules rules = {
+      [&](const std::string& path) {
+        return path.starts_with(folder / "in") || path.starts_with(folder / "way/in");
+      },
+      [&](const std::string& path) { return path == folder.Path() || path == folder / "way"; },
+      [&](const std::string& path) { return path != folder / "in/refused"; }};
+  DiskWalk walk(folder.Path(), "", rules);
+  EXPECT_EQ(PathsOf(walk),
+            (std::vector<std::string>{folder / "in", folder / "in/deep", folder / "in/deep/x",
+                                      folder / "way/in", folder / "way/in/x"}));
+}
+
+TEST(DiskWalk, WhatIsNoFolderOrMissingIsNoFailure) {
+  const TempFolder folder;
+  WriteText(folder / "file", "");
+  const std::pair<std::string, std::vector<std::string>> cases[] = {
+      {folder / "file", {folder / "file"}},
+      {folder / "none", {}},
+      {folder / "none/below", {}},
+      {folder / "file/below", {}}};
+  for (const auto& [root, want] : cases) {
+    DiskWalk walk(root, "", Everything());
+    EXPECT_EQ(PathsOf(walk), want) << root;
+    EXPECT_FALSE(walk.IsUnknown(root)) << root;
+  }
+}
+
+// Everything that a disk and an index of random content make each other do.
+TEST(Crawl, MergesAsTwoSetsDo) {
+  for (unsigned seed = 0; seed < 300; ++seed) {
+    std::mt19937 random(seed);
+    std::set<std::string> sets[2];
+    for (auto& set : sets) {
+      for (unsigned i = random() % 30; i > 0; --i) {
+        set.insert("/" + std::to_string(random() % 40));
+      }
+    }
+    const auto reader = [](const std::set<std::string>& set, auto make) {
+      return [it = set.begin(), end = set.end(), make]() mutable {
+        return it == end ? decltype(make(*it))() : make(*it++);
+      };
+    };
+    std::map<std::string, std::string> got;
+    std::string last;
+    const auto note = [&](const std::string& path, const char* what) {
+      EXPECT_GT(path, last);
+      last = path;
+      got[path] = what;
+    };
+    auto next_on_disk = reader(sets[0], [](const std::string& path) {
+      return std::optional<DiskEntry>(DiskEntry{path, {}});
+    });
+    auto next_indexed = reader(sets[1], [](const std::string& path) {
+      return std::optional<IndexedPath>(IndexedPath{path, {}});
+    });
+    vexlo::fileindexd::MergeByPath([&] { return next_on_disk(); }, [&] { return next_indexed(); },
+                                   [&](const DiskEntry& entry, const IndexedPath* indexed) {
+                                     EXPECT_TRUE(indexed == nullptr || indexed->path == entry.path);
+                                     note(entry.path, indexed == nullptr ? "new" : "both");
+                                   },
+                                   [&](const IndexedPath& indexed) { note(indexed.path, "gone"); });
+    std::map<std::string, std::string> want;
+    for (const std::string& path : sets[0]) {
+      want[path] = sets[1].contains(path) ? "both" : "new";
+    }
+    for (const std::string& path : sets[1]) {
+      want.try_emplace(path, "gone");
+    }
+    EXPECT_EQ(got, want) << seed;
+  }
+}
+
+TEST(Crawl, NothingIsTakenForGoneThatCouldNotBeLookedAt) {
+  const TempFolder folder;
+  for (const char* const name : {"a", "b", "c"}) {
+    fs::create_directory(folder / name);
+    WriteText(folder / (std::string(name) + "/x"), "");
+  }
+  const std::vector<std::string> all = Listed(folder.Path());
+  const struct {
+    const char* function;
+    int nth;
+    std::set<std::string> unknown;
+  } cases[] = {
+      {"getdents64", 1, {"/a", "/a/x", "/b", "/b/x", "/c", "/c/x"}},
+      {"getdents64", 3, {"/a/x"}},
+      {"getdents64", 5, {"/b/x"}},
+      {"fstatat", 2, {"/a"}},
+  };
+  for (const auto& c : cases) {
+    std::set<std::string> unknown;
+    std::set<std::string> gone;
+    DiskWalk walk(folder.Path(), "", Everything());
+    const ScopedFault fault(c.function, EIO, c.nth);
+    auto it = all.begin();
+    vexlo::fileindexd::MergeByPath(
+        [&] { return walk.Next(); },
+        [&] {
+          return it == all.end() ? std::nullopt : std::optional(IndexedPath{*it++, {}});
+        },
+        [](const DiskEntry&, const IndexedPath*) {},
+        [&](const IndexedPath& indexed) {
+          (walk.IsUnknown(indexed.path) ? unknown : gone)
+              .insert(indexed.path.substr(folder.Path().size()));
+        });
+    EXPECT_EQ(unknown, c.unknown) << c.function << c.nth;
+    EXPECT_EQ(gone, std::set<std::string>()) << c.function << c.nth;
+    EXPECT_EQ(walk.LastError(), EIO);
+  }
+}
+
+TEST(Crawl, WhatGoesWithAFolderIsNotedOnce) {
+  GoneList list(3);
+  EXPECT_TRUE(list.Add("/v/a", true));
+  EXPECT_TRUE(list.Add("/v/b", false));
+  const std::pair<const char*, bool> cases[] = {{"/v/a", false},    {"/v/a/x", true},
+                                                {"/v/a/x/y", true}, {"/v/a.txt", false},
+                                                {"/v/b/x", false},  {"/v", false}};
+  for (const auto& [path, want] : cases) {
+    EXPECT_EQ(list.Contains(path), want) << path;
+  }
+  EXPECT_TRUE(list.Add("/v/c", false));
+  EXPECT_FALSE(list.Add("/v/d", false));
+  EXPECT_EQ(list.Take().size(), 3U);
+  EXPECT_FALSE(list.Contains("/v/a/x"));
+}
+
+}  // namespace

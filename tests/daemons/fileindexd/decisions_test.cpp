@@ -1,0 +1,155 @@
+// What the daemon decides without looking at anything: failures, renames, stamps.
+#include <gtest/gtest.h>
+
+#include <functional>
+
+#include "common/json.h"
+#include "daemons/fileindexd/consequence.h"
+#include "daemons/fileindexd/rename_plan.h"
+#include "daemons/fileindexd/share_state.h"
+#include "daemons/fileindexd/stamp.h"
+#include "support/syslog_capture.h"
+#include "support/temp_folder.h"
+
+namespace {
+
+using vexlo::fileindexd::Consequence;
+using vexlo::fileindexd::RenameFacts;
+using vexlo::fileindexd::RenameStep;
+using vexlo::fileindexd::ShareState;
+using vexlo::fileindexd::Stamp;
+using vexlo::fileindexd::StampOf;
+
+TEST(Decisions, WhatACodeDoesToAnOperationAndToACycle) {
+  const struct {
+    int code;
+    Consequence operation;
+    Consequence cycle;
+  } cases[] = {
+      {914, Consequence::kGoOn, Consequence::kRetry},
+      {917, Consequence::kGoOn, Consequence::kRetry},
+      {120, Consequence::kGoOn, Consequence::kRetry},
+      {502, Consequence::kGoOn, Consequence::kRetry},
+      {2007, Consequence::kGoOn, Consequence::kRetry},
+      {31337, Consequence::kGoOn, Consequence::kRetry},
+      {913, Consequence::kRetry, Consequence::kRetry},
+      {503, Consequence::kRetry, Consequence::kRetry},
+      {506, Consequence::kRetry, Consequence::kRetry},
+      {2004, Consequence::kRetry, Consequence::kRetry},
+      {2011, Consequence::kRetry, Consequence::kRetry},
+      {1003, Consequence::kNoSpace, Consequence::kNoSpace},
+      {2010, Consequence::kNoSpace, Consequence::kNoSpace},
+      {800, Consequence::kUnavailable, Consequence::kUnavailable},
+      {2002, Consequence::kRebuild, Consequence::kRebuild},
+      {2005, Consequence::kRebuild, Consequence::kRebuild},
+  };
+  for (const auto& c : cases) {
+    EXPECT_EQ(vexlo::fileindexd::OfOperation(c.code), c.operation) << c.code;
+    EXPECT_EQ(vexlo::fileindexd::OfCycle(c.code), c.cycle) << c.code;
+  }
+}
+
+TEST(Decisions, WaitsGrowUpToAMinute) {
+  std::chrono::seconds wait{0};
+  for (const int want : {1, 2, 4, 8, 16, 32, 60, 60}) {
+    wait = vexlo::fileindexd::NextWait(wait);
+    EXPECT_EQ(wait.count(), want);
+  }
+}
+
+TEST(Decisions, OnlyTheDocumentsOfWhatHasMovedMove) {
+  constexpr auto kNone = std::nullopt;
+  const struct {
+    const char* name;
+    RenameFacts facts;
+    RenameStep want;
+  } cases[] = {
+      {"Moved", {true, true, 7, kNone, 7}, RenameStep::kMove},
+      {"MovedAndTheOldPathUsedAnew", {true, true, 7, 8, 7}, RenameStep::kMove},
+      {"DoneBeforeAndTheOldPathIndexedAnew", {true, true, 8, 8, 7}, RenameStep::kReconcile},
+      {"DoneBefore", {true, false, kNone, kNone, 7}, RenameStep::kReconcile},
+      {"AnotherFileStandsThereNow", {true, true, 7, kNone, 9}, RenameStep::kReconcile},
+      {"WithoutStamp", {true, true, kNone, kNone, 7}, RenameStep::kMove},
+      {"WithoutStampAndTheOldPathUsedAnew", {true, true, kNone, 8, 7}, RenameStep::kReconcile},
+      {"RenamedOn", {true, true, 7, kNone, kNone}, RenameStep::kMove},
+      {"RenamedOnAndTheOldPathUsedAnew", {true, true, 7, 8, kNone}, RenameStep::kMove},
+      {"RenamedOnAndDoneBefore", {true, true, 8, 8, kNone}, RenameStep::kForget},
+      {"GoneAndNeverIndexed", {true, false, kNone, kNone, kNone}, RenameStep::kForget},
+      {"NotWanted", {false, true, 7, kNone, 7}, RenameStep::kForget},
+  };
+  for (const auto& c : cases) {
+    EXPECT_EQ(vexlo::fileindexd::PlanRename(c.facts), c.want) << c.name;
+  }
+}
+
+constexpr int64_t kSecond = 1'000'000'000;
+
+TEST(Decisions, AStampTellsWhetherAFileHasChanged) {
+  struct stat file {};
+  file.st_size = 10;
+  file.st_mtim = {1000, 5};
+  file.st_ctim = {2000, 7};
+  file.st_ino = 3;
+  const struct {
+    const char* name;
+    std::function<void(struct stat&)> change;
+    bool content;
+    int64_t indexed_after_ns;  // The change of the attributes.
+    bool is_current;
+  } cases[] = {
+      {"Same", [](struct stat&) {}, true, kSecond, true},
+      {"Size", [](struct stat& s) { ++s.st_size; }, true, kSecond, false},
+      {"Modified", [](struct stat& s) { ++s.st_mtim.tv_nsec; }, true, kSecond, false},
+      {"CopiedWithItsDates", [](struct stat& s) { ++s.st_ctim.tv_nsec; }, true, kSecond, false},
+      {"InodeAlone", [](struct stat& s) { ++s.st_ino; }, true, kSecond, true},
+      {"ContentIsWantedNow", [](struct stat&) {}, false, kSecond, false},
+      {"IndexedInTheTickOfTheChange", [](struct stat&) {}, true, kSecond / 100, false},
+      {"IndexedAfterTheTick", [](struct stat&) {}, true, kSecond / 10, true},
+  };
+  for (const auto& c : cases) {
+    const int64_t now = 2000 * kSecond + 7 + c.indexed_after_ns;
+    const Stamp indexed = StampOf(file, c.content, {now / kSecond, now % kSecond});
+    struct stat changed = file;
+    c.change(changed);
+    EXPECT_EQ(IsCurrent(vexlo::fileindexd::StampFrom(ToJson(indexed)),
+                        StampOf(changed, /*content=*/true, {})),
+              c.is_current)
+        << c.name;
+  }
+  // Without fractions of a second the file system may keep none.
+  file.st_ctim.tv_nsec = 0;
+  EXPECT_TRUE(StampOf(file, true, {2001, 900'000'000}).is_young);
+  EXPECT_FALSE(StampOf(file, true, {2002, 100'000'000}).is_young);
+}
+
+TEST(Decisions, WhatIsNoStampIsNone) {
+  for (const char* const text : {"null", "7", "{}", R"({"size":1,"mtime":2,"ctime":3})",
+                                 R"({"size":1,"mtime":2,"ctime":3,"inode":-1})",
+                                 R"({"size":"1","mtime":2,"ctime":3,"inode":4})"}) {
+    Json::Value value;
+    ASSERT_TRUE(vexlo::JsonFromString(value, text)) << text;
+    EXPECT_FALSE(vexlo::fileindexd::StampFrom(value)) << text;
+  }
+}
+
+TEST(ShareState, IsReadAsItWasSaved) {
+  const TempFolder folder;
+  const SyslogCapture log;
+  const std::string file = folder / "made/docs.json";
+  ShareState state;
+  EXPECT_EQ(vexlo::fileindexd::LoadShareState(file), state);
+  state.crawled = {"/v/a", "/v/\xE9"};
+  state.rebuilt = true;
+  SaveShareState(file, state);
+  EXPECT_EQ(vexlo::fileindexd::LoadShareState(file), state);
+  state.crawl = {"/v/a", "why", "/v/a/\xE9", 2, true};
+  SaveShareState(file, state);
+  EXPECT_EQ(vexlo::fileindexd::LoadShareState(file), state);
+  for (const char* const damaged :
+       {"", "[]", R"({"crawled":7})", R"({"crawled":[],"crawl":{"root":"/v"}})"}) {
+    WriteText(file, damaged);
+    EXPECT_EQ(vexlo::fileindexd::LoadShareState(file), ShareState()) << damaged;
+  }
+}
+
+}  // namespace

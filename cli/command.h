@@ -63,6 +63,7 @@ struct Command {
 
 // One a command family.
 std::vector<Command> ExplainCommands();
+std::vector<Command> ExtractCommands();
 std::vector<Command> IndexCommands();
 std::vector<Command> QueueCommands();
 std::vector<Command> SearchCommands();

@@ -1,0 +1,24 @@
+// The readers of formats, one for each library that reads them.
+//
+// Each adds to the document what it finds, and throws Fault when it finds less than the file must
+// hold; what it has added by then stands. What its library throws besides counts as damage, and
+// std::bad_alloc goes through. `type` is the media type that the file's beginning tells.
+#ifndef DAEMONS_KAVOCONTENTEXTRACTD_FORMATS_H_
+#define DAEMONS_KAVOCONTENTEXTRACTD_FORMATS_H_
+
+#include <string>
+#include <string_view>
+
+#include "daemons/kavocontentextractd/document.h"
+#include "daemons/kavocontentextractd/source.h"
+
+namespace vexlo::extractd {
+
+// Plain text. False, and nothing is added, for what is none.
+bool ReadPlainText(const Source& source, Document& document);
+
+void ReadPdf(const Source& source, const std::string& type, Document& document);
+
+}  // namespace vexlo::extractd
+
+#endif  // DAEMONS_KAVOCONTENTEXTRACTD_FORMATS_H_

@@ -15,6 +15,9 @@ namespace {
 namespace field = fileindex::elastic::field;
 
 constexpr size_t kMaxFieldBytes = size_t{64} << 10;
+// The two that the library's list of fields does not have.
+constexpr char kLatitude[] = "KAVOMDLatitude";
+constexpr char kLongitude[] = "KAVOMDLongitude";
 constexpr std::string_view kReplacement = "\xEF\xBF\xBD";
 
 bool IsSpace(char c) { return c == ' ' || (c >= '\t' && c <= '\r'); }
@@ -171,6 +174,11 @@ void Document::SetDate(const char* field, std::string_view iso_8601) {
   if (ParseDate(iso_8601, seconds)) {
     fields_[field] = static_cast<Json::Int64>(seconds);
   }
+}
+
+void Document::SetPlace(double latitude, double longitude) {
+  fields_[kLatitude] = latitude;
+  fields_[kLongitude] = longitude;
 }
 
 void Document::AddText(const char* field, std::string_view value) {

@@ -45,6 +45,8 @@ class Document {
   void SetNumber(const char* field, int64_t value);
   void SetReal(const char* field, double value);
   void SetDate(const char* field, std::string_view iso_8601);
+  // Degrees, north and east being positive.
+  void SetPlace(double latitude, double longitude);
   // Adds to a list of different texts.
   void AddText(const char* field, std::string_view value);
 

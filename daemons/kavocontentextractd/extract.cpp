@@ -9,6 +9,7 @@
 #include <stdexcept>
 #include <string_view>
 
+#include "common/string.h"
 #include "daemons/kavocontentextractd/document.h"
 #include "daemons/kavocontentextractd/fault.h"
 #include "daemons/kavocontentextractd/formats.h"
@@ -24,31 +25,70 @@ namespace reason = kavo::local::content_reason;
 
 constexpr size_t kHeadBytes = size_t{64} << 10;
 
+using Reader = void (*)(const Source& source, const std::string& type, Document& document);
+
 struct Format {
-  std::string_view type;  // A media type, or its beginning up to "/".
-  void (*read)(const Source& source, const std::string& type, Document& document);
+  std::string_view type;  // A media type, or its beginning up to "/" or ".".
+  Reader read;
 };
 constexpr Format kFormats[] = {
+    {"application/epub+zip", ReadOffice},
     {"application/pdf", ReadPdf},
+    {"application/rtf", ReadRtf},
+    {"application/vnd.oasis.opendocument.", ReadOffice},
+    {"application/vnd.openxmlformats-officedocument.", ReadOffice},
+    {"application/xhtml+xml", ReadHtml},
+    {"application/zip", ReadOffice},  // Documents of some programs look like any archive.
+    {"audio/", ReadAudio},
+    {"application/ogg", ReadAudio},
+    {"image/svg+xml", ReadHtml},
+    {"image/", ReadPhoto},
+    {"text/html", ReadHtml},
+    {"text/rtf", ReadRtf},
+    {"video/", ReadMedia},
+};
+// What the beginning of a file does not tell.
+constexpr Format kExtensions[] = {
+    {"htm", ReadHtml}, {"html", ReadHtml},  {"mp3", ReadAudio},
+    {"svg", ReadHtml}, {"xhtml", ReadHtml},
 };
 
-// The first row that fits counts.
-const Format* FindFormat(std::string_view type) {
-  const Format* const found =
-      std::find_if(std::begin(kFormats), std::end(kFormats), [type](const Format& row) {
-        return row.type.ends_with('/') ? type.starts_with(row.type) : type == row.type;
-      });
-  return found == std::end(kFormats) ? nullptr : found;
+Reader FindReader(std::string_view type) {
+  for (const Format& row : kFormats) {
+    const bool is_beginning = row.type.ends_with('/') || row.type.ends_with('.');
+    if (is_beginning ? type.starts_with(row.type) : type == row.type) {
+      return row.read;
+    }
+  }
+  return nullptr;
 }
 
-void Read(const Source& source, const std::string& type, Document& document) {
-  if (const Format* const format = FindFormat(type)) {
-    document.SetText(field::KAVOMDContentType, type);
-    format->read(source, type, document);
+// Binary documents of older programs: what is in them is not read, but one kind of them holds a
+// newer document under a password.
+bool IsEncryptedOffice(std::string_view head) {
+  constexpr std::string_view kCompoundFile = "\xD0\xCF\x11\xE0\xA1\xB1\x1A\xE1";
+  constexpr char kName[] = "E\0n\0c\0r\0y\0p\0t\0e\0d\0P\0a\0c\0k\0a\0g\0e";
+  return head.starts_with(kCompoundFile) &&
+         head.find({kName, sizeof(kName) - 1}) != std::string_view::npos;
+}
+
+void Read(const Source& source, const std::string& type, const std::string& head,
+          Document& document) {
+  Reader read = FindReader(type);
+  if (read == nullptr && (type.starts_with("text/") || type == "application/octet-stream")) {
+    const std::string extension = GetFileExtension(source.Name(), /*lower=*/true);
+    const Format* const row =
+        std::find_if(std::begin(kExtensions), std::end(kExtensions),
+                     [&](const Format& format) { return format.type == extension; });
+    read = row == std::end(kExtensions) ? nullptr : row->read;
+  }
+  document.SetText(field::KAVOMDContentType, type);
+  if (read != nullptr) {
+    read(source, type, document);
+  } else if (IsEncryptedOffice(head)) {
+    throw Fault(reason::kEncrypted, "the document wants a password");
   } else if (ReadPlainText(source, document)) {
     document.SetText(field::KAVOMDContentType, "text/plain");
-  } else {
-    document.SetText(field::KAVOMDContentType, type);
   }
 }
 
@@ -71,7 +111,7 @@ Json::Value Extractor::Extract(int file, const std::string& name) const {
     const Source source(file, name);
     const std::string head = source.Read(kHeadBytes);
     const char* const type = magic_buffer(types_.get(), head.data(), head.size());
-    Read(source, type == nullptr ? "application/octet-stream" : type, document);
+    Read(source, type == nullptr ? "application/octet-stream" : type, head, document);
   } catch (const Fault& thrown) {
     fault = thrown;
   } catch (const std::bad_alloc&) {

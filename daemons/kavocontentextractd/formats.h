@@ -17,7 +17,17 @@ namespace vexlo::extractd {
 // Plain text. False, and nothing is added, for what is none.
 bool ReadPlainText(const Source& source, Document& document);
 
+void ReadAudio(const Source& source, const std::string& type, Document& document);
+void ReadHtml(const Source& source, const std::string& type, Document& document);
+void ReadMedia(const Source& source, const std::string& type, Document& document);
+// Sets also the type, of archives that turn out to be documents.
+void ReadOffice(const Source& source, const std::string& type, Document& document);
 void ReadPdf(const Source& source, const std::string& type, Document& document);
+void ReadPhoto(const Source& source, const std::string& type, Document& document);
+void ReadRtf(const Source& source, const std::string& type, Document& document);
+
+// Adds the text of a page; its title and author, too, when it is the whole document.
+void AddHtml(const std::string& html, bool is_whole, Document& document);
 
 }  // namespace vexlo::extractd
 

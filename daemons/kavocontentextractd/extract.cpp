@@ -72,9 +72,17 @@ bool IsEncryptedOffice(std::string_view head) {
          head.find({kName, sizeof(kName) - 1}) != std::string_view::npos;
 }
 
-void Read(const Source& source, const std::string& type, const std::string& head,
-          Document& document) {
+// The beginning of a text may look like that of a picture or a sound.
+bool IsMedia(std::string_view type) {
+  return type.starts_with("image/") || type.starts_with("audio/") || type.starts_with("video/");
+}
+
+void Read(const Source& source, std::string type, const std::string& head, Document& document) {
   Reader read = FindReader(type);
+  if (read == nullptr && head.starts_with("PK\x03\x04")) {
+    type = "application/zip";  // Of unusual archives the table says nothing.
+    read = ReadOffice;
+  }
   if (read == nullptr && (type.starts_with("text/") || type == "application/octet-stream")) {
     const std::string extension = GetFileExtension(source.Name(), /*lower=*/true);
     const Format* const row =
@@ -84,7 +92,15 @@ void Read(const Source& source, const std::string& type, const std::string& head
   }
   document.SetText(field::KAVOMDContentType, type);
   if (read != nullptr) {
-    read(source, type, document);
+    try {
+      read(source, type, document);
+    } catch (const Fault& fault) {
+      if (fault.Reason() != reason::kDamaged || !IsMedia(type) ||
+          !ReadPlainText(source, document)) {
+        throw;
+      }
+      document.SetText(field::KAVOMDContentType, "text/plain");
+    }
   } else if (IsEncryptedOffice(head)) {
     throw Fault(reason::kEncrypted, "the document wants a password");
   } else if (ReadPlainText(source, document)) {

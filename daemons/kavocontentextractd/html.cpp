@@ -46,7 +46,7 @@ struct Page {
   bool is_whole;  // Its title and author are those of the document.
   int hidden = 0;
   bool is_title = false;
-  std::string title;
+  Text title;
   std::exception_ptr thrown;
 
   static Page& Of(void* data) { return *static_cast<Page*>(data); }
@@ -121,24 +121,23 @@ struct Page {
         return;
       }
       const std::string_view part(reinterpret_cast<const char*>(text), static_cast<size_t>(size));
-      constexpr size_t kMostTitle = 4096;
-      if (page.is_title && page.title.size() < kMostTitle) {
-        page.title += part;
+      if (page.is_title) {
+        AddWords(part, page.title);
       }
-      page.AddWords(part);
+      AddWords(part, page.document.text);
     });
   }
 
   // White space of the source is only what stands between words.
-  void AddWords(std::string_view part) {
+  static void AddWords(std::string_view part, Text& text) {
     constexpr std::string_view kSpace = " \t\r\n\f";
     while (!part.empty()) {
       const size_t word = std::min(part.find_first_of(kSpace), part.size());
-      document.text.Append(part.substr(0, word));
+      text.Append(part.substr(0, word));
       part.remove_prefix(word);
       const size_t space = std::min(part.find_first_not_of(kSpace), part.size());
       if (space > 0) {
-        document.text.EndWord();
+        text.EndWord();
       }
       part.remove_prefix(space);
     }
@@ -177,7 +176,7 @@ void AddHtml(const std::string& html, bool is_whole, Document& document) {
   sax.characters = Page::Characters;
   sax.cdataBlock = Page::Characters;
   sax.ignorableWhitespace = Page::Characters;
-  Page page{document, is_whole, 0, false, "", nullptr};
+  Page page{document, is_whole, 0, false, {}, nullptr};
   const std::unique_ptr<htmlParserCtxt, void (*)(htmlParserCtxtPtr)> parser(
       htmlCreatePushParserCtxt(&sax, &page, nullptr, 0, nullptr,
                                utf8 ? XML_CHAR_ENCODING_UTF8 : XML_CHAR_ENCODING_NONE),
@@ -196,7 +195,7 @@ void AddHtml(const std::string& html, bool is_whole, Document& document) {
     std::rethrow_exception(page.thrown);
   }
   if (is_whole) {
-    document.SetText(field::KAVOMDTitle, page.title);
+    document.SetText(field::KAVOMDTitle, page.title.Get());
   }
   document.text.EndLine();
 }

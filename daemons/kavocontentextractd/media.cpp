@@ -22,6 +22,7 @@ constexpr size_t kBlockBytes = size_t{256} << 10;
 // What is told of a stream stands at the ends of its file; whoever reads much more is led around.
 constexpr uint64_t kMostRead = uint64_t{256} << 20;
 constexpr size_t kMostStreams = 100;
+constexpr unsigned kMostJumps = 500;
 
 // The library's texts hold a code point in each character.
 std::string Utf8(const std::wstring& text) {
@@ -54,8 +55,9 @@ void Feed(MediaInfo& media, const Source& source) {
   constexpr uint64_t kNowhere = ~uint64_t{0};
   uint64_t at = 0;
   uint64_t read = 0;
+  unsigned jumps = 0;
   media.Open_Buffer_Init(source.Size(), 0);
-  while (read < kMostRead) {
+  while (read < kMostRead && jumps < kMostJumps) {
     const std::string block = source.Read(kBlockBytes, at);
     if (block.empty()) {
       break;
@@ -69,6 +71,7 @@ void Feed(MediaInfo& media, const Source& source) {
     }
     if (const uint64_t wanted = media.Open_Buffer_Continue_GoTo_Get(); wanted != kNowhere) {
       at = wanted;
+      ++jumps;
       media.Open_Buffer_Init(source.Size(), at);
     }
   }

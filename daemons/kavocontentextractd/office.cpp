@@ -6,11 +6,9 @@
 #include <algorithm>
 #include <functional>
 #include <iterator>
-#include <map>
 #include <memory>
 #include <optional>
-#include <set>
-#include <vector>
+#include <utility>
 
 #include "daemons/kavocontentextractd/fault.h"
 #include "daemons/kavocontentextractd/formats.h"
@@ -312,9 +310,12 @@ bool IsPage(std::string_view name) {
 
 class PartReader {
  public:
-  PartReader(const std::string& type, Document& document) : type_(type), document_(document) {}
+  PartReader(std::string type, Document& document) : type_(std::move(type)), document_(document) {}
 
   void Read(const std::string& name, Archive& archive) {
+    if (name == "mimetype") {
+      ReadType(archive);
+    }
     PropertyHandler properties(document_);
     if (type_.starts_with(kOpenDocument)) {
       if (name == "META-INF/manifest.xml") {
@@ -340,17 +341,34 @@ class PartReader {
     for (const Main& row : kMains) {
       if (name == row.part) {
         document_.SetText(field::KAVOMDContentType, row.type);
-        has_text_ = true;
+        is_document_ = has_text_ = true;
       }
     }
   }
 
-  // Whether the part was there without which this is no document.
+  // Whether a part was there that only documents have.
+  bool IsDocument() const { return is_document_; }
+  // Whether the part was there that the text is in.
   bool HasText() const { return has_text_; }
 
  private:
+  // Also where the archive's writer has left more at its beginning than the table of types allows.
+  void ReadType(Archive& archive) {
+    std::string type;
+    archive.Read([&type](std::string_view part, bool /*is_last*/) {
+      constexpr size_t kMost = 256;
+      type += part.substr(0, kMost - std::min(kMost, type.size()));
+      return true;
+    });
+    if (type.starts_with(kOpenDocument) || type == kEpub) {
+      type_ = type;
+      is_document_ = true;
+      document_.SetText(field::KAVOMDContentType, type);
+    }
+  }
+
   void ReadText(bool is_open_document, Archive& archive) {
-    has_text_ = true;
+    is_document_ = has_text_ = true;
     if (!document_.text.IsFull()) {
       TextHandler handler(is_open_document, document_.text);
       ReadXml(archive, handler, &document_.text);
@@ -367,8 +385,9 @@ class PartReader {
     AddHtml(page, /*is_whole=*/false, document_);
   }
 
-  const std::string& type_;
+  std::string type_;
   Document& document_;
+  bool is_document_ = false;
   bool has_text_ = false;
 };
 
@@ -394,7 +413,7 @@ void ReadOffice(const Source& source, const std::string& type, Document& documen
   } catch (const Fault& thrown) {
     fault = thrown;
   }
-  if (is_plain_archive && !parts.HasText()) {
+  if (is_plain_archive && !parts.IsDocument()) {
     return;  // What is in archives is not looked at, so nothing is missing.
   }
   if (fault) {

@@ -79,7 +79,9 @@ void ReadPdf(const Source& source, const std::string& /*type*/, Document& docume
       document.SetReal(field::KAVOMDPageWidth, size.width());
       document.SetReal(field::KAVOMDPageHeight, size.height());
     }
-    document.text.Append(Utf8(page->text()));
+    std::string text = Utf8(page->text());
+    text.erase(text.find_last_not_of('\f') + 1);  // Every page ends in it.
+    document.text.Append(text);
     document.text.EndLine();
   }
   if (unreadable > 0) {

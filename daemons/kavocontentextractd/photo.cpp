@@ -82,17 +82,22 @@ constexpr Tag kTags[] = {
     {"Xmp.photoshop.Country", field::KAVOMDCountry, Kind::kText},
 };
 
+// Of a text in several languages the one that the file prefers, or else the first.
+template <typename Datum>
+std::string TextOf(const Datum& datum) {
+  if (const auto* const texts = dynamic_cast<const Exiv2::LangAltValue*>(&datum.value());
+      texts != nullptr && !texts->value_.empty()) {
+    const auto preferred = texts->value_.find("x-default");
+    return preferred == texts->value_.end() ? texts->value_.begin()->second : preferred->second;
+  }
+  return datum.toString();
+}
+
 template <typename Datum>
 void SetTag(const Tag& tag, const Datum& datum, const std::string& shown, Document& document) {
   switch (tag.kind) {
     case Kind::kText:
-      // Of a text in several languages the first; its value begins with the language's name.
-      document.SetText(tag.field,
-                       datum.typeId() == Exiv2::langAlt
-                           ? datum.toString(0).substr(datum.toString(0).starts_with("lang=")
-                                                          ? datum.toString(0).find(' ') + 1
-                                                          : 0)
-                           : datum.toString());
+      document.SetText(tag.field, TextOf(datum));
       break;
     case Kind::kShown:
       document.SetText(tag.field, shown);

@@ -4,7 +4,9 @@
 #include <poll.h>
 #include <spawn.h>
 #include <sys/socket.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
@@ -20,6 +22,9 @@ namespace vexlo::extractd {
 namespace {
 
 using Clock = std::chrono::steady_clock;
+
+// From the end of a worker's socket to that of the worker.
+constexpr int kEndMilliseconds = 500;
 
 // The C library's errors come as return values here.
 class SpawnSetup {
@@ -139,6 +144,9 @@ class Pool::Worker {
       return {Outcome::kDeadline, ""};
     }
     const std::optional<int> status = Kill();
+    if (status && WIFEXITED(*status) && WEXITSTATUS(*status) == kOutOfMemory) {
+      return {Outcome::kMemory, ""};
+    }
     return {Outcome::kDied, status ? "the worker " + StatusText(*status) : "the worker is gone"};
   }
 
@@ -153,7 +161,13 @@ class Pool::Worker {
     }
     int status = 0;
     pid_t ended = 0;
-    // Whoever ends already keeps the status that it ends with.
+    // One that closed its socket is about to end, and how is worth knowing.
+    struct pollfd peer = {socket_.Get(), 0, 0};
+    if (poll(&peer, 1, 0) == 1 && (peer.revents & POLLHUP) != 0) {
+      const daemon::UniqueFd process(static_cast<int>(syscall(SYS_pidfd_open, pid_, 0)));
+      struct pollfd end = {process.Get(), POLLIN, 0};
+      poll(&end, 1, kEndMilliseconds);
+    }
     kill(pid_, SIGKILL);
     do {
       ended = waitpid(pid_, &status, 0);

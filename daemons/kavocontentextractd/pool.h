@@ -19,6 +19,8 @@ namespace vexlo::extractd {
 
 // The descriptor on which a worker finds its socket.
 inline constexpr int kWorkerSocket = 3;
+// The exit status of a worker that had no memory left for a file.
+inline constexpr int kOutOfMemory = 3;
 // A worker's reply is refused when it is longer.
 inline constexpr size_t kMaxReplyBytes = size_t{8} << 20;
 
@@ -40,7 +42,8 @@ class Pool {
     enum Kind {
       kReply,
       kNoWorker,  // None came free in time, or none could be started: no fault of the file.
-      kDeadline,  // These two cost a worker.
+      kDeadline,  // These three cost a worker.
+      kMemory,
       kDied,
     };
     Kind kind;

@@ -61,6 +61,10 @@ std::optional<Fault> DeathOf(const Pool::Outcome& outcome, const PoolOptions& op
                                         std::to_string(options.deadline / std::chrono::seconds(1)) +
                                         " seconds");
   }
+  if (outcome.kind == Pool::Outcome::kMemory) {
+    return Fault(reason::kMemory,
+                 "reading takes over " + std::to_string(options.memory) + " MiB of memory");
+  }
   if (outcome.kind == Pool::Outcome::kDied) {
     return Fault(reason::kCrash, outcome.text);
   }
@@ -77,9 +81,7 @@ std::optional<Fault> DeathOf(const Pool::Outcome& outcome, const PoolOptions& op
   if (!error.isObject() || TextOf(error, "reason").empty()) {
     return Fault(reason::kCrash, "the worker's reply is no error");
   }
-  return TextOf(error, "reason") == reason::kMemory
-             ? std::optional(Fault(reason::kMemory, TextOf(error, "msg")))
-             : std::nullopt;
+  return std::nullopt;
 }
 
 }  // namespace
@@ -174,7 +176,7 @@ daemon::DaemonOptions ExtractdOptions(Settings* settings) {
       }
       if (words[i] == "--deadline" && number >= 1 && number <= 3600) {
         settings->deadline = number;
-      } else if (words[i] == "--memory" && (number == 0 || number >= 64)) {
+      } else if (words[i] == "--memory" && (number == 0 || number >= 128)) {
         settings->memory = number;
       } else if (words[i] == "--workers" && number >= 1 && number <= 16) {
         settings->workers = number;

@@ -13,9 +13,7 @@
 #include "common/json.h"
 #include "daemons/common/unique_fd.h"
 #include "daemons/kavocontentextractd/extract.h"
-#include "daemons/kavocontentextractd/fault.h"
 #include "daemons/kavocontentextractd/pool.h"
-#include "kavo/local/content.h"
 #include "kavo/local/frames.h"
 
 namespace vexlo::extractd {
@@ -34,7 +32,8 @@ bool GiveUpRights(size_t memory) {
   // A file over the limit is an error where it is written, not a signal.
   signal(SIGXFSZ, SIG_IGN);
   // The daemon's end ends a worker that is busy, too; an idle one sees its socket closed.
-  prctl(PR_SET_NAME, "kavoce-worker");  // It was started as "exe".
+  close_range(kWorkerSocket + 1, ~0U, 0);  // What whoever started the daemon has left open.
+  prctl(PR_SET_NAME, "kavoce-worker");     // It was started as "exe".
   return prctl(PR_SET_PDEATHSIG, SIGKILL) == 0 && prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
          Limit(RLIMIT_FSIZE, 0) && Limit(RLIMIT_CORE, 0) &&
          (memory == 0 || Limit(RLIMIT_AS, static_cast<rlim_t>(memory) << 20));
@@ -55,19 +54,15 @@ int RunWorker(size_t memory) {
   int number = -1;
   while (kavo::local::ReceiveFrame(socket.Get(), kMaxRequestBytes, text, &number, kNever)) {
     const daemon::UniqueFd file(number);
-    bool is_out_of_memory = false;
     std::string reply;
     try {
       Json::Value request;
       JsonFromString(request, text);
       reply = JsonToString(extractor.Extract(file.Get(), request["name"].asString()));
     } catch (const std::bad_alloc&) {
-      is_out_of_memory = true;
-      reply = JsonToString(
-          ReplyOf(Fault(kavo::local::content_reason::kMemory,
-                        "reading takes over " + std::to_string(memory) + " MiB of memory")));
+      _exit(kOutOfMemory);  // There may be none for an answer, and what is left is in pieces.
     }
-    if (!kavo::local::SendFrame(socket.Get(), reply, -1, kNever) || is_out_of_memory) {
+    if (!kavo::local::SendFrame(socket.Get(), reply, -1, kNever)) {
       return 1;
     }
   }

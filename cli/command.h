@@ -64,6 +64,7 @@ struct Command {
 // One a command family.
 std::vector<Command> ConfigCommands();
 std::vector<Command> ExplainCommands();
+std::vector<Command> ExtractCommands();
 std::vector<Command> FolderCommands();
 std::vector<Command> IndexCommands();
 std::vector<Command> PauseCommands();

@@ -36,7 +36,7 @@ endif()
 file(RELATIVE_PATH fileindex_bin_to_lib
   ${CMAKE_INSTALL_FULL_BINDIR} ${CMAKE_INSTALL_FULL_LIBDIR})
 set_property(TARGET ${fileindex_libraries} PROPERTY INSTALL_RPATH "$ORIGIN")
-foreach(program evnotifyd fileindex_cli fileindexd kavoelasticd)
+foreach(program evnotifyd fileindex_cli fileindexd kavocontentextractd kavoelasticd)
   if(TARGET ${program})
     set_property(TARGET ${program} PROPERTY INSTALL_RPATH "$ORIGIN/${fileindex_bin_to_lib}")
     install(TARGETS ${program} RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})

@@ -16,6 +16,7 @@
 #include <utility>
 
 #include "common/check.h"
+#include "kavo/local/frames.h"
 
 namespace vexlo::daemon {
 namespace {
@@ -133,6 +134,7 @@ struct FrameServer::Connection {
   char header[kHeaderBytes] = {};
   size_t header_got = 0;
   uint64_t length = 0;  // Of the request, then of what is left to drain.
+  UniqueFd file;        // That came with it.
   std::string request;  // Its size is what there is room for.
   size_t got = 0;
   RequestMemory::Share share;
@@ -171,7 +173,8 @@ FrameServer::FrameServer(FrameServerOptions options)
       scratch_(kScratchBytes),
       next_deadline_(Clock::time_point::max()),
       memory_(options_.max_total_bytes, options_.max_request_bytes) {
-  VEXLO_CHECK(!options_.handler || options_.workers == 0 || options_.max_connections == 0 ||
+  VEXLO_CHECK((!options_.handler && !options_.file_handler) || options_.workers == 0 ||
+                  options_.max_connections == 0 ||
                   options_.max_total_bytes / 2 < options_.max_request_bytes,
               ERR_BAD_PARAMETER, "a server's options make no sense, path=" + options_.socket_path);
   epoll_ = UniqueFd(epoll_create1(EPOLL_CLOEXEC));
@@ -383,7 +386,16 @@ FrameServer::Received FrameServer::Receive(Connection& connection) {
 
 // Reads what there is, a short request whole.
 FrameServer::Received FrameServer::ReceiveHeader(Connection& connection) {
-  const ssize_t count = ReceiveSome(connection.fd.Get(), scratch_.data(), scratch_.size());
+  ssize_t count = 0;
+  if (options_.file_handler) {
+    int file = connection.file.Get();
+    count = kavo::local::ReceiveSome(connection.fd.Get(), scratch_.data(), scratch_.size(), &file);
+    if (file != connection.file.Get()) {
+      connection.file = UniqueFd(file);
+    }
+  } else {
+    count = ReceiveSome(connection.fd.Get(), scratch_.data(), scratch_.size());
+  }
   if (count <= 0) {
     return count < 0 && IsForNow() ? Received::kPart : Received::kBroken;
   }
@@ -653,7 +665,8 @@ void FrameServer::Work() {
     lock.unlock();
 
     RequestMemory::Share share = std::exchange(connection->share, {});
-    std::optional<std::string> reply = Answer(std::move(connection->request));
+    std::optional<std::string> reply =
+        Answer(std::move(connection->request), std::move(connection->file));
     size_t unsent = 0;
     if (reply && SendFrame(connection->fd.Get(), *reply, connection->sent) &&
         connection->sent < kHeaderBytes + reply->size()) {
@@ -681,9 +694,10 @@ void FrameServer::Work() {
 }
 
 // The request goes with the handler's call, before the reply is sent.
-std::optional<std::string> FrameServer::Answer(std::string request) {
+std::optional<std::string> FrameServer::Answer(std::string request, UniqueFd file) {
   try {
-    return options_.handler(request);
+    return options_.file_handler ? options_.file_handler(request, std::move(file))
+                                 : options_.handler(request);
   } catch (const std::exception& error) {
     LogLine(VEXLO_SOURCE, __LINE__, std::string("the handler failed, reason=") + error.what());
   } catch (...) {

@@ -35,6 +35,9 @@ struct FrameServerOptions {
 
   // Called on several threads at once, as many as there are workers.
   std::function<std::string(const std::string& request)> handler;
+  // Instead of `handler`: gets also the descriptor that came with the first byte of the request, if
+  // one did (SCM_RIGHTS; of several the first). Without this a descriptor that is sent is closed.
+  std::function<std::string(const std::string& request, UniqueFd file)> file_handler;
   // The reply to a request that is refused; when unset, or when it returns "", the connection is
   // closed without one.
   std::function<std::string(Refusal)> refusal;
@@ -148,7 +151,7 @@ class FrameServer {
 
   // The workers.
   void Work();
-  std::optional<std::string> Answer(std::string request);
+  std::optional<std::string> Answer(std::string request, UniqueFd file);
   void Wake();
 
   const FrameServerOptions options_;

@@ -1,27 +1,45 @@
-// The plain extraction: what the file system tells of every file, and the text of files that are
-// text as they stand. It reads no document, photo or media format and starts no helper.
+// What the file system tells of every file, and the text of small files that are UTF-8 as they
+// stand. Whatever else is in files is asked of the daemon kavocontentextractd: the libraries that
+// read documents and media are not to be trusted with the caller's process.
 #include "kavo/content_extract.h"
 
 #include <fcntl.h>
+#include <json/reader.h>
+#include <json/writer.h>
+#include <poll.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <iterator>
+#include <memory>
+#include <optional>
 #include <string_view>
 #include <system_error>
 #include <utility>
 
+#include "kavo/local/content.h"
+#include "kavo/local/frames.h"
+#include "kavo/local/shares.h"
 #include "platform/local/fd.h"
 
+using kavo::local::kMaxTextBytes;
 using kavo::local::ScopedFd;
+
+namespace reason = kavo::local::content_reason;
 
 namespace {
 
-constexpr size_t kMaxTextBytes = size_t{1} << 20;
-constexpr size_t kBinaryProbeBytes = size_t{64} << 10;
+using Clock = std::chrono::steady_clock;
+
+// What the daemon takes with its usual limits: two tries of ten seconds, and the way to them.
+constexpr std::chrono::seconds kUsualWait(25);
+constexpr std::chrono::seconds kConnectWait(5);
+constexpr size_t kMaxReplyBytes = size_t{8} << 20;
+constexpr size_t kMaxStatsBytes = size_t{64} << 10;
 constexpr std::string_view kByteOrderMark = "\xEF\xBB\xBF";
 
 [[noreturn]] void Fail(const std::string& path) {
@@ -72,64 +90,39 @@ size_t CharacterBytes(std::string_view text) {
   return lead->bytes;
 }
 
-// The length of the longest beginning that is UTF-8; `cut_off` tells that only the end of the last
-// character is missing.
-size_t Utf8Prefix(std::string_view text, bool& cut_off) {
-  size_t at = 0;
-  cut_off = false;
-  while (at < text.size()) {
-    const size_t bytes = CharacterBytes(text.substr(at));
-    cut_off = bytes > text.size() - at;
-    if (bytes == 0 || cut_off) {
-      break;
+// False, too, when the last character is cut off.
+bool IsUtf8(std::string_view text) {
+  while (!text.empty()) {
+    const size_t bytes = CharacterBytes(text);
+    if (bytes == 0 || bytes > text.size()) {
+      return false;
     }
-    at += bytes;
+    text.remove_prefix(bytes);
   }
-  return at;
+  return true;
 }
 
-// Of the control characters plain text has white space, backspace and escape sequences; compressed
-// data without a NUL has others, too.
-bool HasBinaryControls(std::string_view text) {
-  return std::any_of(text.begin(), text.end(), [](char c) {
+// Of the control characters plain text has white space, backspace and escape sequences. A shift of
+// the character set (ESC $, ESC ( ) makes another encoding of what looks like ASCII.
+bool IsPlainText(std::string_view text) {
+  const auto is_binary = [](char c) {
     const auto byte = static_cast<unsigned char>(c);
     return byte < 0x20 && (byte < '\b' || byte > '\r') && byte != 0x1B;
-  });
+  };
+  return std::none_of(text.begin(), text.end(), is_binary) &&
+         text.find("\x1B$") == std::string_view::npos &&
+         text.find("\x1B(") == std::string_view::npos && IsUtf8(text);
 }
 
-std::string Latin1ToUtf8(std::string_view text) {
-  std::string utf8;
-  utf8.reserve(text.size() + text.size() / 4);
-  for (const char c : text) {
-    const auto byte = static_cast<unsigned char>(c);
-    if (byte < 0x80) {
-      utf8 += c;
-    } else {
-      utf8 += static_cast<char>(0xC0 | (byte >> 6));
-      utf8 += static_cast<char>(0x80 | (byte & 0x3F));
-    }
-  }
-  return utf8;
-}
-
-// `text` is a file, or the beginning of one that has more. "" for what is no plain text.
-std::string PlainText(std::string text, bool has_more) {
-  const size_t nul = text.find('\0');
-  if (nul < kBinaryProbeBytes) {
-    return "";
-  }
-  if (nul != std::string::npos) {  // Text with something else behind it.
-    text.resize(nul);
-    has_more = true;
-  }
-  bool cut_off = false;
-  const size_t prefix = Utf8Prefix(text, cut_off);
-  if (prefix == text.size() || (cut_off && has_more)) {
-    text.resize(prefix);
-    return text.starts_with(kByteOrderMark) ? text.substr(kByteOrderMark.size()) : text;
-  }
-  return HasBinaryControls(text) ? "" : Latin1ToUtf8(text);
-}
+// Files with these names are text by themselves, without markup to take out.
+constexpr std::string_view kTextExtensions[] = {
+    "asm", "awk", "bash",  "bat",  "bib",  "c",    "cc",  "cfg",   "cmake", "conf", "cpp",
+    "cs",  "css", "csv",   "cxx",  "diff", "eml",  "go",  "h",     "hh",    "hpp",  "hxx",
+    "in",  "inc", "ini",   "java", "js",   "json", "kt",  "log",   "lua",   "m",    "md",
+    "mk",  "nfo", "patch", "php",  "pl",   "pm",   "po",  "proto", "py",    "r",    "rb",
+    "rs",  "rst", "scala", "sh",   "sql",  "srt",  "sub", "swift", "tcl",   "tex",  "toml",
+    "ts",  "tsv", "txt",   "vbs",  "vim",  "yaml", "yml", "zsh"};
+static_assert(std::is_sorted(std::begin(kTextExtensions), std::end(kTextExtensions)));
 
 // Reading for an index is no use of the file, so its access time is left alone where that is
 // allowed.
@@ -139,32 +132,149 @@ int OpenQuietly(const std::string& path) {
   return fd < 0 && errno == EPERM ? open(path.c_str(), kFlags) : fd;
 }
 
-// "" for a file that is no regular one any more.
-std::string ReadText(const std::string& path) {
-  const ScopedFd file(OpenQuietly(path));
-  struct stat info {};
-  if (file.Get() < 0 || fstat(file.Get(), &info) != 0) {
-    Fail(path);
-  }
-  if (!S_ISREG(info.st_mode)) {
-    return "";
-  }
-  std::string text(std::min(kMaxTextBytes, static_cast<size_t>(info.st_size)) + 1, '\0');
+// Nothing when the file is longer than `most` bytes, or cannot be read.
+std::optional<std::string> ReadShort(int file, size_t most) {
+  std::string text(most + 1, '\0');
   size_t size = 0;
   while (size < text.size()) {
-    const ssize_t count = read(file.Get(), text.data() + size, text.size() - size);
+    const ssize_t count =
+        pread(file, text.data() + size, text.size() - size, static_cast<off_t>(size));
     if (count == 0) {
-      break;
+      text.resize(size);
+      return text;
     }
     if (count < 0 && errno != EINTR) {
-      Fail(path);
+      return std::nullopt;
     }
     size += count > 0 ? static_cast<size_t>(count) : 0;
   }
-  // The one byte more was read to tell whether there is more.
-  const bool has_more = size == text.size();
-  text.resize(has_more ? size - 1 : size);
-  return PlainText(std::move(text), has_more);
+  return std::nullopt;
+}
+
+void SetError(Json::Value& fields, const std::string& word, const std::string& message) {
+  fields[kavo::local::kContentErrorField] = word + ": " + message;
+}
+
+// True when the text is in `fields` without the daemon's help.
+bool TakePlainText(int file, uint64_t size, Json::Value& fields) {
+  const std::string extension = fields["KAVOMDExtension"].asString();
+  if (size > kMaxTextBytes ||
+      !std::binary_search(std::begin(kTextExtensions), std::end(kTextExtensions), extension)) {
+    return false;
+  }
+  std::optional<std::string> text = ReadShort(file, static_cast<size_t>(size));
+  if (!text || !IsPlainText(*text)) {
+    return false;
+  }
+  fields["KAVOMDContentType"] = "text/plain";
+  fields["KAVOMDTextContent"] =
+      text->starts_with(kByteOrderMark) ? text->substr(kByteOrderMark.size()) : *std::move(text);
+  return true;
+}
+
+bool ParseReply(const std::string& text, Json::Value& reply) {
+  Json::CharReaderBuilder builder;
+  builder["collectComments"] = false;
+  const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+  return reader->parse(text.data(), text.data() + text.size(), &reply, nullptr) && reply.isObject();
+}
+
+std::string ToText(const Json::Value& value) {
+  Json::StreamWriterBuilder builder;
+  builder["indentation"] = "";
+  builder["emitUTF8"] = true;
+  return Json::writeString(builder, value);
+}
+
+// "" for what is no text.
+std::string TextOf(const Json::Value& object, const char* member) {
+  const Json::Value text = object.isObject() ? object[member] : Json::Value();
+  return text.isString() ? text.asString() : "";
+}
+
+// How long a daemon that has not answered in the usual time may take with the limits that it was
+// started with; zero when it does not say.
+std::chrono::seconds LongerWait() {
+  const kavo::local::Deadline deadline = Clock::now() + kConnectWait;
+  const ScopedFd socket(kavo::local::ConnectWithin(kavo::local::ContentSocket(), deadline));
+  Json::Value stats;
+  std::string text;
+  if (socket.Get() < 0 ||
+      !kavo::local::SendFrame(socket.Get(), R"({"command":"stats"})", -1, deadline) ||
+      !kavo::local::ReceiveFrame(socket.Get(), kMaxStatsBytes, text, nullptr, deadline) ||
+      !ParseReply(text, stats) || !stats["deadline"].isUInt()) {
+    return std::chrono::seconds(0);
+  }
+  return std::chrono::seconds(int64_t{2} * stats["deadline"].asUInt() + 5);
+}
+
+// The daemon's reply about the file; false with errno.
+bool AskDaemon(const std::string& path, int file, Json::Value& reply) {
+  const Clock::time_point start = Clock::now();
+  const ScopedFd socket(
+      kavo::local::ConnectWithin(kavo::local::ContentSocket(), start + kConnectWait));
+  if (socket.Get() < 0) {
+    return false;
+  }
+  Json::Value request;
+  request["command"] = "extract";
+  request["path"] = path;
+  if (!kavo::local::SendFrame(socket.Get(), ToText(request), file, start + kUsualWait)) {
+    return false;
+  }
+  struct pollfd answer = {socket.Get(), POLLIN, 0};
+  int count = 0;
+  do {  // Most of the time the whole reply comes at once, so only its beginning is waited for here.
+    const auto left =
+        std::chrono::ceil<std::chrono::milliseconds>(start + kUsualWait - Clock::now()).count();
+    count = poll(&answer, 1, static_cast<int>(std::max<int64_t>(left, 0)));
+  } while (count < 0 && errno == EINTR);
+  const auto wait = count == 0 ? LongerWait() : kUsualWait + kConnectWait;
+  std::string text;
+  if (!kavo::local::ReceiveFrame(socket.Get(), kMaxReplyBytes, text, nullptr, start + wait)) {
+    return false;
+  }
+  if (!ParseReply(text, reply)) {
+    errno = EBADMSG;
+    return false;
+  }
+  return true;
+}
+
+std::string UnavailableText(int error) {
+  const std::string socket = kavo::local::ContentSocket();
+  return error == ENOENT || error == ECONNREFUSED
+             ? "kavocontentextractd does not run (nobody answers on " + socket + ")"
+             : "kavocontentextractd gives no answer on " + socket + ", " +
+                   std::generic_category().message(error);
+}
+
+// Adds what stands in the content, or why it is missing.
+void AddContent(const std::string& path, Json::Value& fields) {
+  const ScopedFd file(OpenQuietly(path));
+  struct stat info {};
+  if (file.Get() < 0 || fstat(file.Get(), &info) != 0) {
+    SetError(fields, reason::kUnreadable, std::generic_category().message(errno));
+    return;
+  }
+  if (!S_ISREG(info.st_mode) || info.st_size == 0 ||
+      TakePlainText(file.Get(), static_cast<uint64_t>(info.st_size), fields)) {
+    return;
+  }
+  Json::Value reply;
+  if (!AskDaemon(path, file.Get(), reply)) {
+    SetError(fields, reason::kUnavailable, UnavailableText(errno));
+    return;
+  }
+  if (reply.isMember("error")) {
+    SetError(fields, TextOf(reply["error"], "reason"), TextOf(reply["error"], "msg"));
+    return;
+  }
+  for (const std::string& name : reply.getMemberNames()) {
+    if (!fields.isMember(name)) {  // What the file system says stands.
+      fields[name] = std::move(reply[name]);
+    }
+  }
 }
 
 std::string Octal(unsigned mode) {
@@ -206,6 +316,12 @@ Json::Value AttributesOf(const std::string& path, const struct statx& info) {
 
 }  // namespace
 
+namespace kavo::local {
+
+std::string ContentSocket() { return Root() + "/var/run/kavocontentextractd.sock"; }
+
+}  // namespace kavo::local
+
 // NOLINTNEXTLINE(readability-identifier-naming): these are the platform's names.
 namespace KAVO::CONTENT_EXTRACT {
 
@@ -217,10 +333,7 @@ void ParseFile(const std::string& path, const Json::Value& options, Json::Value&
   }
   Json::Value fields = AttributesOf(path, info);
   if (options["need_meta"].isBool() && options["need_meta"].asBool() && S_ISREG(info.stx_mode)) {
-    const std::string text = ReadText(path);
-    if (!text.empty()) {
-      fields["KAVOMDTextContent"] = text;
-    }
+    AddContent(path, fields);
   }
   metadata = std::move(fields);
 }

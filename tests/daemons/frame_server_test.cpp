@@ -1,5 +1,6 @@
 #include "daemons/common/frame_server.h"
 
+#include <fcntl.h>
 #include <signal.h>
 #include <sys/eventfd.h>
 #include <sys/resource.h>
@@ -10,6 +11,7 @@
 #include <optional>
 
 #include "common/error.h"
+#include "kavo/local/frames.h"
 #include "support/faults.h"
 #include "support/raw_client.h"
 #include "support/syslog_capture.h"
@@ -95,6 +97,26 @@ TEST_F(FrameServerTest, AnswersEachRequestOrRefusesIt) {
     Sending(part);  // And is gone.
   }
   EXPECT_EQ(Ask("still there"), "still there");
+}
+
+TEST_F(FrameServerTest, GivesTheHandlerTheFileThatComesWithARequest) {
+  options_.file_handler = [](const std::string& request, UniqueFd file) {
+    std::string content(request.size(), '\0');
+    const ssize_t count = pread(file.Get(), content.data(), content.size(), 0);
+    return count < 0 ? "none" : content.substr(0, static_cast<size_t>(count));
+  };
+  Start();
+  WriteText(folder_ / "file", "content");
+  const RawClient file(open((folder_ / "file").c_str(), O_RDONLY));
+  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(30);
+  for (const std::string& request : {std::string(4, 'x'), std::string(200000, 'x')}) {
+    const RawClient client(path_);
+    EXPECT_TRUE(kavo::local::SendFrame(client.fd, request, file.fd, deadline));
+    std::string reply;
+    EXPECT_TRUE(kavo::local::ReceiveFrame(client.fd, 100, reply, nullptr, deadline));
+    EXPECT_EQ(reply, request.size() == 4 ? "cont" : "content");
+  }
+  EXPECT_EQ(Ask("no file"), "none");
 }
 
 TEST_F(FrameServerTest, StalledConnectionsCostNoThread) {

@@ -5,9 +5,12 @@
 #include <json/writer.h>  // Prints values where they differ.
 #include <sys/stat.h>
 
+#include "support/private_root.h"
 #include "support/temp_folder.h"
 
 namespace {
+
+const PrivateRoot kRoot;
 
 Json::Value Extract(const std::string& path, bool need_meta = true) {
   Json::Value options;
@@ -19,44 +22,53 @@ Json::Value Extract(const std::string& path, bool need_meta = true) {
 
 struct Text {
   const char* name;
+  const char* file;
   std::string content;
-  std::string text;
+  std::string text;   // "" for none.
+  std::string error;  // How it begins; "" for none.
 };
 
-TEST(ContentExtract, TakesTextFromPlainTextFiles) {
+TEST(ContentExtract, TakesTextFromPlainTextFilesAndElseAsksTheDaemon) {
   const TempFolder folder;
-  const std::string kibs(64 * 1024, 'k');
   std::string mib(1 << 20, 'm');
+  const std::string nobody = "unavailable: kavocontentextractd does not run";
+  const std::string utf8 = "na\xC3\xAFve \xE2\x82\xAC \xF0\x9F\x98\x80\n";
   const Text rows[] = {
-      {"empty", "", ""},
-      {"UTF-8", "na\xC3\xAFve \xE2\x82\xAC \xF0\x9F\x98\x80\n",
-       "na\xC3\xAFve \xE2\x82\xAC \xF0\x9F\x98\x80\n"},
-      {"byte-order mark", "\xEF\xBB\xBFtext", "text"},
-      {"Latin-1", "na\xEFve", "na\xC3\xAFve"},
-      {"cut off at the end of the file", "x\xC3", "x\xC3\x83"},
-      {"surrogate", "\xED\xA0\x80", "\xC3\xAD\xC2\xA0\xC2\x80"},
-      {"over-long", "\xC0\xAF\xE0\x80\x80", "\xC3\x80\xC2\xAF\xC3\xA0\xC2\x80\xC2\x80"},
-      {"over U+10FFFF", "\xF4\x90\x80\x80", "\xC3\xB4\xC2\x90\xC2\x80\xC2\x80"},
-      {"compressed", "\x1F\x8B\x08\x04\xFF\xFE", ""},
-      {"NUL at the end of the probe", kibs.substr(1) + '\0', ""},
-      {"NUL behind the probe", kibs + '\0' + "\xFF", kibs},
-      {"at the limit", mib, mib},
-      {"over the limit", mib + "more", mib},
-      {"a character across the limit", mib.substr(1) + "\xC3\xAF", mib.substr(1)},
+      {"empty", "a", "", "", ""},
+      {"UTF-8", "a.txt", utf8, utf8, ""},
+      {"extension in capitals", "a.MD", utf8, utf8, ""},
+      {"first extension of the table", "a.asm", utf8, utf8, ""},
+      {"last extension of the table", "a.zsh", utf8, utf8, ""},
+      {"no extension of a text", "a.html", utf8, "", nobody},
+      {"byte-order mark", "a.txt", "\xEF\xBB\xBFtext", "text", ""},
+      {"Latin-1", "a.txt", "na\xEFve", "", nobody},
+      {"cut off at the end of the file", "a.txt", "x\xC3", "", nobody},
+      {"surrogate", "a.txt", "\xED\xA0\x80", "", nobody},
+      {"over-long", "a.txt", "\xC0\xAF\xE0\x80\x80", "", nobody},
+      {"over U+10FFFF", "a.txt", "\xF4\x90\x80\x80", "", nobody},
+      {"ISO-2022-JP", "a.txt", "\x1B$B8l\x1B(B", "", nobody},
+      {"NUL", "a.txt", std::string("a\0b", 3), "", nobody},
+      {"at the limit", "a.txt", mib, mib, ""},
+      {"over the limit", "a.txt", mib + "m", "", nobody},
   };
   for (const Text& row : rows) {
-    WriteText(folder / "file", row.content);
-    const Json::Value metadata = Extract(folder / "file");
+    const std::string path = folder / row.file;
+    WriteText(path, row.content);
+    const Json::Value metadata = Extract(path);
     EXPECT_TRUE(metadata["KAVOMDTextContent"].asString() == row.text) << row.name;
     EXPECT_EQ(metadata.isMember("KAVOMDTextContent"), !row.text.empty()) << row.name;
+    EXPECT_TRUE(metadata["KAVOMDContentError"].asString().starts_with(row.error)) << row.name;
+    EXPECT_EQ(metadata.isMember("KAVOMDContentError"), !row.error.empty()) << row.name;
     EXPECT_EQ(metadata["KAVOMDFSSize"].asUInt64(), row.content.size()) << row.name;
-    EXPECT_FALSE(Extract(folder / "file", false).isMember("KAVOMDTextContent")) << row.name;
+    const Json::Value attributes = Extract(path, false);
+    EXPECT_FALSE(attributes.isMember("KAVOMDTextContent")) << row.name;
+    EXPECT_FALSE(attributes.isMember("KAVOMDContentError")) << row.name;
   }
 }
 
 TEST(ContentExtract, TellsWhatTheFileSystemKnows) {
   const TempFolder folder;
-  const std::string file = folder / "A.tar.G\xC9Z";
+  const std::string file = folder / "A.\xC9.TXT";
   WriteText(file, "text");
   const struct timespec times[] = {{1000000001, 999999999}, {-5, 0}};
   ASSERT_TRUE(chmod(file.c_str(), 0640) == 0 && utimensat(AT_FDCWD, file.c_str(), times, 0) == 0);
@@ -67,11 +79,12 @@ TEST(ContentExtract, TellsWhatTheFileSystemKnows) {
       metadata.removeMember(date);
     }
     metadata.removeMember("KAVOMDTextContent");
+    metadata.removeMember("KAVOMDContentType");
     Json::Value want;
     want["KAVOMDPath"] = file;
-    want["KAVOMDFSName"] = want["KAVOMDDisplayName"] = "A.tar.G\xC9Z";
+    want["KAVOMDFSName"] = want["KAVOMDDisplayName"] = "A.\xC9.TXT";
     want["KAVOMDParent"] = folder.Path();
-    want["KAVOMDExtension"] = want["KAVOMDKind"] = "g\xC9z";
+    want["KAVOMDExtension"] = want["KAVOMDKind"] = "txt";
     want["KAVOMDIsDir"] = want["KAVOMDIsEncrypted"] = false;
     want["KAVOMDFSSize"] = Json::UInt64{4};
     want["KAVOMDFSContentChangeDate"] = want["KAVOMDContentModificationDate"] = Json::Int64{-5};

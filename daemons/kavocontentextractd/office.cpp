@@ -1,0 +1,427 @@
+// Office documents and e-books: ZIP archives of XML and XHTML, by libarchive and expat.
+#include <archive.h>
+#include <archive_entry.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <functional>
+#include <iterator>
+#include <memory>
+#include <optional>
+#include <utility>
+
+#include "daemons/kavocontentextractd/fault.h"
+#include "daemons/kavocontentextractd/formats.h"
+#include "daemons/kavocontentextractd/xml.h"
+#include "fileindex/elastic_control/schema.h"
+#include "kavo/local/content.h"
+
+namespace vexlo::extractd {
+namespace {
+
+namespace field = fileindex::elastic::field;
+namespace reason = kavo::local::content_reason;
+
+// What a document may unpack to: of the largest that people write it is a multiple, of a bomb a
+// small part.
+constexpr uint64_t kMostUnpacked = uint64_t{256} << 20;
+constexpr size_t kMostEntries = 20000;
+constexpr size_t kBlockBytes = size_t{64} << 10;
+constexpr size_t kMostPageBytes = size_t{16} << 20;
+
+constexpr std::string_view kOpenDocument = "application/vnd.oasis.opendocument.";
+constexpr std::string_view kEpub = "application/epub+zip";
+
+// The text of office documents. OOXML has it in elements "t" ("w:t", "a:t", "t" of sheets), the
+// cells' numbers in "v"; OpenDocument has it everywhere below "body".
+class TextHandler : public XmlHandler {
+ public:
+  TextHandler(bool is_open_document, Text& text)
+      : is_open_document_(is_open_document), text_(text) {}
+
+  void Start(std::string_view name, const Attributes& attributes) override {
+    if (is_open_document_) {
+      StartOpenDocument(name);
+    } else if (name == "t") {
+      is_text_ = true;
+    } else if (name == "c") {
+      const std::string_view type = attributes.Get("t");
+      is_value_ = type.empty() || type == "n" || type == "str";
+    } else if (name == "v") {
+      is_text_ = is_value_;
+    } else if (name == "tab") {
+      text_.Append("\t");
+    } else if (name == "br" || name == "cr") {
+      text_.EndLine();
+    }
+  }
+
+  void End(std::string_view name) override {
+    if (is_open_document_) {
+      if (name == "p" || name == "h") {
+        text_.EndLine();
+      } else if (name == "body") {
+        is_text_ = false;
+      }
+      return;
+    }
+    if (name == "t" || name == "v") {
+      is_text_ = false;
+    }
+    // Paragraphs, strings of sheets, rows; cells end as words do.
+    if (name == "p" || name == "si" || name == "row" || name == "is") {
+      text_.EndLine();
+    } else if (name == "v") {
+      text_.EndWord();
+    }
+  }
+
+  void Characters(std::string_view text) override {
+    if (is_text_) {
+      text_.Append(text);
+    }
+  }
+
+ private:
+  void StartOpenDocument(std::string_view name) {
+    if (name == "body") {
+      is_text_ = true;
+    } else if (name == "s") {
+      text_.Append(" ");
+    } else if (name == "tab") {
+      text_.Append("\t");
+    } else if (name == "line-break") {
+      text_.EndLine();
+    }
+  }
+
+  const bool is_open_document_;
+  Text& text_;
+  bool is_text_ = false;
+  bool is_value_ = false;
+};
+
+enum class Kind { kText, kList, kNumber, kDate };
+
+struct Property {
+  std::string_view name;  // Of an element, or of an attribute of "document-statistic".
+  const char* field;
+  Kind kind;
+};
+// Of all formats: Dublin Core, the properties of OOXML, those of OpenDocument.
+constexpr Property kProperties[] = {
+    {"title", field::KAVOMDTitle, Kind::kText},
+    {"creator", field::KAVOMDAuthors, Kind::kList},
+    {"initial-creator", field::KAVOMDAuthors, Kind::kList},
+    {"contributor", field::KAVOMDContributors, Kind::kList},
+    {"subject", field::KAVOMDSubject, Kind::kText},
+    {"description", field::KAVOMDDescription, Kind::kText},
+    {"keywords", field::KAVOMDKeywords, Kind::kList},
+    {"keyword", field::KAVOMDKeywords, Kind::kList},
+    {"category", field::KAVOMDCategory, Kind::kText},
+    {"language", field::KAVOMDLanguages, Kind::kList},
+    {"publisher", field::KAVOMDPublishers, Kind::kList},
+    {"identifier", field::KAVOMDIdentifier, Kind::kText},
+    {"rights", field::KAVOMDRights, Kind::kText},
+    {"created", field::KAVOMDContentCreationDate, Kind::kDate},
+    {"creation-date", field::KAVOMDContentCreationDate, Kind::kDate},
+    {"generator", field::KAVOMDEncodingApplications, Kind::kText},
+    {"Application", field::KAVOMDEncodingApplications, Kind::kText},
+    {"Company", field::KAVOMDOrganizations, Kind::kText},
+    {"Manager", field::KAVOMDManager, Kind::kText},
+    {"Template", field::KAVOMDTemplate, Kind::kText},
+    {"Pages", field::KAVOMDPageCount, Kind::kNumber},
+    {"Slides", field::KAVOMDPageCount, Kind::kNumber},
+    {"page-count", field::KAVOMDPageCount, Kind::kNumber},
+    {"Words", field::KAVOMDWordCount, Kind::kNumber},
+    {"word-count", field::KAVOMDWordCount, Kind::kNumber},
+};
+
+void SetProperty(std::string_view name, const std::string& value, Document& document) {
+  const Property* const property =
+      std::find_if(std::begin(kProperties), std::end(kProperties),
+                   [name](const Property& row) { return row.name == name; });
+  if (property == std::end(kProperties)) {
+    return;
+  }
+  switch (property->kind) {
+    case Kind::kText:
+      document.SetText(property->field, value);
+      break;
+    case Kind::kList:
+      document.AddText(property->field, value);
+      break;
+    case Kind::kNumber:
+      document.SetNumber(property->field, strtoll(value.c_str(), nullptr, 10));
+      break;
+    case Kind::kDate:
+      document.SetDate(property->field, value);
+      break;
+  }
+}
+
+class PropertyHandler : public XmlHandler {
+ public:
+  explicit PropertyHandler(Document& document) : document_(document) {}
+
+  void Start(std::string_view name, const Attributes& attributes) override {
+    value_.clear();
+    if (name == "document-statistic") {
+      for (const char* const count : {"page-count", "word-count"}) {
+        SetProperty(count, std::string(attributes.Get(count)), document_);
+      }
+    }
+  }
+  void End(std::string_view name) override {
+    SetProperty(name, value_, document_);
+    value_.clear();
+  }
+  void Characters(std::string_view text) override {
+    constexpr size_t kMost = size_t{64} << 10;
+    value_ += text.substr(0, kMost - std::min(kMost, value_.size()));
+  }
+
+ private:
+  Document& document_;
+  std::string value_;
+};
+
+// Finds the entry of an encrypted part in META-INF/manifest.xml.
+class ManifestHandler : public XmlHandler {
+ public:
+  void Start(std::string_view name, const Attributes& /*attributes*/) override {
+    if (name == "encryption-data") {
+      throw Fault(reason::kEncrypted, "the document wants a password");
+    }
+  }
+  void End(std::string_view /*name*/) override {}
+  void Characters(std::string_view /*text*/) override {}
+};
+
+class Archive {
+ public:
+  explicit Archive(const Source& source) : archive_(archive_read_new(), archive_read_free) {
+    if (archive_ == nullptr) {
+      throw std::bad_alloc();
+    }
+    archive_read_support_format_zip(archive_.get());
+    if (lseek(source.Fd(), 0, SEEK_SET) != 0 ||
+        archive_read_open_fd(archive_.get(), source.Fd(), kBlockBytes) != ARCHIVE_OK) {
+      Fail();
+    }
+  }
+
+  // The name of the next entry; nothing at the end.
+  std::optional<std::string> Next() {
+    struct archive_entry* entry = nullptr;
+    const int result = archive_read_next_header(archive_.get(), &entry);
+    if (result == ARCHIVE_EOF) {
+      return std::nullopt;
+    }
+    if (result < ARCHIVE_WARN) {
+      Fail();
+    }
+    if (++entries_ > kMostEntries) {
+      throw Fault(reason::kOversized, "over " + std::to_string(kMostEntries) + " entries");
+    }
+    is_encrypted_ = archive_entry_is_data_encrypted(entry) == 1;
+    const char* const name = archive_entry_pathname(entry);
+    return name == nullptr ? "" : name;
+  }
+
+  // Gives the entry in parts to `take`, which returns false when it wants no more.
+  void Read(const std::function<bool(std::string_view part, bool is_last)>& take) {
+    if (is_encrypted_) {
+      throw Fault(reason::kEncrypted, "the archive wants a password");
+    }
+    char buffer[kBlockBytes];
+    while (true) {
+      const la_ssize_t count = archive_read_data(archive_.get(), buffer, sizeof(buffer));
+      if (count < 0) {
+        Fail();
+      }
+      unpacked_ += static_cast<uint64_t>(count);
+      if (unpacked_ > kMostUnpacked) {
+        throw Fault(reason::kOversized,
+                    "it unpacks to over " + std::to_string(kMostUnpacked >> 20) + " MiB");
+      }
+      if (!take({buffer, static_cast<size_t>(count)}, count == 0) || count == 0) {
+        return;
+      }
+    }
+  }
+
+ private:
+  [[noreturn]] void Fail() {
+    const char* const text = archive_error_string(archive_.get());
+    throw Fault(reason::kDamaged,
+                "the archive cannot be read, " + std::string(text == nullptr ? "no ZIP" : text));
+  }
+
+  std::unique_ptr<struct archive, int (*)(struct archive*)> archive_;
+  size_t entries_ = 0;
+  uint64_t unpacked_ = 0;
+  bool is_encrypted_ = false;
+};
+
+void ReadXml(Archive& archive, XmlHandler& handler, const Text* text) {
+  XmlReader reader(handler);
+  archive.Read([&](std::string_view part, bool is_last) {
+    reader.Feed(part, is_last);
+    return text == nullptr || !text->IsFull();
+  });
+}
+
+bool HasNumberBetween(std::string_view name, std::string_view before, std::string_view behind) {
+  return name.size() > before.size() + behind.size() && name.starts_with(before) &&
+         name.ends_with(behind) &&
+         name.substr(before.size(), name.size() - before.size() - behind.size())
+                 .find_first_not_of("0123456789") == std::string_view::npos;
+}
+
+// The parts of OOXML that hold text.
+bool IsTextPart(std::string_view name) {
+  constexpr std::string_view kNames[] = {"word/document.xml", "word/footnotes.xml",
+                                         "word/endnotes.xml", "word/comments.xml",
+                                         "xl/sharedStrings.xml"};
+  constexpr std::string_view kNumbered[] = {"word/header", "word/footer", "xl/worksheets/sheet",
+                                            "ppt/slides/slide", "ppt/notesSlides/notesSlide"};
+  return std::find(std::begin(kNames), std::end(kNames), name) != std::end(kNames) ||
+         std::any_of(std::begin(kNumbered), std::end(kNumbered), [name](std::string_view before) {
+           return HasNumberBetween(name, before, ".xml");
+         });
+}
+
+struct Main {
+  std::string_view part;
+  const char* type;
+};
+constexpr Main kMains[] = {
+    {"word/document.xml",
+     "application/vnd.openxmlformats-officedocument.wordprocessingml.document"},
+    {"xl/workbook.xml", "application/vnd.openxmlformats-officedocument.spreadsheetml.sheet"},
+    {"ppt/presentation.xml",
+     "application/vnd.openxmlformats-officedocument.presentationml.presentation"},
+};
+
+bool IsPage(std::string_view name) {
+  return name.ends_with(".xhtml") || name.ends_with(".html") || name.ends_with(".htm");
+}
+
+class PartReader {
+ public:
+  PartReader(std::string type, Document& document) : type_(std::move(type)), document_(document) {}
+
+  void Read(const std::string& name, Archive& archive) {
+    if (name == "mimetype") {
+      ReadType(archive);
+    }
+    PropertyHandler properties(document_);
+    if (type_.starts_with(kOpenDocument)) {
+      if (name == "META-INF/manifest.xml") {
+        ManifestHandler manifest;
+        ReadXml(archive, manifest, nullptr);
+      } else if (name == "meta.xml") {
+        ReadXml(archive, properties, nullptr);
+      } else if (name == "content.xml") {
+        ReadText(/*is_open_document=*/true, archive);
+      }
+    } else if (type_ == kEpub) {
+      if (name.ends_with(".opf")) {
+        ReadXml(archive, properties, nullptr);
+        has_text_ = true;
+      } else if (IsPage(name) && !document_.text.IsFull()) {
+        ReadPage(archive);
+      }
+    } else if (name == "docProps/core.xml" || name == "docProps/app.xml") {
+      ReadXml(archive, properties, nullptr);
+    } else if (IsTextPart(name)) {
+      ReadText(/*is_open_document=*/false, archive);
+    }
+    for (const Main& row : kMains) {
+      if (name == row.part) {
+        document_.SetText(field::KAVOMDContentType, row.type);
+        is_document_ = has_text_ = true;
+      }
+    }
+  }
+
+  // Whether a part was there that only documents have.
+  bool IsDocument() const { return is_document_; }
+  // Whether the part was there that the text is in.
+  bool HasText() const { return has_text_; }
+
+ private:
+  // Also where the archive's writer has left more at its beginning than the table of types allows.
+  void ReadType(Archive& archive) {
+    std::string type;
+    archive.Read([&type](std::string_view part, bool /*is_last*/) {
+      constexpr size_t kMost = 256;
+      type += part.substr(0, kMost - std::min(kMost, type.size()));
+      return true;
+    });
+    if (type.starts_with(kOpenDocument) || type == kEpub) {
+      type_ = type;
+      is_document_ = true;
+      document_.SetText(field::KAVOMDContentType, type);
+    }
+  }
+
+  void ReadText(bool is_open_document, Archive& archive) {
+    is_document_ = has_text_ = true;
+    if (!document_.text.IsFull()) {
+      TextHandler handler(is_open_document, document_.text);
+      ReadXml(archive, handler, &document_.text);
+      document_.text.EndLine();
+    }
+  }
+
+  void ReadPage(Archive& archive) {
+    std::string page;
+    archive.Read([&page](std::string_view part, bool /*is_last*/) {
+      page += part;
+      return page.size() <= kMostPageBytes;
+    });
+    AddHtml(page, /*is_whole=*/false, document_);
+  }
+
+  std::string type_;
+  Document& document_;
+  bool is_document_ = false;
+  bool has_text_ = false;
+};
+
+}  // namespace
+
+void ReadOffice(const Source& source, const std::string& type, Document& document) {
+  const bool is_plain_archive = type == "application/zip" || type == "application/octet-stream";
+  PartReader parts(type, document);
+  // A part that is damaged does not take the others along.
+  std::optional<Fault> fault;
+  try {
+    Archive archive(source);
+    while (const std::optional<std::string> name = archive.Next()) {
+      try {
+        parts.Read(*name, archive);
+      } catch (const Fault& thrown) {
+        if (thrown.Reason() != reason::kDamaged) {
+          throw;
+        }
+        fault = fault ? fault : std::optional(thrown);
+      }
+    }
+  } catch (const Fault& thrown) {
+    fault = thrown;
+  }
+  if (is_plain_archive && !parts.IsDocument()) {
+    return;  // What is in archives is not looked at, so nothing is missing.
+  }
+  if (fault) {
+    throw Fault(*fault);
+  }
+  if (!parts.HasText()) {
+    throw Fault(reason::kDamaged, "the part with the text is missing");
+  }
+}
+
+}  // namespace vexlo::extractd

@@ -1,0 +1,153 @@
+#include "daemons/kavocontentextractd/plain_text.h"
+
+#include <uchardet.h>
+#include <unicode/ucnv.h>
+#include <unicode/utf8.h>
+
+#include <algorithm>
+#include <cstdint>
+#include <iterator>
+#include <memory>
+#include <utility>
+
+#include "daemons/kavocontentextractd/formats.h"
+#include "kavo/local/content.h"
+
+namespace vexlo::extractd {
+namespace {
+
+constexpr size_t kProbeBytes = size_t{64} << 10;
+constexpr size_t kGuessBytes = size_t{256} << 10;
+constexpr char kFallback[] = "windows-1252";
+constexpr std::string_view kReplacement = "\xEF\xBF\xBD";
+
+struct Mark {
+  std::string_view bytes;
+  const char* encoding;
+};
+// UTF-32 before UTF-16: the little-endian marks begin alike.
+constexpr Mark kMarks[] = {
+    {"\xEF\xBB\xBF", "UTF-8"}, {{"\xFF\xFE\0\0", 4}, "UTF-32LE"}, {{"\0\0\xFE\xFF", 4}, "UTF-32BE"},
+    {"\xFF\xFE", "UTF-16LE"},  {"\xFE\xFF", "UTF-16BE"},
+};
+
+// Of the control characters text has white space, backspace and escape sequences.
+bool HasBinaryControls(std::string_view bytes) {
+  return std::any_of(bytes.begin(), bytes.end(), [](char c) {
+    const auto byte = static_cast<unsigned char>(c);
+    return byte < 0x20 && (byte < '\b' || byte > '\r') && byte != 0x1B;
+  });
+}
+
+// Encodings of seven bits that shift to other characters look like ASCII.
+bool HasShifts(std::string_view bytes) {
+  return bytes.find("\x1B$") != std::string_view::npos ||
+         bytes.find("\x1B(") != std::string_view::npos;
+}
+
+}  // namespace
+
+bool IsUtf8(std::string_view bytes, bool has_more) {
+  const auto* const start = reinterpret_cast<const uint8_t*>(bytes.data());
+  size_t at = 0;
+  while (at < bytes.size()) {
+    const auto length = static_cast<int32_t>(std::min<size_t>(bytes.size() - at, U8_MAX_LENGTH));
+    int32_t used = 0;
+    UChar32 character = 0;
+    U8_NEXT(start + at, used, length, character);
+    if (character < 0) {
+      // The bytes of a character that is cut off are all that is left.
+      return has_more && at + static_cast<size_t>(used) == bytes.size() &&
+             used <= U8_COUNT_TRAIL_BYTES(start[at]);
+    }
+    at += static_cast<size_t>(used);
+  }
+  return true;
+}
+
+std::string GuessEncoding(std::string_view bytes) {
+  const std::unique_ptr<struct uchardet, decltype(&uchardet_delete)> detector(uchardet_new(),
+                                                                              uchardet_delete);
+  if (uchardet_handle_data(detector.get(), bytes.data(), std::min(bytes.size(), kGuessBytes)) !=
+      0) {
+    return kFallback;
+  }
+  uchardet_data_end(detector.get());
+  const std::string guess = uchardet_get_charset(detector.get());
+  return guess.empty() || guess == "ASCII" || guess == "UTF-8" ? kFallback : guess;
+}
+
+std::optional<std::string> Convert(std::string_view bytes, const std::string& encoding) {
+  UErrorCode error = U_ZERO_ERROR;
+  const std::unique_ptr<UConverter, decltype(&ucnv_close)> from(ucnv_open(encoding.c_str(), &error),
+                                                                ucnv_close);
+  const std::unique_ptr<UConverter, decltype(&ucnv_close)> to(ucnv_open("UTF-8", &error),
+                                                              ucnv_close);
+  if (U_FAILURE(error)) {
+    return std::nullopt;
+  }
+  std::string text;
+  text.reserve(bytes.size() + bytes.size() / 2);
+  UChar pivot[1024];
+  UChar* pivot_source = pivot;
+  UChar* pivot_target = pivot;
+  const char* source = bytes.data();
+  bool reset = true;
+  do {
+    char buffer[8192];
+    char* target = buffer;
+    error = U_ZERO_ERROR;
+    ucnv_convertEx(to.get(), from.get(), &target, buffer + sizeof(buffer), &source,
+                   bytes.data() + bytes.size(), pivot, &pivot_source, &pivot_target,
+                   pivot + std::size(pivot), static_cast<UBool>(reset), /*flush=*/1, &error);
+    text.append(buffer, target);
+    reset = false;
+  } while (error == U_BUFFER_OVERFLOW_ERROR);
+  return text;
+}
+
+std::optional<std::string> DecodeText(std::string_view bytes, bool has_more) {
+  const auto* const mark = std::find_if(std::begin(kMarks), std::end(kMarks), [&](const Mark& row) {
+    return bytes.starts_with(row.bytes);
+  });
+  if (mark != std::end(kMarks)) {
+    bytes.remove_prefix(mark->bytes.size());
+    return Convert(bytes, mark->encoding);
+  }
+  const size_t nul = bytes.find('\0');
+  if (nul < kProbeBytes) {
+    return std::nullopt;
+  }
+  if (nul != std::string_view::npos) {  // Text with something else behind it.
+    bytes = bytes.substr(0, nul);
+    has_more = true;
+  }
+  if (HasBinaryControls(bytes)) {
+    return std::nullopt;
+  }
+  const std::string encoding =
+      IsUtf8(bytes, has_more) && !HasShifts(bytes) ? "UTF-8" : GuessEncoding(bytes);
+  std::optional<std::string> text = Convert(bytes, encoding);
+  text = text ? std::move(text) : Convert(bytes, kFallback);
+  while (has_more && text && text->ends_with(kReplacement)) {  // A character that is cut off.
+    text->resize(text->size() - kReplacement.size());
+  }
+  return text;
+}
+
+bool ReadPlainText(const Source& source, Document& document) {
+  // As much as ends at the same place whatever the encoding takes for a letter: one or two bytes.
+  constexpr size_t kMostBytes = 2 * kavo::local::kMaxTextBytes;
+  const bool has_more = source.Size() > kMostBytes;
+  const std::optional<std::string> text = DecodeText(source.Read(kMostBytes), has_more);
+  if (!text) {
+    return false;
+  }
+  document.text.Append(*text);
+  if (has_more) {
+    document.text.SetTruncated();
+  }
+  return true;
+}
+
+}  // namespace vexlo::extractd

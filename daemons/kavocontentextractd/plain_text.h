@@ -1,0 +1,29 @@
+// Plain text in any encoding.
+#ifndef DAEMONS_KAVOCONTENTEXTRACTD_PLAIN_TEXT_H_
+#define DAEMONS_KAVOCONTENTEXTRACTD_PLAIN_TEXT_H_
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+namespace vexlo::extractd {
+
+// The text as UTF-8, without a byte-order mark. `bytes` are a file, or the beginning of one that
+// has more. The encoding is that of the byte-order mark, or UTF-8 where that fits, or else what the
+// letters look like most. Nothing for what is no text: a NUL within 64 KiB, or control characters
+// that no text has. A NUL behind that ends the text.
+std::optional<std::string> DecodeText(std::string_view bytes, bool has_more);
+
+// The same bytes in UTF-8; nothing for an encoding that is not known. What is none of its
+// characters becomes U+FFFD.
+std::optional<std::string> Convert(std::string_view bytes, const std::string& encoding);
+
+// The encoding that the letters look like most, windows-1252 when they do not tell.
+std::string GuessEncoding(std::string_view bytes);
+
+// Whether all of it is UTF-8; when more would follow, the last character may be cut off.
+bool IsUtf8(std::string_view bytes, bool has_more);
+
+}  // namespace vexlo::extractd
+
+#endif  // DAEMONS_KAVOCONTENTEXTRACTD_PLAIN_TEXT_H_

@@ -1,0 +1,250 @@
+#include "daemons/kavocontentextractd/pool.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <spawn.h>
+#include <sys/socket.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <optional>
+#include <system_error>
+#include <utility>
+
+#include "common/check.h"
+#include "kavo/local/frames.h"
+
+namespace vexlo::extractd {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+// From the end of a worker's socket to that of the worker.
+constexpr int kEndMilliseconds = 500;
+
+// The C library's errors come as return values here.
+class SpawnSetup {
+ public:
+  SpawnSetup() {
+    posix_spawn_file_actions_init(&actions_);
+    posix_spawnattr_init(&attributes_);
+  }
+  ~SpawnSetup() {
+    posix_spawn_file_actions_destroy(&actions_);
+    posix_spawnattr_destroy(&attributes_);
+  }
+  SpawnSetup(const SpawnSetup&) = delete;
+  SpawnSetup& operator=(const SpawnSetup&) = delete;
+
+  // A worker has its socket and nothing else of the daemon's: neither files nor blocked signals,
+  // nor the terminal's Ctrl-C, which is the daemon's to answer. What its libraries print is
+  // nobody's.
+  int Prepare(int socket) {
+    sigset_t none;
+    sigset_t all;
+    sigemptyset(&none);
+    sigfillset(&all);
+    int error = 0;
+    for (const int standard : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO}) {
+      error = error != 0
+                  ? error
+                  : posix_spawn_file_actions_addopen(&actions_, standard, "/dev/null", O_RDWR, 0);
+    }
+    error = error != 0 ? error : posix_spawn_file_actions_adddup2(&actions_, socket, kWorkerSocket);
+    error = error != 0 ? error : posix_spawnattr_setsigmask(&attributes_, &none);
+    error = error != 0 ? error : posix_spawnattr_setsigdefault(&attributes_, &all);
+    error = error != 0 ? error : posix_spawnattr_setpgroup(&attributes_, 0);
+    return error != 0 ? error
+                      : posix_spawnattr_setflags(&attributes_, POSIX_SPAWN_SETSIGMASK |
+                                                                   POSIX_SPAWN_SETSIGDEF |
+                                                                   POSIX_SPAWN_SETPGROUP);
+  }
+  int Spawn(pid_t* pid, const std::string& program, char** arguments) {
+    return posix_spawn(pid, program.c_str(), &actions_, &attributes_, arguments, environ);
+  }
+
+ private:
+  posix_spawn_file_actions_t actions_;
+  posix_spawnattr_t attributes_;
+};
+
+std::string StatusText(int status) {
+  return WIFSIGNALED(status)
+             ? "ended by signal " + std::to_string(WTERMSIG(status)) + " while it read the file"
+             : "ended with status " + std::to_string(WEXITSTATUS(status)) +
+                   " while it read the file";
+}
+
+}  // namespace
+
+class Pool::Worker {
+ public:
+  Worker(daemon::UniqueFd socket, pid_t pid) : socket_(std::move(socket)), pid_(pid) {}
+  ~Worker() { Kill(); }
+  Worker(const Worker&) = delete;
+  Worker& operator=(const Worker&) = delete;
+
+  // Null with the reason in `text`.
+  static std::unique_ptr<Worker> Start(const PoolOptions& options, std::string& text) {
+    int ends[2] = {-1, -1};
+    if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
+      text = "socketpair failed, reason=" + std::generic_category().message(errno);
+      return nullptr;
+    }
+    daemon::UniqueFd ours(ends[0]);
+    daemon::UniqueFd theirs(ends[1]);
+    if (theirs.Get() == kWorkerSocket) {  // A duplicate onto itself would be closed by the exec.
+      theirs = daemon::UniqueFd(fcntl(theirs.Get(), F_DUPFD_CLOEXEC, kWorkerSocket + 1));
+    }
+    std::string words[] = {"kavocontentextractd", "--worker", std::to_string(options.memory)};
+    char* arguments[] = {words[0].data(), words[1].data(), words[2].data(), nullptr};
+    SpawnSetup setup;
+    pid_t pid = -1;
+    int error = setup.Prepare(theirs.Get());
+    error = error != 0 ? error : setup.Spawn(&pid, options.program, arguments);
+    if (error != 0) {
+      text = "a worker cannot be started, reason=" + std::generic_category().message(error);
+      return nullptr;
+    }
+    theirs.Reset();
+    auto worker = std::make_unique<Worker>(std::move(ours), pid);
+    std::string ready;
+    if (!kavo::local::ReceiveFrame(worker->socket_.Get(), 0, ready, nullptr,
+                                   Clock::now() + options.start_limit)) {
+      text = "a worker does not get ready, reason=" + std::generic_category().message(errno);
+      return nullptr;
+    }
+    return worker;
+  }
+
+  // One that ended, or says something unasked, is of no use.
+  bool IsIdle() const {
+    struct pollfd socket = {socket_.Get(), POLLIN, 0};
+    return poll(&socket, 1, 0) == 0;
+  }
+
+  Outcome Ask(const std::string& request, int file, kavo::local::Deadline deadline) {
+    ++served_;
+    std::string reply;
+    if (kavo::local::SendFrame(socket_.Get(), request, file, deadline) &&
+        kavo::local::ReceiveFrame(socket_.Get(), kMaxReplyBytes, reply, nullptr, deadline)) {
+      return {Outcome::kReply, std::move(reply)};
+    }
+    const int error = errno;
+    if (error == EMSGSIZE) {
+      Kill();
+      return {Outcome::kDied, "the worker's reply is too long"};
+    }
+    if (error == ETIMEDOUT) {
+      Kill();
+      return {Outcome::kDeadline, ""};
+    }
+    const std::optional<int> status = Kill();
+    if (status && WIFEXITED(*status) && WEXITSTATUS(*status) == kOutOfMemory) {
+      return {Outcome::kMemory, ""};
+    }
+    return {Outcome::kDied, status ? "the worker " + StatusText(*status) : "the worker is gone"};
+  }
+
+  size_t Served() const { return served_; }
+  bool IsAlive() const { return pid_ > 0; }
+
+ private:
+  // Ends it, if it has not done so itself. How it ended.
+  std::optional<int> Kill() {
+    if (pid_ <= 0) {
+      return std::nullopt;
+    }
+    int status = 0;
+    pid_t ended = 0;
+    // One that closed its socket is about to end, and how is worth knowing.
+    struct pollfd peer = {socket_.Get(), 0, 0};
+    if (poll(&peer, 1, 0) == 1 && (peer.revents & POLLHUP) != 0) {
+      const daemon::UniqueFd process(static_cast<int>(syscall(SYS_pidfd_open, pid_, 0)));
+      struct pollfd end = {process.Get(), POLLIN, 0};
+      poll(&end, 1, kEndMilliseconds);
+    }
+    kill(pid_, SIGKILL);
+    do {
+      ended = waitpid(pid_, &status, 0);
+    } while (ended < 0 && errno == EINTR);
+    pid_ = -1;
+    return ended > 0 ? std::optional(status) : std::nullopt;
+  }
+
+  daemon::UniqueFd socket_;
+  pid_t pid_;
+  size_t served_ = 0;
+};
+
+Pool::Pool(PoolOptions options) : options_(std::move(options)) {}
+
+Pool::~Pool() = default;
+
+std::unique_ptr<Pool::Worker> Pool::Take(Outcome& refusal) {
+  std::unique_lock<std::mutex> lock(mutex_);
+  if (!came_free_.wait_for(lock, options_.wait_limit,
+                           [this] { return taken_ < options_.workers; })) {
+    refusal = {Outcome::kNoWorker, "every worker is busy"};
+    return nullptr;
+  }
+  ++taken_;
+  while (!idle_.empty()) {
+    std::unique_ptr<Worker> worker = std::move(idle_.back());
+    idle_.pop_back();
+    if (worker->IsIdle()) {
+      return worker;
+    }
+  }
+  lock.unlock();
+  std::string reason;
+  std::unique_ptr<Worker> worker = Worker::Start(options_, reason);
+  if (worker == nullptr) {
+    LogLine(VEXLO_SOURCE, __LINE__, reason);
+    refusal = {Outcome::kNoWorker, reason};
+    lock.lock();
+    --taken_;
+    came_free_.notify_one();
+  }
+  return worker;
+}
+
+void Pool::GiveBack(std::unique_ptr<Worker> worker) {
+  const bool is_alive = worker->IsAlive();
+  if (!is_alive || worker->Served() >= options_.files_per_worker) {
+    worker.reset();
+  }
+  const std::lock_guard<std::mutex> lock(mutex_);
+  --taken_;
+  deaths_ += is_alive ? 0 : 1;
+  if (worker != nullptr) {
+    idle_.push_back(std::move(worker));
+  }
+  came_free_.notify_one();
+}
+
+Pool::Outcome Pool::Run(const std::string& request, int file) {
+  Outcome outcome = {Outcome::kNoWorker, ""};
+  std::unique_ptr<Worker> worker = Take(outcome);
+  if (worker != nullptr) {
+    outcome = worker->Ask(request, file, Clock::now() + options_.deadline);
+    GiveBack(std::move(worker));
+  }
+  return outcome;
+}
+
+size_t Pool::Workers() {
+  const std::lock_guard<std::mutex> lock(mutex_);
+  return idle_.size() + taken_;
+}
+
+size_t Pool::Deaths() {
+  const std::lock_guard<std::mutex> lock(mutex_);
+  return deaths_;
+}
+
+}  // namespace vexlo::extractd

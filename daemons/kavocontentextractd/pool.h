@@ -1,0 +1,82 @@
+// The processes that read files. What a damaged or malicious file does to a format's library it
+// does to one of them, within limits, and the daemon goes on with another.
+#ifndef DAEMONS_KAVOCONTENTEXTRACTD_POOL_H_
+#define DAEMONS_KAVOCONTENTEXTRACTD_POOL_H_
+
+#include <sys/types.h>
+
+#include <chrono>
+#include <condition_variable>
+#include <cstddef>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "daemons/common/unique_fd.h"
+
+namespace vexlo::extractd {
+
+// The descriptor on which a worker finds its socket.
+inline constexpr int kWorkerSocket = 3;
+// The exit status of a worker that had no memory left for a file.
+inline constexpr int kOutOfMemory = 3;
+// A worker's reply is refused when it is longer.
+inline constexpr size_t kMaxReplyBytes = size_t{8} << 20;
+
+struct PoolOptions {
+  std::string program;                           // Started as "PROGRAM --worker MIB".
+  size_t workers = 2;                            // At most; started when they are needed.
+  size_t memory = 512;                           // Address space of each in MiB; 0 for no limit.
+  std::chrono::milliseconds deadline{10000};     // For one file.
+  std::chrono::milliseconds start_limit{10000};  // Until a new worker is ready.
+  std::chrono::milliseconds wait_limit{4000};    // For one to come free.
+  // A worker that has read so many files is replaced: libraries leak, and heaps crumble.
+  size_t files_per_worker = 500;
+};
+
+// Any thread may call.
+class Pool {
+ public:
+  struct Outcome {
+    enum Kind {
+      kReply,
+      kNoWorker,  // None came free in time, or none could be started: no fault of the file.
+      kDeadline,  // These three cost a worker.
+      kMemory,
+      kDied,
+    };
+    Kind kind;
+    std::string text;  // The reply; otherwise what happened, for people.
+  };
+
+  explicit Pool(PoolOptions options);
+  ~Pool();
+  Pool(const Pool&) = delete;
+  Pool& operator=(const Pool&) = delete;
+
+  // Has a worker answer the request about the file.
+  Outcome Run(const std::string& request, int file);
+
+  // How many there are at present, and how many were lost while they read a file.
+  size_t Workers();
+  size_t Deaths();
+
+ private:
+  class Worker;
+
+  std::unique_ptr<Worker> Take(Outcome& refusal);
+  void GiveBack(std::unique_ptr<Worker> worker);
+
+  const PoolOptions options_;
+  std::mutex mutex_;
+  std::condition_variable came_free_;
+  // Guarded by mutex_:
+  std::vector<std::unique_ptr<Worker>> idle_;
+  size_t taken_ = 0;
+  size_t deaths_ = 0;
+};
+
+}  // namespace vexlo::extractd
+
+#endif  // DAEMONS_KAVOCONTENTEXTRACTD_POOL_H_

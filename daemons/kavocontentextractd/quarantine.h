@@ -1,0 +1,73 @@
+// The files that ended two processes that read them: they are left alone until they change.
+#ifndef DAEMONS_KAVOCONTENTEXTRACTD_QUARANTINE_H_
+#define DAEMONS_KAVOCONTENTEXTRACTD_QUARANTINE_H_
+
+#include <sys/stat.h>
+
+#include <cstddef>
+#include <cstdint>
+#include <list>
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <utility>
+
+#include "daemons/kavocontentextractd/fault.h"
+
+namespace vexlo::extractd {
+
+// A content without having read it: when any of these is another one, the file may read otherwise.
+struct ContentKey {
+  uint64_t device = 0;
+  uint64_t inode = 0;
+  uint64_t size = 0;
+  int64_t modified = 0;  // Nanoseconds since the epoch.
+  int64_t changed = 0;   // The same, of its attributes.
+
+  bool operator==(const ContentKey&) const = default;
+};
+ContentKey KeyOf(const struct stat& info);
+
+// Any thread may call. On disk: one JSON object, replaced whole at each new entry, so that it is
+// the old list or the new one after a crash. A list that cannot be written stays in memory, with a
+// line in the log; one that cannot be understood is renamed to "FILE.damaged" and begun anew.
+class Quarantine {
+ public:
+  // Reads the file, whose folder is made when it is missing; only its owner may look in there, as
+  // the entries name everybody's files. Of over `most` entries the oldest go.
+  explicit Quarantine(std::string file, size_t most = 10000);
+
+  // Why the content was put here. An entry of an older content of the same file is dropped.
+  std::optional<Fault> Find(const ContentKey& key);
+
+  // `path` is for those who read the file on disk.
+  void Add(const ContentKey& key, const Fault& fault, const std::string& path);
+
+  size_t Size();
+
+ private:
+  struct Entry {
+    ContentKey key;
+    std::string reason;
+    std::string message;
+    std::string path;
+    int64_t time = 0;  // Seconds since the epoch.
+  };
+  using FileId = std::pair<uint64_t, uint64_t>;  // Device and inode.
+
+  bool Load();
+  void Save();
+  void Put(Entry entry);
+
+  const std::string file_;
+  const size_t most_;
+  std::mutex mutex_;
+  // Guarded by mutex_:
+  std::list<Entry> entries_;  // The oldest first.
+  std::map<FileId, std::list<Entry>::iterator> by_file_;
+};
+
+}  // namespace vexlo::extractd
+
+#endif  // DAEMONS_KAVOCONTENTEXTRACTD_QUARANTINE_H_

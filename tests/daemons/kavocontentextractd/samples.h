@@ -1,0 +1,180 @@
+// Small files of many formats: made here where that can be read, else from tests/data.
+#ifndef DAEMONS_KAVOCONTENTEXTRACTD_SAMPLES_H_
+#define DAEMONS_KAVOCONTENTEXTRACTD_SAMPLES_H_
+
+#include <archive.h>
+#include <archive_entry.h>
+#include <gtest/gtest.h>
+
+#include <cstdio>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "support/temp_folder.h"
+
+using Parts = std::vector<std::pair<std::string, std::string>>;
+
+// A ZIP archive of the parts in their order; the first is not compressed, as formats want it that
+// tell their type there.
+inline std::string Zip(const Parts& parts) {
+  const TempFolder folder;
+  const std::string path = folder / "zip";
+  struct archive* const archive = archive_write_new();
+  archive_write_set_format_zip(archive);
+  EXPECT_EQ(archive_write_open_filename(archive, path.c_str()), ARCHIVE_OK);
+  for (const auto& [name, content] : parts) {
+    &name == &parts.front().first ? archive_write_zip_set_compression_store(archive)
+                                  : archive_write_zip_set_compression_deflate(archive);
+    struct archive_entry* const entry = archive_entry_new();
+    archive_entry_set_pathname(entry, name.c_str());
+    archive_entry_set_size(entry, static_cast<la_int64_t>(content.size()));
+    archive_entry_set_filetype(entry, AE_IFREG);
+    EXPECT_EQ(archive_write_header(archive, entry), ARCHIVE_OK);
+    EXPECT_EQ(archive_write_data(archive, content.data(), content.size()),
+              static_cast<la_ssize_t>(content.size()));
+    archive_entry_free(entry);
+  }
+  EXPECT_EQ(archive_write_free(archive), ARCHIVE_OK);
+  return ReadText(path);
+}
+
+inline std::string Docx(const std::string& body) {
+  return Zip(
+      {{"[Content_Types].xml", "<Types/>"},
+       {"docProps/core.xml",
+        "<cp:p xmlns:cp='c' xmlns:dc='d'><dc:title>Plan</dc:title><dc:creator>Ana</dc:creator>"
+        "<dc:created>2024-05-31T12:00:00Z</dc:created></cp:p>"},
+       {"word/document.xml", "<w:document xmlns:w='w'>" + body + "</w:document>"}});
+}
+
+inline std::string Odt(const std::string& body, const std::string& manifest = "<m/>") {
+  return Zip({{"mimetype", "application/vnd.oasis.opendocument.text"},
+              {"META-INF/manifest.xml", manifest},
+              {"content.xml", "<o:d xmlns:o='o' xmlns:t='t'><o:styles>hidden</o:styles><o:body>" +
+                                  body + "</o:body></o:d>"},
+              {"meta.xml",
+               "<o:m xmlns:o='o' xmlns:dc='d'><dc:title>Plan</dc:title>"
+               "<o:document-statistic o:page-count='3' o:word-count='99'/></o:m>"}});
+}
+
+inline std::string Pdf() {
+  const std::string text = "BT /F1 24 Tf 20 100 Td (The harbour plan) Tj ET";
+  const std::string objects[] = {
+      "<</Type/Catalog/Pages 2 0 R>>",
+      "<</Type/Pages/Kids[3 0 R]/Count 1>>",
+      "<</Type/Page/Parent 2 0 R/MediaBox[0 0 300 200]/Contents 4 0 R"
+      "/Resources<</Font<</F1 5 0 R>>>>>>",
+      "<</Length " + std::to_string(text.size()) + ">>\nstream\n" + text + "\nendstream",
+      "<</Type/Font/Subtype/Type1/BaseFont/Helvetica>>",
+      "<</Title(Plan)/Author(Ana)/CreationDate(D:20240531120000Z)>>"};
+  std::string pdf = "%PDF-1.4\n";
+  std::string table = "xref\n0 7\n0000000000 65535 f \n";
+  int number = 0;
+  for (const std::string& object : objects) {
+    char line[32];
+    snprintf(line, sizeof(line), "%010zu 00000 n \n", pdf.size());
+    table += line;
+    pdf.append(std::to_string(++number)).append(" 0 obj\n").append(object).append("\nendobj\n");
+  }
+  const size_t start = pdf.size();
+  return pdf + table + "trailer\n<</Size 7/Root 1 0 R/Info 6 0 R>>\nstartxref\n" +
+         std::to_string(start) + "\n%%EOF\n";
+}
+
+inline std::string Data(const std::string& name) { return ReadText(TEST_DATA "/" + name); }
+
+struct Sample {
+  std::string name;  // Its extension tells little: types are found in the content.
+  std::string bytes;
+  std::string fields;  // JSON: some of the fields that it has; null for one that it has not.
+};
+
+inline std::vector<Sample> Samples() {
+  const std::string tags =
+      R"("KAVOMDTitle":"Harbour","KAVOMDAuthors":["Ana"],"KAVOMDAlbum":"Sea",)"
+      R"("KAVOMDMusicalGenre":"Folk","KAVOMDAudioTrackNumber":3,"KAVOMDRecordingYear":2019,)"
+      R"("KAVOMDAudioSampleRate":8000,"KAVOMDMediaTypes":["Sound"],"KAVOMDContentError":null)";
+  const std::string film =
+      R"({"KAVOMDTitle":"Regatta","KAVOMDPixelWidth":64,"KAVOMDPixelHeight":48,)"
+      R"("KAVOMDMediaTypes":["Video","Sound"],"KAVOMDContentError":null,)";
+  return {
+      {"docx",
+       Docx("<w:p><w:r><w:t>The har</w:t></w:r><w:t>bour</w:t></w:p><w:p><w:t>a</w:t><w:tab/>"
+            "<w:t>b</w:t><w:br/><w:t>c &amp; d</w:t></w:p><w:instrText>PAGE</w:instrText>"),
+       R"({"KAVOMDTextContent":"The harbour\na\tb\nc & d\n","KAVOMDTitle":"Plan","KAVOMDAuthors":["Ana"],)"
+       R"("KAVOMDContentCreationDate":1717156800,"KAVOMDContentError":null,"KAVOMDContentType":)"
+       R"("application/vnd.openxmlformats-officedocument.wordprocessingml.document"})"},
+      {"xlsx",
+       Zip({{"[Content_Types].xml", "<Types/>"},
+            {"xl/workbook.xml", "<workbook/>"},
+            {"xl/sharedStrings.xml", "<sst><si><t>harbour</t></si><si><t>sea</t></si></sst>"},
+            {"xl/worksheets/sheet1.xml",
+             "<s><row><c t='s'><v>0</v></c><c><v>4711</v></c><c "
+             "t='str'><v>sum</v></c></row></s>"}}),
+       R"({"KAVOMDTextContent":"harbour\nsea\n4711 sum \n","KAVOMDContentError":null})"},
+      {"pptx",
+       Zip({{"[Content_Types].xml", "<Types/>"},
+            {"ppt/presentation.xml", "<p/>"},
+            {"ppt/slides/slide10.xml", "<a:s xmlns:a='a'><a:p><a:t>ten</a:t></a:p></a:s>"},
+            {"ppt/slides/_rels/slide10.xml.rels", "<r><t>no</t></r>"},
+            {"ppt/notesSlides/notesSlide1.xml",
+             "<a:s xmlns:a='a'><a:p><a:t>note</a:t></a:p></a:s>"}}),
+       R"({"KAVOMDTextContent":"ten\nnote\n","KAVOMDContentError":null})"},
+      {"odt", Odt("<t:h>One<t:s/>two</t:h><t:p>three<t:line-break/>four</t:p>"),
+       R"({"KAVOMDTextContent":"One two\nthree\nfour\n","KAVOMDTitle":"Plan","KAVOMDPageCount":3,)"
+       R"("KAVOMDWordCount":99,"KAVOMDContentError":null})"},
+      {"locked odt", Odt("", "<m><encryption-data/></m>"),
+       R"({"KAVOMDContentError":"encrypted: the document wants a password"})"},
+      {"epub",
+       Zip({{"mimetype", "application/epub+zip"},
+            {"O/c.opf",
+             "<p xmlns:dc='d'><dc:title>Novel</dc:title><dc:creator>Ana</dc:creator></p>"},
+            {"O/1.xhtml",
+             "<html><head><style>x</style></head><body><p>a&nbsp;b</p><p>c</p></body></html>"}}),
+       R"({"KAVOMDTextContent":"a\u00a0b\nc\n","KAVOMDTitle":"Novel","KAVOMDAuthors":["Ana"],)"
+       R"("KAVOMDContentError":null})"},
+      {"zip", Zip({{"a.txt", "text"}, {"content.xml", "<broken"}}),
+       R"({"KAVOMDContentType":"application/zip","KAVOMDTextContent":null,"KAVOMDContentError":null})"},
+      {"entities.docx",
+       Zip({{"[Content_Types].xml", "<Types/>"},
+            {"word/document.xml", "<!DOCTYPE w [<!ENTITY a 'aaa'>]><w><t>&a;</t></w>"}}),
+       R"({"KAVOMDContentError":"damaged: the XML declares entities","KAVOMDTextContent":null})"},
+      {"pdf", Pdf(),
+       R"({"KAVOMDTextContent":"The harbour plan\n","KAVOMDTitle":"Plan","KAVOMDAuthors":"Ana",)"
+       R"("KAVOMDNumberOfPages":1,"KAVOMDPageWidth":300.0,"KAVOMDContentCreationDate":1717156800,)"
+       R"("KAVOMDContentError":null})"},
+      {"locked pdf", Data("locked.pdf"),
+       R"({"KAVOMDContentError":"encrypted: the PDF wants a password","KAVOMDTextContent":null})"},
+      {"html",
+       "<html><head><title>A\n page</title><meta NAME='Author' content='Ana'><style>p{}</style>"
+       "<script>var x = '<p>';</script></head><body><p>The <b>har</b>bour<p>x<table><tr><td>a<td>b",
+       R"({"KAVOMDTextContent":"A page\nThe harbour\nx\na b \n","KAVOMDTitle":"A page",)"
+       R"("KAVOMDAuthors":["Ana"],"KAVOMDContentError":null})"},
+      {"Latin-2 html", "<html><head><meta charset=iso-8859-2></head><body>\xB1\xEA</body></html>",
+       R"({"KAVOMDTextContent":"\u0105\u0119\n"})"},
+      {"rtf",
+       R"({\rtf1\ansi\ansicpg1251{\fonttbl{\f0 Arial;}}{\info{\title Plan}{\author Ana}})"
+       R"({\*\generator no;}The {\b har}bour\'cf \u8364?5 \u55357?\u56832?\par{\pict 01ab}\{x\}\tab y})",
+       R"({"KAVOMDTextContent":"The harbour\u041f \u20ac5 \ud83d\ude00\n{x}\ty","KAVOMDTitle":"Plan",)"
+       R"("KAVOMDAuthors":"Ana","KAVOMDContentError":null})"},
+      {"cut rtf", R"({\rtf1 some {\b text)",
+       R"({"KAVOMDTextContent":"some text","KAVOMDContentError":"damaged: the RTF ends within a group"})"},
+      {"photo", Data("photo.jpg"),
+       R"({"KAVOMDPixelWidth":64,"KAVOMDPixelHeight":48,"KAVOMDAcquisitionMake":"Canon",)"
+       R"("KAVOMDAcquisitionModel":"EOS","KAVOMDContentCreationDate":1717156800,"KAVOMDISOSpeed":200,)"
+       R"("KAVOMDDescription":"Harbour bridge","KAVOMDKeywords":["bridge","sea"],)"
+       R"("KAVOMDExposureTimeString":"1/125 s","KAVOMDStarRating":"4","KAVOMDTitle":"Br\u00fccke",)"
+       R"("KAVOMDLatitude":-33.86,"KAVOMDLongitude":151.2,"KAVOMDContentError":null})"},
+      {"mp3", Data("sound.mp3"), "{\"KAVOMDComment\":\"quiet\"," + tags + "}"},
+      {"flac", Data("sound.flac"), "{\"KAVOMDDurationSecond\":0.2," + tags + "}"},
+      {"ogg", Data("sound.ogg"), "{\"KAVOMDDurationSecond\":0.2," + tags + "}"},
+      {"m4a", Data("sound.m4a"), "{\"KAVOMDComment\":\"quiet\"," + tags + "}"},
+      {"mp4", Data("film.mp4"),
+       film + R"("KAVOMDCodecs":["MPEG-4 Visual","AAC"],"KAVOMDDurationSecond":1.0,)"
+              R"("KAVOMDContentCreationDate":1717156800})"},
+      {"mkv", Data("film.mkv"), film + R"("KAVOMDCodecs":["MPEG-4 Visual","Vorbis"]})"},
+  };
+}
+
+#endif  // DAEMONS_KAVOCONTENTEXTRACTD_SAMPLES_H_

@@ -1,0 +1,98 @@
+#include "kavo/local/frames.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <thread>
+
+#include "support/raw_client.h"
+#include "support/temp_folder.h"
+
+namespace kavo::local {
+namespace {
+
+using std::chrono::milliseconds;
+
+Deadline In(int ms) { return std::chrono::steady_clock::now() + milliseconds(ms); }
+
+std::pair<RawClient, RawClient> Pair() {
+  int ends[2] = {};
+  EXPECT_EQ(socketpair(AF_UNIX, SOCK_STREAM, 0, ends), 0);
+  return {RawClient(ends[0]), RawClient(ends[1])};
+}
+
+auto OpenFiles() { return std::distance(std::filesystem::directory_iterator("/proc/self/fd"), {}); }
+
+TEST(Frames, ComeWholeOrWithTheReason) {
+  const struct {
+    const char* name;
+    std::string bytes;
+    bool is_closed;
+    std::string body;
+    int error;
+  } rows[] = {
+      {"Message", Frame("abc"), false, "abc", 0},
+      {"Empty", Frame(""), false, "", 0},
+      {"AtTheLimit", Frame(std::string(100, 'x')), true, std::string(100, 'x'), 0},
+      {"OverTheLimit", Frame(std::string(101, 'x')), false, "", EMSGSIZE},
+      {"ClosedAtOnce", "", true, "", ECONNRESET},
+      {"ClosedInTheMiddle", Frame("abc").substr(0, 10), true, "", ECONNRESET},
+      {"SilentInTheMiddle", Frame("abc").substr(0, 10), false, "", ETIMEDOUT},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.name);
+    const auto [here, there] = Pair();
+    EXPECT_TRUE(there.Send(row.bytes));
+    if (row.is_closed) {
+      shutdown(there.fd, SHUT_WR);
+    }
+    std::string body = "stale";
+    EXPECT_EQ(ReceiveFrame(here.fd, 100, body, nullptr, In(50)), row.error == 0);
+    EXPECT_TRUE(row.error == 0 ? body == row.body : errno == row.error) << errno;
+  }
+}
+
+TEST(Frames, CarryAFile) {
+  const TempFolder folder;
+  WriteText(folder / "file", "content");
+  const RawClient file(open((folder / "file").c_str(), O_RDONLY));
+  const auto before = OpenFiles();
+  {
+    const auto [here, there] = Pair();
+    const std::string long_body(1 << 20, 'x');
+    std::string body;
+    int received = -1;
+    std::thread sender([&] { EXPECT_TRUE(SendFrame(there.fd, long_body, file.fd, In(30000))); });
+    EXPECT_TRUE(ReceiveFrame(here.fd, 1 << 20, body, &received, In(30000)));
+    sender.join();
+    EXPECT_TRUE(body == long_body);
+    struct stat sent {};
+    struct stat got {};
+    EXPECT_TRUE(fstat(file.fd, &sent) == 0 && fstat(received, &got) == 0);
+    EXPECT_EQ(sent.st_ino, got.st_ino);
+    EXPECT_EQ(fcntl(received, F_GETFD), FD_CLOEXEC);
+    close(received);
+
+    // One that nobody wants, and one of a message that fails.
+    EXPECT_TRUE(SendFrame(there.fd, "a", file.fd, In(30000)));
+    EXPECT_TRUE(ReceiveFrame(here.fd, 1, body, nullptr, In(30000)));
+    EXPECT_TRUE(SendFrame(there.fd, "ab", file.fd, In(30000)));
+    EXPECT_FALSE(ReceiveFrame(here.fd, 1, body, &received, In(30000)));
+  }
+  EXPECT_EQ(OpenFiles(), before);
+}
+
+TEST(Frames, GiveUpOnAPeerThatDoesNotRead) {
+  const auto [here, there] = Pair();
+  EXPECT_FALSE(SendFrame(there.fd, std::string(16 << 20, 'x'), -1, In(50)));
+  EXPECT_EQ(errno, ETIMEDOUT);
+  EXPECT_LT(ConnectWithin("", In(50)), 0);
+  EXPECT_EQ(errno, ENOENT);
+  EXPECT_LT(ConnectWithin(std::string(200, 'x'), In(50)), 0);
+  EXPECT_EQ(errno, ENAMETOOLONG);
+}
+
+}  // namespace
+}  // namespace kavo::local

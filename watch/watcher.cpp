@@ -44,8 +44,7 @@ bool IsAmong(const std::vector<std::string>& names, std::string_view name) {
   return std::find(names.begin(), names.end(), name) != names.end();
 }
 
-// True when the path is absolute and each component is a name that is not ignored.
-bool IsNormalised(const std::string& path, const std::vector<std::string>& ignored_names) {
+bool IsNormalised(const std::string& path) {
   if (path == "/") {
     return true;
   }
@@ -55,7 +54,7 @@ bool IsNormalised(const std::string& path, const std::vector<std::string>& ignor
   for (size_t at = 1; at <= path.size();) {
     const size_t slash = std::min(path.find('/', at), path.size());
     const std::string_view name = std::string_view(path).substr(at, slash - at);
-    if (name.empty() || name == "." || name == ".." || IsAmong(ignored_names, name)) {
+    if (name.empty() || name == "." || name == "..") {
       return false;
     }
     at = slash + 1;
@@ -150,7 +149,7 @@ Watcher::Watcher(const std::vector<std::string>& roots, WatchOptions options, Si
   }
   for (Root& root : roots_) {
     root.covered = std::any_of(roots_.begin(), roots_.end(),
-                               [&](const Root& other) { return IsBelow(root.path, other.path); });
+                               [&](const Root& other) { return Covers(other.path, root.path); });
     if (!root.covered) {
       Walk({{kNoFolder, root.path, true}}, {});
       root.folder = tree_.Find(kNoFolder, root.path);
@@ -715,11 +714,22 @@ void Watcher::RootGone(Root& root) {
 }
 
 void Watcher::CheckPath(const std::string& path) const {
-  VEXLO_CHECK(!IsNormalised(path, options_.ignored_names), ERR_BAD_PARAMETER,
-              "not an absolute, normalised path outside what is ignored, path=" + path);
+  VEXLO_CHECK(!IsNormalised(path), ERR_BAD_PARAMETER,
+              "not an absolute, normalised path, path=" + path);
   const Fd fd = options_.takes_missing_roots ? Fd() : OpenDirectory(path);
   VEXLO_CHECK(!fd && !options_.takes_missing_roots, ERR_SYSTEM,
               "cannot be watched as a folder, path=" + path + ", reason=" + strerror(errno));
+}
+
+// Whether a walk from the root comes to the path.
+bool Watcher::Covers(const std::string& root, const std::string& path) const {
+  if (!IsBelow(path, root)) {
+    return false;
+  }
+  const std::string way = path.substr(root.size() == 1 ? 0 : root.size()) + "/";
+  return std::none_of(
+      options_.ignored_names.begin(), options_.ignored_names.end(),
+      [&](const std::string& name) { return way.find("/" + name + "/") != std::string::npos; });
 }
 
 // Neither above nor below a root, nor one itself.

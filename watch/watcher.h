@@ -32,7 +32,8 @@ struct WatchOptions {
   std::chrono::milliseconds move_wait{50};
   // Full paths that are never reported: the files that the caller writes the events into.
   std::vector<std::string> ignored = {};
-  // Names: what is called so, at any depth, is neither watched nor reported.
+  // Names: what is called so, at any depth below a root, is neither watched nor reported. A root
+  // itself may lie in such a thing.
   std::vector<std::string> ignored_names = {"@eaDir"};
   // Take a root that does not stand at the start for one that is gone, instead of throwing.
   bool takes_missing_roots = false;
@@ -78,9 +79,8 @@ class Watcher {
   // Watches what is below `roots`, absolute paths without "." or ".." and without a slash at the
   // end (other than "/"). What is there already is not reported. A root below another one is
   // reported by it. Blocks until all folders are read. Throws Error 120 for a root that is no such
-  // path or lies in something ignored, 502 for one that cannot be opened as a folder (a symbolic
-  // link is none) unless `takes_missing_roots`, 502 when the kernel has no more inotify instances
-  // or descriptors.
+  // path, 502 for one that cannot be opened as a folder (a symbolic link is none) unless
+  // `takes_missing_roots`, 502 when the kernel has no more inotify instances or descriptors.
   Watcher(const std::vector<std::string>& roots, WatchOptions options, Sink sink, TimePoint now);
   ~Watcher() = default;
   Watcher(const Watcher&) = delete;
@@ -165,6 +165,7 @@ class Watcher {
   void CheckMounts();
   void CheckPath(const std::string& path) const;
   bool IsApart(const std::string& path) const;
+  bool Covers(const std::string& root, const std::string& path) const;
   bool IsAtRest() const;
   void Rescan();
   void LogChangedState();

@@ -27,6 +27,7 @@ using fileindex::GetFileTypeName;
 
 constexpr Json::ArrayIndex kMostDeletes = 500;
 constexpr size_t kMostTaken = 10000;
+constexpr size_t kMostTouched = 100000;
 constexpr unsigned kMostLogged = 10;      // Of one code, in a cycle.
 constexpr char kByItself[] = "settings";  // The cause of a crawl that no operation asked for.
 
@@ -101,6 +102,14 @@ void Cycle::Carry(const fileindex::OP& op, const std::string& path) {
   if (!scope_.IsInShare(path)) {
     throw Error(ERR_BAD_PARAMETER, "the path lies outside of the share");
   }
+  CarryKnown(op, path);
+  NoteTouched(path);
+  if (op.op == fileindex::OP_RENAME) {
+    NoteTouched(op.path_old);
+  }
+}
+
+void Cycle::CarryKnown(const fileindex::OP& op, const std::string& path) {
   switch (op.op) {
     case fileindex::OP_DELETE:
       Delete(path);
@@ -184,37 +193,50 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
   facts.old_inode = InodeOf(StampOfPath(path_old, /*content=*/false));
   facts.new_inode = InodeOf(now);
   const RenameStep step = PlanRename(facts);
+  // What was handed over before this may be of what came after it: see touched_.
+  const bool is_mixed = WasTouched(path) || WasTouched(path_old);
   ForgetTaken(path);
   ForgetTaken(path_old);
   if (step == RenameStep::kMove) {
     has_sent_ = true;
     elastic::IndexRename(share_, path, path_old);
-    FinishMove(path, path_old, document->stamp, now);
+    if (now) {
+      FinishMove(path, document->stamp, *now);
+      // What lies below keeps what it was indexed with, unless other settings hold now.
+      if (is_mixed || !scope_.HaveSameSettings(path, path_old)) {
+        ReconcileMixed(path);
+      }
+    }
   } else if (step == RenameStep::kReconcile) {
-    Reconcile(path, Json::Value());
+    ReconcileMixed(path);
   } else {
     Delete(path);
   }
-  Delete(path_old);
+  if (facts.old_inode) {
+    ReconcileMixed(path_old);
+  } else {
+    Delete(path_old);
+  }
 }
 
 // The renamed object's own document: its dates are new, and its type may be.
-void Cycle::FinishMove(const std::string& path, const std::string& path_old,
-                       const std::optional<Stamp>& before, const std::optional<Stamp>& now) {
-  if (!now) {
+void Cycle::FinishMove(const std::string& path, const std::optional<Stamp>& before,
+                       const Stamp& now) {
+  if (!before || before->content != now.content || !HasSameContent(*before, now)) {
+    Submit(path);
     return;
   }
-  if (!before || before->content != now->content || !HasSameContent(*before, *now)) {
-    Submit(path);
-  } else {
-    Json::Value requests(Json::arrayValue);
-    requests.append(MakeAttributes(id_, path, *now));
-    SendList(std::move(requests));
-  }
-  // What lies below keeps what it was indexed with, unless another folder's settings hold now.
-  if (!scope_.HaveSameSettings(path, path_old)) {
-    Reconcile(path, Json::Value());
-  }
+  Json::Value requests(Json::arrayValue);
+  requests.append(MakeAttributes(id_, path, now));
+  SendList(std::move(requests));
+}
+
+// Where documents may stand at each other's paths. Files that were made in the same tick have the
+// same dates.
+void Cycle::ReconcileMixed(const std::string& path) {
+  inodes_count_ = true;
+  Reconcile(path, Json::Value());
+  inodes_count_ = false;
 }
 
 void Cycle::ReconcileShare() { Reconcile(scope_.SharePath(), Json::Value(), kByItself); }
@@ -285,8 +307,9 @@ void Cycle::Compare(const DiskEntry& entry, const IndexedPath* indexed, const Js
       IsTrue(types, "basic") ||
       (!S_ISDIR(entry.info.st_mode) &&
        IsTrue(types, std::string(GetFileTypeName(GetFileTypeByFullPath(entry.path))).c_str()));
-  if (is_asked_for || indexed == nullptr ||
-      !IsCurrent(indexed->stamp, StampOf(entry.info, content, timespec{}))) {
+  const Stamp now = StampOf(entry.info, content, timespec{});
+  if (is_asked_for || indexed == nullptr || !IsCurrent(indexed->stamp, now) ||
+      (inodes_count_ && indexed->stamp->inode != now.inode)) {
     Submit(entry.path);
   }
 }
@@ -347,6 +370,27 @@ void Cycle::ForgetTaken(const std::string& path) {
   taken_.erase(path);
   // What lies below stands together, from "/" on and up to the byte behind it.
   taken_.erase(taken_.lower_bound(path + "/"), taken_.lower_bound(path + "0"));
+}
+
+void Cycle::NoteTouched(const std::string& path) {
+  if (touched_.size() < kMostTouched) {
+    touched_.insert(path);
+  } else {
+    touched_too_much_ = true;
+  }
+}
+
+// Whether an operation so far was about the path, what lies below it, or a folder above it.
+bool Cycle::WasTouched(const std::string& path) const {
+  if (touched_too_much_ || touched_.lower_bound(path + "/") != touched_.lower_bound(path + "0")) {
+    return true;
+  }
+  for (std::string at = path; !at.empty(); at.resize(at.rfind('/'))) {
+    if (touched_.contains(at)) {
+      return true;
+    }
+  }
+  return false;
 }
 
 void Cycle::FlushDeletes() {

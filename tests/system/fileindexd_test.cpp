@@ -611,9 +611,11 @@ class RandomDisk {
         }
         [[fallthrough]];
       case 1:
-      case 2:
+      case 2: {
+        const bool is_new = !fs::exists(path);
         WriteText(path, "word" + to_string(++count_));
-        return Line(EV_CLOSE_WRITE, path);
+        return (is_new ? Line(EV_CREATE, path) + "\n" : "") + Line(EV_CLOSE_WRITE, path);
+      }
       case 3:
         if (fs::exists(path) && path != other) {
           fs::rename(path, other);

@@ -1,6 +1,7 @@
 #include "daemons/fileindexd/cycle.h"
 
 #include <algorithm>
+#include <new>
 #include <set>
 #include <system_error>
 #include <utility>
@@ -82,7 +83,12 @@ void Cycle::Handle(const fileindex::OP& op) {
     if (OfOperation(error.GetErrorCode()) != Consequence::kGoOn) {
       throw;
     }
+    if (error.GetErrorCode() == ERR_SYSTEM) {
+      scope_.CheckShare();  // The fault may be the share's: then the operation waits for it.
+    }
     Count(error.GetErrorCode(), error.what(), path);
+  } catch (const std::bad_alloc&) {
+    throw;
   } catch (const std::exception& error) {
     Count(ERR_INTERNAL, error.what(), path);
   }
@@ -179,7 +185,9 @@ void Cycle::UpdateAttributes(const std::string& path) {
 }
 
 void Cycle::Rename(const std::string& path, const std::string& path_old) {
-  if (!scope_.IsInShare(path_old)) {
+  // Neither happens on a disk. The library would move documents into a folder that it moves for
+  // ever.
+  if (!scope_.IsInShare(path_old) || IsSameOrBelow(path, path_old)) {
     Reconcile(path, Json::Value());
     return;
   }
@@ -236,16 +244,22 @@ void Cycle::FinishMove(const std::string& path, const std::optional<Stamp>& befo
 void Cycle::ReconcileMixed(const std::string& path) {
   inodes_count_ = true;
   Reconcile(path, Json::Value());
-  inodes_count_ = false;
 }
 
 void Cycle::ReconcileShare() { Reconcile(scope_.SharePath(), Json::Value(), kByItself); }
 
 void Cycle::ReconcileNewFolders() {
-  const std::set<std::string> crawled = state_.crawled;
   const std::vector<std::string>& folders = scope_.Folders();
+  const auto is_folder = [&](const std::string& path) {
+    return std::binary_search(folders.begin(), folders.end(), path);
+  };
+  if (state_.crawl && state_.crawl->cause == kByItself && !is_folder(state_.crawl->root)) {
+    state_.crawled.insert(state_.crawl->root);  // As far as it came.
+    state_.crawl.reset();
+  }
+  const std::set<std::string> crawled = state_.crawled;
   for (const std::string& folder : crawled) {
-    if (!std::binary_search(folders.begin(), folders.end(), folder)) {
+    if (!is_folder(folder)) {
       Reconcile(folder, Json::Value(), kByItself);
       state_.crawled.erase(folder);
       state_changed_ = true;
@@ -295,6 +309,7 @@ void Cycle::Reconcile(const std::string& root, const Json::Value& types, const c
               std::generic_category().message(result.last_error),
           root);
   }
+  inodes_count_ = false;
   state_.crawl.reset();
   MarkCrawled(root);
   stats_.SetState(WorkerState::kProcessing);

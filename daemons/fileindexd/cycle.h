@@ -92,7 +92,7 @@ class Cycle {
   // so what happened at a path after a rename may be handed over before it.
   std::set<std::string> touched_;
   bool touched_too_much_ = false;
-  bool inodes_count_ = false;  // A document of another inode is another file's.
+  bool inodes_count_ = false;  // In this crawl a document of another inode is another file's.
   std::map<int, unsigned> failures_;
 };
 

@@ -67,6 +67,7 @@ std::vector<Command> IndexCommands();
 std::vector<Command> QueueCommands();
 std::vector<Command> SearchCommands();
 std::vector<Command> ShareCommands();
+std::vector<Command> StatsCommands();
 std::vector<Command> WatchCommands();
 
 // Finds the command, reads its arguments and runs it. `words` are the program's arguments without

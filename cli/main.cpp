@@ -11,7 +11,8 @@ int main(int argc, char** argv) {
   std::vector<Command> commands;
   for (auto* const family :
        {vexlo::cli::WatchCommands, vexlo::cli::QueueCommands, vexlo::cli::ExplainCommands,
-        vexlo::cli::ShareCommands, vexlo::cli::IndexCommands, vexlo::cli::SearchCommands}) {
+        vexlo::cli::ShareCommands, vexlo::cli::IndexCommands, vexlo::cli::SearchCommands,
+        vexlo::cli::StatsCommands}) {
     const std::vector<Command> more = family();
     commands.insert(commands.end(), more.begin(), more.end());
   }

@@ -51,6 +51,10 @@ const CliCase kCases[] = {
     {"ExplainYes", "explain vol/photo/a.JPG", 0, "*type: photo\nshare: photo (", ""},
     {"ExplainNo", "explain --json vol/photo/.git", 1, "*{\"can_be_indexed\":false,", ""},
     {"ExplainNoShare", "explain vol", 1, "*share: none holds the path\n", ""},
+    {"ExtractText", "extract vol/photo/note.txt", 0, "*KAVOMDTextContent: The harbour", ""},
+    {"ExtractNoDaemon", "extract --json vol/photo/note.pdf", 1,
+     "*\"KAVOMDContentError\":\"unavailable: ", ""},
+    {"ExtractMissing", "extract none vol/photo/note.txt", 3, "*The harbour", "none: No such file"},
     {"RemoveShare", "share remove films", 0, "*removed: films", ""},
     {"RemoveShareTwice", "share remove films", 3, "", "films"},
 };
@@ -160,6 +164,8 @@ TEST_F(Cli, AnswersEveryCommandLine) {
   std::filesystem::create_directories(files_ / "films");
   std::filesystem::create_symlink("films", files_ / "link");
   WriteText(files_ / "vol/photo/a.JPG", "");
+  WriteText(files_ / "vol/photo/note.txt", "The harbour\nis closed");
+  WriteText(files_ / "vol/photo/note.pdf", "%PDF");
   for (const CliCase& row : kCases) {
     Check(row);
   }

@@ -139,6 +139,29 @@ TEST_F(ExtractdTest, AddsTheContentToTheAttributes) {
   EXPECT_TRUE(ErrorOf(path).starts_with("unavailable: "));
 }
 
+TEST_F(ExtractdTest, AnswersManyAtOnceAndReplacesWorkersThatHaveReadMuch) {
+  Start("--workers 2 ");
+  constexpr int kThreads = 8;
+  constexpr int kFiles = 150;  // Of each thread: more than two workers read in their lives.
+  std::vector<std::thread> threads;
+  threads.reserve(kThreads);
+  for (int i = 0; i < kThreads; ++i) {
+    threads.emplace_back([this, i] {
+      const std::string text = "thread " + std::to_string(i);
+      const std::string path = Write(std::to_string(i) + ".html", "<p>" + text);
+      for (int j = 0; j < kFiles; ++j) {
+        EXPECT_EQ(Parse(path)["KAVOMDTextContent"], text + "\n");
+      }
+    });
+  }
+  for (std::thread& thread : threads) {
+    thread.join();
+  }
+  EXPECT_EQ(Stats()["files"], kThreads * kFiles);
+  EXPECT_EQ(Stats()["deaths"], 0);
+  EXPECT_LE(Stats()["workers"].asInt(), 2);
+}
+
 TEST_F(ExtractdTest, SurvivesWhatIsDamaged) {
   Start("--deadline 5 ");
   unsigned seed = 1;

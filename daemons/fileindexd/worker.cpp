@@ -117,6 +117,7 @@ Json::Value Worker::Describe() const {
   Json::Value value = stats_.ToJson();
   value["share"] = share_;
   const uint64_t bytes = BytesOf(queue_path) + BytesOf(queue_path + ".tmp");
+  value["queue"] = queue_path;
   value["queue_bytes"] = static_cast<Json::UInt64>(bytes);
   value["queue_lines"] = static_cast<Json::UInt64>((bytes + kUsualLineBytes - 1) / kUsualLineBytes);
   return value;

@@ -167,7 +167,9 @@ TEST_F(EvnotifydTest, DeedsAndTheirLines) {
        "rename s/a b s/\n\", create s/\xE9, delete s/\xE9"},
       {"ExtraFolder", "> f", "mkdir @eaDir; > @eaDir/f; mv f @eaDir", "delete s/f"},
   };
-  for (const auto& [name, before, deeds, want] : cases) {
+  for (const auto& row : cases) {
+    const auto& [title, before, deeds, want] = row;
+    const std::string name = title;
     SCOPED_TRACE(name);
     std::filesystem::remove_all(kRoot / "out");
     Do(kRoot.MakeFolder("out").substr(kRoot.Path().size() + 1), "");

@@ -203,6 +203,7 @@ TEST_F(FeederTest, ManyThreadsMayChangeAQueue) {
   QueueWatch watch(registered, {});
   {
     std::vector<std::jthread> threads;
+    threads.reserve(4);
     for (int thread = 0; thread < 4; ++thread) {
       threads.emplace_back([&] {
         for (int i = 0; i < 20; ++i) {

@@ -72,6 +72,7 @@ std::vector<Command> QueueCommands();
 std::vector<Command> SearchCommands();
 std::vector<Command> ShareCommands();
 std::vector<Command> StatusCommands();
+std::vector<Command> UpCommands();
 std::vector<Command> WatchCommands();
 
 // Finds the command, reads its arguments and runs it. `words` are the program's arguments without

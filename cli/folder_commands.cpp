@@ -1,7 +1,5 @@
 // "fileindex folder ...": the indexed folders.
 #include <json/value.h>
-#include <pwd.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <charconv>
@@ -11,6 +9,7 @@
 
 #include "cli/command.h"
 #include "cli/engine.h"
+#include "cli/folder_change.h"
 #include "cli/folder_paths.h"
 #include "cli/service.h"
 #include "cli/shares.h"
@@ -20,7 +19,6 @@
 #include "common/json.h"
 #include "common/lock.h"
 #include "common/sdk/share.h"
-#include "common/string.h"
 #include "fileindex/elastic_control/share_index.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr/folder_ops.h"
@@ -28,7 +26,6 @@
 #include "fileindex/status_mgr.h"
 #include "fileindex/util/share_path.h"
 #include "kavo/local/monitor_queues.h"
-#include "kavo/local/shares.h"
 #include "kavo/monitor_queue.h"
 
 namespace vexlo::cli {
@@ -36,84 +33,7 @@ namespace {
 
 using fileindex::FolderMgr;
 
-// The engine's answers to the making of an index that is there, and the deleting of one that is
-// not.
-constexpr int kIndexExists = 2003;
-constexpr int kNoIndex = 2002;
-
-constexpr const char* kTypes[] = {"document", "audio", "video", "photo"};
-
 const Option kJson = {"--json", nullptr, "the library's own JSON"};
-
-[[noreturn]] void Explain(const Error& error) {
-  const std::string reason = error.what();
-  if (error.GetErrorCode() == ERR_SHARE_NOT_FOUND && FolderMgr().IsShareIndexed(reason)) {
-    CheckSharesFile();
-    throw Failure("the share '" + ForTerminal(reason) +
-                  "' of an indexed folder is gone; 'fileindex folder prune' forgets its folders");
-  }
-  ExplainEngineError(error);
-  switch (static_cast<int>(error.GetErrorCode())) {
-    case ERR_FOLDER_DUPLICATED:
-      throw Failure("the folder is indexed already; 'fileindex folder set' changes how");
-    case ERR_FOLDER_NOT_FOUND:
-      throw Failure("'" + ForTerminal(reason) +
-                    "' is no indexed folder; 'fileindex folder list' lists them");
-    case ERR_PATH_CANNOT_INDEX:
-      throw Failure(ForTerminal(reason.substr(reason.find('/'))) +
-                    " cannot be indexed; 'fileindex explain' with its full path says why");
-    case ERR_LOAD:
-      throw Failure(ForTerminal(reason) + "; 'fileindex config check' says more");
-    case ERR_LOCK:
-      throw Failure("another command is changing the folders at present (" + ForTerminal(reason) +
-                    ")");
-    default:
-      throw error;
-  }
-}
-
-void With(const std::function<void()>& work) {
-  try {
-    work();
-  } catch (const Error& error) {
-    Explain(error);
-  }
-}
-
-// Runs an operation on the folders of `paths`. Two things that the library takes for failures are
-// made good: an index that an interrupted run made or deleted before, and an index daemon that does
-// not run. By then all is saved, and what the daemon would be told is put into the queues.
-void Change(const Console& console, const Json::Value& paths, const std::function<void()>& work,
-            const std::function<void()>& mend_index, int mendable) {
-  const auto once = [&] {
-    try {
-      work();
-    } catch (const Error& error) {
-      if (error.GetErrorCode() != ERR_SYSTEM || IsIndexDaemonRunning() ||
-          !std::string_view(error.what()).starts_with("write failed")) {
-        throw;
-      }
-      console.err << NoIndexDaemon() << "; the change is saved and waits for it\n";
-      fileindex::FolderReindex(paths);
-    }
-  };
-  With([&] {
-    try {
-      once();
-    } catch (const Error& error) {
-      if (static_cast<int>(error.GetErrorCode()) != mendable) {
-        throw;
-      }
-      mend_index();
-      once();
-    }
-  });
-}
-
-std::string UserName() {
-  const passwd* const user = getpwuid(getuid());  // NOLINT(concurrency-mt-unsafe): one thread.
-  return user == nullptr ? "" : user->pw_name;
-}
 
 // What the options say of a record.
 void ApplyOptions(Json::Value& record, const Arguments& arguments) {
@@ -129,7 +49,7 @@ void ApplyOptions(Json::Value& record, const Arguments& arguments) {
       wanted.insert(type);
     }
     wanted.erase("none");
-    for (const char* const type : kTypes) {
+    for (const char* const type : kFolderTypes) {
       record[type] = wanted.erase(type) > 0;
     }
     if (!wanted.empty()) {
@@ -141,7 +61,7 @@ void ApplyOptions(Json::Value& record, const Arguments& arguments) {
 
 std::string TypesOf(const Json::Value& record) {
   std::string types;
-  for (const char* const type : kTypes) {
+  for (const char* const type : kFolderTypes) {
     if (record[type].asBool()) {
       types.append(types.empty() ? "" : ",").append(type);
     }
@@ -149,63 +69,19 @@ std::string TypesOf(const Json::Value& record) {
   return types.empty() ? "none" : types;
 }
 
-// Makes a share of the folder when none holds it.
-std::string ShareFor(const std::string& folder, const Console& console) {
-  const std::string path = RealPath(folder);
-  if (path.empty() || !IsDirExist(path, /*follow_link=*/false)) {
-    throw Failure("'" + ForTerminal(folder) + "' is no folder");
-  }
-  if (path == "/") {
-    throw Failure("the root folder has no name, so it cannot be a share");
-  }
-  const std::string share_path = SharePathOf(path);
-  if (!share_path.empty()) {
-    return share_path;
-  }
-  RequireEngine();  // Before anything is changed.
-  kavo::local::Share share;
-  share.name = Basename(path);
-  share.path = path;
-  try {
-    kavo::local::AddShare(kavo::local::SharesFile(), share);
-  } catch (const kavo::local::SharesError& error) {
-    throw Failure(error.what());
-  }
-  console.err << "no share held it, so it was made the share '" << ForTerminal(share.name) << "'\n";
-  return "/" + share.name;
-}
-
 ExitStatus Add(const Arguments& arguments, const Console& console) {
-  Json::Value record;
-  record["path"] = ShareFor(arguments.positional[0], console);
-  record["name"] = Basename(record["path"].asString());
-  record["owner"] = UserName();
-  for (const char* const type : kTypes) {
-    record[type] = true;
-  }
+  Json::Value record = NewFolder(ShareFor(arguments.positional[0], console));
   ApplyOptions(record, arguments);
-  const std::string path = record["path"].asString();
-  const std::string share = fileindex::GetShareNameByPath(path);
-  With([&] {
-    if (!FolderMgr().IsShareIndexed(share)) {
-      RequireEngine();
-    }
-  });
-  Json::Value records(Json::arrayValue);
-  records.append(record);
-  Json::Value paths(Json::arrayValue);
-  paths.append(path);
-  Change(
-      console, paths, [&] { fileindex::FolderAdd(records, /*updater_mode=*/false); },
-      [&] { fileindex::elastic::ShareIndexDelete(share); }, kIndexExists);
-  console.out << "added: " << ForTerminal(path) << " (" << TypesOf(record) << ")\n";
+  AddFolder(record, console);
+  console.out << "added: " << ForTerminal(record["path"].asString()) << " (" << TypesOf(record)
+              << ")\n";
   return kDone;
 }
 
 ExitStatus Set(const Arguments& arguments, const Console& console) {
   const std::string path = ToSharePath(arguments.positional[0]);
   Json::Value record;
-  With([&] { fileindex::FolderGet(record, path); });
+  WithFolders([&] { fileindex::FolderGet(record, path); });
   const Json::Value before = record;
   ApplyOptions(record, arguments);
   if (record == before) {
@@ -216,7 +92,7 @@ ExitStatus Set(const Arguments& arguments, const Console& console) {
   records.append(record);
   Json::Value paths(Json::arrayValue);
   paths.append(path);
-  Change(
+  ChangeFolders(
       console, paths, [&] { fileindex::FolderSet(records, /*updater_mode=*/false); }, [] {},
       /*mendable=*/-1);
   console.out << "changed: " << ForTerminal(path) << " (" << TypesOf(record) << ")\n";
@@ -243,7 +119,7 @@ Json::Value FoldersToDelete(const Arguments& arguments, const FolderMgr& folders
 ExitStatus Delete(const Arguments& arguments, const Console& console) {
   Json::Value paths;
   std::set<std::string> ending;  // Shares that keep no folder.
-  With([&] {
+  WithFolders([&] {
     FolderMgr folders;
     paths = FoldersToDelete(arguments, folders);
     std::shared_ptr<fileindex::Folder> diff;
@@ -263,7 +139,7 @@ ExitStatus Delete(const Arguments& arguments, const Console& console) {
   if (!ending.empty()) {
     RequireEngine();
   }
-  Change(
+  ChangeFolders(
       console, paths, [&] { fileindex::FolderDelete(paths); },
       [&] {
         for (const std::string& share : ending) {
@@ -285,7 +161,7 @@ ExitStatus Delete(const Arguments& arguments, const Console& console) {
 
 ExitStatus Reindex(const Arguments& arguments, const Console& console) {
   Json::Value paths(Json::arrayValue);
-  With([&] {
+  WithFolders([&] {
     const FolderMgr folders;
     for (const std::string& named : arguments.positional) {
       const std::string path = ToSharePath(named);
@@ -307,7 +183,7 @@ ExitStatus Reindex(const Arguments& arguments, const Console& console) {
 
 ExitStatus Get(const Arguments& arguments, const Console& console) {
   Json::Value record;
-  With([&] { fileindex::FolderGet(record, ToSharePath(arguments.positional[0])); });
+  WithFolders([&] { fileindex::FolderGet(record, ToSharePath(arguments.positional[0])); });
   if (arguments.Has("--json")) {
     console.out << JsonToString(record) << "\n";
     return kDone;
@@ -343,7 +219,7 @@ ExitStatus ListFolders(const Arguments& arguments, const Console& console) {
     throw UsageError("'" + sort_by + "' is no order: name, path, owner or group");
   }
   Json::Value result;
-  With([&] {
+  WithFolders([&] {
     fileindex::FolderList(result, offset, limit, sort_by, descending ? "DESC" : "ASC",
                           arguments.Get("--group"), arguments.Get("--find"), additional);
   });
@@ -369,7 +245,7 @@ ExitStatus ListFolders(const Arguments& arguments, const Console& console) {
 
 ExitStatus ListGroups(const Arguments& arguments, const Console& console) {
   Json::Value groups;
-  With([&] { fileindex::FolderListGroups(groups); });
+  WithFolders([&] { fileindex::FolderListGroups(groups); });
   if (arguments.Has("--json")) {
     console.out << JsonToString(groups) << "\n";
   } else {
@@ -411,7 +287,7 @@ void ForgetShare(const std::string& share, const std::vector<std::string>& paths
 ExitStatus Prune(const Arguments& /*arguments*/, const Console& console) {
   CheckSharesFile();
   std::map<std::string, std::vector<std::string>> gone;  // Shares, and the paths of their folders.
-  With([&] {
+  WithFolders([&] {
     const LockFile lock(fileindex::kFileIndexFoldersLockPath.Get(), /*exclusive=*/true);
     FolderMgr folders;
     const std::set<std::string> shares = sdk::SDKShare::Enum();

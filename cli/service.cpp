@@ -4,9 +4,21 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <chrono>
+
+#include "common/json.h"
 #include "fileindex/paths.h"
+#include "kavo/local/content.h"
+#include "kavo/local/frames.h"
+#include "kavo/local/shares.h"
 
 namespace vexlo::cli {
+namespace {
+
+constexpr auto kPatience = std::chrono::seconds(2);
+constexpr size_t kMostReplyBytes = size_t{16} << 20;
+
+}  // namespace
 
 bool IsListening(const std::string& path) {
   sockaddr_un address{AF_UNIX, {}};
@@ -19,6 +31,37 @@ bool IsListening(const std::string& path) {
       connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
   close(fd);
   return connected;
+}
+
+std::vector<DaemonPlace> LocalDaemons() {
+  return {{"kavoelasticd", fileindex::kElasticdSocketPath.Get()},
+          {"kavocontentextractd", kavo::local::ContentSocket()},
+          {"fileindexd", fileindex::kFileIndexDaemonSocketPath.Get()},
+          {"evnotifyd", kavo::local::Root() + "/var/run/evnotifyd.sock"}};
+}
+
+Json::Value AskStats(const std::string& socket) {
+  // The daemons name what they are asked differently; each passes over what it does not know.
+  constexpr char kRequest[] = R"({"command":"stats","type":"stats","data":null})";
+  const kavo::local::Deadline deadline = std::chrono::steady_clock::now() + kPatience;
+  const int fd = kavo::local::ConnectWithin(socket, deadline);
+  std::string reply;
+  Json::Value stats;
+  if (fd >= 0) {
+    if (!kavo::local::SendFrame(fd, kRequest, /*file=*/-1, deadline) ||
+        !kavo::local::ReceiveFrame(fd, kMostReplyBytes, reply, /*file=*/nullptr, deadline) ||
+        !JsonFromString(stats, reply)) {
+      stats = Json::Value();
+    }
+    close(fd);
+  }
+  return stats.isObject() ? stats : Json::Value();
+}
+
+Json::Value AskShares() {
+  const Json::Value stats = AskStats(fileindex::kFileIndexDaemonSocketPath.Get());
+  const Json::Value& shares = stats["shares"];
+  return shares.isArray() ? shares : Json::Value(Json::arrayValue);
 }
 
 bool IsIndexDaemonRunning() { return IsListening(fileindex::kFileIndexDaemonSocketPath.Get()); }

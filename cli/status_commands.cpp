@@ -1,18 +1,139 @@
 // "fileindex status" and "fileindex summary": how indexing stands.
 #include <json/value.h>
 
+#include <chrono>
+#include <map>
+#include <thread>
+
 #include "cli/command.h"
 #include "cli/service.h"
 #include "cli/text.h"
+#include "common/error.h"
 #include "common/json.h"
 #include "fileindex/index_mgr/status_report.h"
+#include "fileindex/status_mgr.h"
 
 namespace vexlo::cli {
 namespace {
 
+using Clock = std::chrono::steady_clock;
+using Rows = std::vector<std::vector<std::string>>;
+
+constexpr auto kInterval = std::chrono::seconds(1);
+constexpr const char* kWipeScreen = "\033[H\033[2J";
+
 const Option kJson = {"--json", nullptr, "the library's own JSON"};
 
+// The daemon's own answer, with "name" and "running". One that does not answer in time runs no more
+// than one that is not there.
+Json::Value AskAll() {
+  Json::Value all;
+  all["daemons"] = Json::Value(Json::arrayValue);
+  all["shares"] = Json::Value(Json::arrayValue);
+  std::map<std::string, Json::Value> watched;  // By queue file.
+  for (const DaemonPlace& place : LocalDaemons()) {
+    const Json::Value stats = AskStats(place.socket);
+    Json::Value daemon;
+    daemon["name"] = place.name;
+    daemon["running"] = !stats.isNull();
+    daemon["socket"] = place.socket;
+    all["daemons"].append(daemon);
+    for (const Json::Value& queue : stats["queues"]) {
+      watched[queue["queue"].asString()] = queue;
+    }
+    for (const Json::Value& share : stats["shares"]) {
+      all["shares"].append(share);
+    }
+  }
+  for (Json::Value& share : all["shares"]) {
+    share["watch"] = watched[share["queue"].asString()];
+  }
+  all["status"] = fileindex::GetIndexProcessingStatus();
+  all["resume_time"] = static_cast<Json::Int64>(fileindex::StatusMgr().GetPauseInfo());
+  return all;
+}
+
+// Operations a second of each share since the last time.
+class Rates {
+ public:
+  std::map<std::string, double> Take(const Json::Value& shares) {
+    const Clock::time_point now = Clock::now();
+    const double seconds = std::chrono::duration<double>(now - last_).count();
+    std::map<std::string, double> rates;
+    for (const Json::Value& share : shares) {
+      const std::string name = share["share"].asString();
+      const uint64_t done = share["operations"].asUInt64() + share["files"].asUInt64();
+      const auto before = done_.find(name);
+      // Less than before: the daemon was started anew.
+      rates[name] = before == done_.end() || done < before->second
+                        ? 0
+                        : static_cast<double>(done - before->second) / seconds;
+      done_[name] = done;
+    }
+    last_ = now;
+    return rates;
+  }
+
+ private:
+  Clock::time_point last_ = Clock::now();
+  std::map<std::string, uint64_t> done_;
+};
+
+std::string WatchText(const Json::Value& watch) {
+  if (watch.isNull()) {
+    return "not watched";
+  }
+  const std::string reason = watch["reason"].asString();
+  return watch["state"].asString() + (reason.empty() ? "" : ": " + reason);
+}
+
+std::string TableOf(const Json::Value& all, const std::map<std::string, double>& rates) {
+  Rows daemons = {{"DAEMON", "STATE"}};
+  for (const Json::Value& daemon : all["daemons"]) {
+    daemons.push_back(
+        {daemon["name"].asString(), daemon["running"].asBool()
+                                        ? "running"
+                                        : "does not answer on " + daemon["socket"].asString()});
+  }
+  Rows shares = {{"SHARE", "STATE", "QUEUED", "DONE", "A SECOND", "WATCHED", "LAST ERROR"}};
+  for (const Json::Value& share : all["shares"]) {
+    const std::string name = share["share"].asString();
+    const auto rate = rates.find(name);
+    shares.push_back({ForTerminal(name), share["state"].asString(),
+                      Counted(share["queue_lines"].asUInt64(), "line"),
+                      Counted(share["operations"].asUInt64(), "change") + ", " +
+                          Counted(share["files"].asUInt64(), "file"),
+                      rate == rates.end() ? "" : Grouped(static_cast<uint64_t>(rate->second + 0.5)),
+                      ForTerminal(WatchText(share["watch"])),
+                      ForTerminal(share["last_error"].asString())});
+  }
+  return "indexing is " + all["status"].asString() + "\n\n" + Table(daemons) +
+         (shares.size() > 1 ? "\n" + Table(shares) : "\nno share is indexed\n");
+}
+
+void Show(const Arguments& arguments, const Console& console, Rates& rates, bool again) {
+  const Json::Value all = AskAll();
+  const std::map<std::string, double> by_share = rates.Take(all["shares"]);
+  if (arguments.Has("--json")) {
+    console.out << JsonToString(all) << "\n" << std::flush;
+    return;
+  }
+  console.out << (!again                    ? ""
+                  : console.out_is_terminal ? kWipeScreen
+                                            : "\n")
+              << TableOf(all, by_share) << std::flush;
+}
+
 ExitStatus ShowStatus(const Arguments& arguments, const Console& console) {
+  if (arguments.Has("--all") || arguments.Has("--watch")) {
+    Rates rates;
+    Show(arguments, console, rates, /*again=*/false);
+    while (arguments.Has("--watch") && console.out) {
+      std::this_thread::sleep_for(kInterval);
+      Show(arguments, console, rates, /*again=*/true);
+    }
+    return kDone;
+  }
   const std::string status = fileindex::GetIndexProcessingStatus();
   console.out << (arguments.Has("--json") ? JsonToString(status) : status) << "\n";
   if (!IsIndexDaemonRunning()) {
@@ -28,7 +149,7 @@ ExitStatus ShowSummary(const Arguments& arguments, const Console& console) {
     console.out << JsonToString(summary) << "\n";
     return kDone;
   }
-  std::vector<std::vector<std::string>> rows;
+  Rows rows;
   for (const Json::Value& item : summary["items"]) {
     rows.push_back(
         {ForTerminal(item["name"].asString()) + (item["group"].asBool() ? " (group)" : ""),
@@ -46,10 +167,16 @@ std::vector<Command> StatusCommands() {
       {"status",
        "",
        "says whether indexing is finished, under way or paused",
-       "Prints one word: finished, processing or paused.\n"
+       "Prints one word: finished, processing or paused. With --all, which of the daemons answer,\n"
+       "and for each share what its worker does, what waits in its queue, what was done since the\n"
+       "daemon's start, how fast, whether every change is seen, and the last error. --watch shows\n"
+       "that again every second until Ctrl-C.\n"
        "\n"
-       "  while [ \"$(fileindex status)\" = processing ]; do sleep 1; done\n",
-       {kJson},
+       "  while [ \"$(fileindex status)\" = processing ]; do sleep 1; done\n"
+       "  fileindex status --all --json | jq '.shares[] | select(.state == \"failing\")'\n",
+       {{"--all", nullptr, "the daemons and the shares, too"},
+        {"--watch", nullptr, "the same, every second"},
+        {"--json", nullptr, "JSON, one line each time"}},
        {},
        0,
        0,

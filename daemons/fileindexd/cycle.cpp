@@ -1,6 +1,7 @@
 #include "daemons/fileindexd/cycle.h"
 
 #include <algorithm>
+#include <new>
 #include <set>
 #include <system_error>
 #include <utility>
@@ -27,6 +28,7 @@ using fileindex::GetFileTypeName;
 
 constexpr Json::ArrayIndex kMostDeletes = 500;
 constexpr size_t kMostTaken = 10000;
+constexpr size_t kMostTouched = 100000;
 constexpr unsigned kMostLogged = 10;      // Of one code, in a cycle.
 constexpr char kByItself[] = "settings";  // The cause of a crawl that no operation asked for.
 
@@ -81,7 +83,12 @@ void Cycle::Handle(const fileindex::OP& op) {
     if (OfOperation(error.GetErrorCode()) != Consequence::kGoOn) {
       throw;
     }
+    if (error.GetErrorCode() == ERR_SYSTEM) {
+      scope_.CheckShare();  // The fault may be the share's: then the operation waits for it.
+    }
     Count(error.GetErrorCode(), error.what(), path);
+  } catch (const std::bad_alloc&) {
+    throw;
   } catch (const std::exception& error) {
     Count(ERR_INTERNAL, error.what(), path);
   }
@@ -101,6 +108,14 @@ void Cycle::Carry(const fileindex::OP& op, const std::string& path) {
   if (!scope_.IsInShare(path)) {
     throw Error(ERR_BAD_PARAMETER, "the path lies outside of the share");
   }
+  CarryKnown(op, path);
+  NoteTouched(path);
+  if (op.op == fileindex::OP_RENAME) {
+    NoteTouched(op.path_old);
+  }
+}
+
+void Cycle::CarryKnown(const fileindex::OP& op, const std::string& path) {
   switch (op.op) {
     case fileindex::OP_DELETE:
       Delete(path);
@@ -170,7 +185,9 @@ void Cycle::UpdateAttributes(const std::string& path) {
 }
 
 void Cycle::Rename(const std::string& path, const std::string& path_old) {
-  if (!scope_.IsInShare(path_old)) {
+  // Neither happens on a disk. The library would move documents into a folder that it moves for
+  // ever.
+  if (!scope_.IsInShare(path_old) || IsSameOrBelow(path, path_old)) {
     Reconcile(path, Json::Value());
     return;
   }
@@ -184,46 +201,65 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
   facts.old_inode = InodeOf(StampOfPath(path_old, /*content=*/false));
   facts.new_inode = InodeOf(now);
   const RenameStep step = PlanRename(facts);
+  // What was handed over before this may be of what came after it: see touched_.
+  const bool is_mixed = WasTouched(path) || WasTouched(path_old);
   ForgetTaken(path);
   ForgetTaken(path_old);
   if (step == RenameStep::kMove) {
     has_sent_ = true;
     elastic::IndexRename(share_, path, path_old);
-    FinishMove(path, path_old, document->stamp, now);
+    if (now) {
+      FinishMove(path, document->stamp, *now);
+      // What lies below keeps what it was indexed with, unless other settings hold now.
+      if (is_mixed || !scope_.HaveSameSettings(path, path_old)) {
+        ReconcileMixed(path);
+      }
+    }
   } else if (step == RenameStep::kReconcile) {
-    Reconcile(path, Json::Value());
+    ReconcileMixed(path);
   } else {
     Delete(path);
   }
-  Delete(path_old);
+  if (facts.old_inode) {
+    ReconcileMixed(path_old);
+  } else {
+    Delete(path_old);
+  }
 }
 
 // The renamed object's own document: its dates are new, and its type may be.
-void Cycle::FinishMove(const std::string& path, const std::string& path_old,
-                       const std::optional<Stamp>& before, const std::optional<Stamp>& now) {
-  if (!now) {
+void Cycle::FinishMove(const std::string& path, const std::optional<Stamp>& before,
+                       const Stamp& now) {
+  if (!before || before->content != now.content || !HasSameContent(*before, now)) {
+    Submit(path);
     return;
   }
-  if (!before || before->content != now->content || !HasSameContent(*before, *now)) {
-    Submit(path);
-  } else {
-    Json::Value requests(Json::arrayValue);
-    requests.append(MakeAttributes(id_, path, *now));
-    SendList(std::move(requests));
-  }
-  // What lies below keeps what it was indexed with, unless another folder's settings hold now.
-  if (!scope_.HaveSameSettings(path, path_old)) {
-    Reconcile(path, Json::Value());
-  }
+  Json::Value requests(Json::arrayValue);
+  requests.append(MakeAttributes(id_, path, now));
+  SendList(std::move(requests));
+}
+
+// Where documents may stand at each other's paths. Files that were made in the same tick have the
+// same dates.
+void Cycle::ReconcileMixed(const std::string& path) {
+  inodes_count_ = true;
+  Reconcile(path, Json::Value());
 }
 
 void Cycle::ReconcileShare() { Reconcile(scope_.SharePath(), Json::Value(), kByItself); }
 
 void Cycle::ReconcileNewFolders() {
-  const std::set<std::string> crawled = state_.crawled;
   const std::vector<std::string>& folders = scope_.Folders();
+  const auto is_folder = [&](const std::string& path) {
+    return std::binary_search(folders.begin(), folders.end(), path);
+  };
+  if (state_.crawl && state_.crawl->cause == kByItself && !is_folder(state_.crawl->root)) {
+    state_.crawled.insert(state_.crawl->root);  // As far as it came.
+    state_.crawl.reset();
+  }
+  const std::set<std::string> crawled = state_.crawled;
   for (const std::string& folder : crawled) {
-    if (!std::binary_search(folders.begin(), folders.end(), folder)) {
+    if (!is_folder(folder)) {
       Reconcile(folder, Json::Value(), kByItself);
       state_.crawled.erase(folder);
       state_changed_ = true;
@@ -273,6 +309,7 @@ void Cycle::Reconcile(const std::string& root, const Json::Value& types, const c
               std::generic_category().message(result.last_error),
           root);
   }
+  inodes_count_ = false;
   state_.crawl.reset();
   MarkCrawled(root);
   stats_.SetState(WorkerState::kProcessing);
@@ -285,8 +322,9 @@ void Cycle::Compare(const DiskEntry& entry, const IndexedPath* indexed, const Js
       IsTrue(types, "basic") ||
       (!S_ISDIR(entry.info.st_mode) &&
        IsTrue(types, std::string(GetFileTypeName(GetFileTypeByFullPath(entry.path))).c_str()));
-  if (is_asked_for || indexed == nullptr ||
-      !IsCurrent(indexed->stamp, StampOf(entry.info, content, timespec{}))) {
+  const Stamp now = StampOf(entry.info, content, timespec{});
+  if (is_asked_for || indexed == nullptr || !IsCurrent(indexed->stamp, now) ||
+      (inodes_count_ && indexed->stamp->inode != now.inode)) {
     Submit(entry.path);
   }
 }
@@ -347,6 +385,27 @@ void Cycle::ForgetTaken(const std::string& path) {
   taken_.erase(path);
   // What lies below stands together, from "/" on and up to the byte behind it.
   taken_.erase(taken_.lower_bound(path + "/"), taken_.lower_bound(path + "0"));
+}
+
+void Cycle::NoteTouched(const std::string& path) {
+  if (touched_.size() < kMostTouched) {
+    touched_.insert(path);
+  } else {
+    touched_too_much_ = true;
+  }
+}
+
+// Whether an operation so far was about the path, what lies below it, or a folder above it.
+bool Cycle::WasTouched(const std::string& path) const {
+  if (touched_too_much_ || touched_.lower_bound(path + "/") != touched_.lower_bound(path + "0")) {
+    return true;
+  }
+  for (std::string at = path; !at.empty(); at.resize(at.rfind('/'))) {
+    if (touched_.contains(at)) {
+      return true;
+    }
+  }
+  return false;
 }
 
 void Cycle::FlushDeletes() {

@@ -8,6 +8,7 @@
 #include <map>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -44,16 +45,17 @@ class Cycle {
 
  private:
   void Carry(const fileindex::OP& op, const std::string& path);
+  void CarryKnown(const fileindex::OP& op, const std::string& path);
   void Delete(const std::string& path);
   void Upsert(const std::string& path);
   void UpdateAttributes(const std::string& path);
   void Rename(const std::string& path, const std::string& path_old);
-  void FinishMove(const std::string& path, const std::string& path_old,
-                  const std::optional<Stamp>& before, const std::optional<Stamp>& now);
+  void FinishMove(const std::string& path, const std::optional<Stamp>& before, const Stamp& now);
 
   // Compares what is at and below the path with the index. `types` names the types of files that
   // are indexed anew even so, or is null. The cycle's cause where `cause` is null.
   void Reconcile(const std::string& root, const Json::Value& types, const char* cause = nullptr);
+  void ReconcileMixed(const std::string& path);
   void Compare(const DiskEntry& entry, const IndexedPath* indexed, const Json::Value& types);
   void Remove(const std::vector<GoneList::Gone>& gone);
   void MarkCrawled(const std::string& root);
@@ -62,6 +64,8 @@ class Cycle {
   bool IsWanted(const std::string& path) const;
   void Submit(const std::string& path);
   void ForgetTaken(const std::string& path);
+  void NoteTouched(const std::string& path);
+  bool WasTouched(const std::string& path) const;
   void FlushDeletes();
   // Returns when the engine has everything that was taken.
   void Settle();
@@ -84,6 +88,11 @@ class Cycle {
   // What was taken in this cycle, as it was then: an editor's save is one rename and one change of
   // the same file.
   std::map<std::string, Stamp> taken_;
+  // Paths of the operations so far. The tree folds events into operations that are pending already,
+  // so what happened at a path after a rename may be handed over before it.
+  std::set<std::string> touched_;
+  bool touched_too_much_ = false;
+  bool inodes_count_ = false;  // In this crawl a document of another inode is another file's.
   std::map<int, unsigned> failures_;
 };
 

@@ -25,8 +25,7 @@ enum class RenameStep {
 
 // A document moves only where it is that of the object that has moved, which the inode tells.
 // Otherwise doing a cycle again would take what was made at the old path since for what was there
-// before. Whatever is left at the old path goes in every case: what stands there now was made after
-// the rename, and an operation behind it says so.
+// before.
 RenameStep PlanRename(const RenameFacts& facts);
 
 }  // namespace vexlo::fileindexd

@@ -8,6 +8,7 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "daemons/common/frame_server.h"
+#include "daemons/fileindexd/consequence.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/paths.h"
 
@@ -139,7 +140,12 @@ void Service::Post(Task task) {
 void Service::Run() {
   std::unique_lock lock(mutex_);
   for (;;) {
-    changed_.wait(lock, [this] { return ending_ || !tasks_.empty(); });
+    const auto is_called = [this] { return ending_ || !tasks_.empty(); };
+    if (!start_again_) {
+      changed_.wait(lock, is_called);
+    } else if (!changed_.wait_until(lock, *start_again_, is_called)) {
+      tasks_.push_back([this] { StartIndexedShares(); });
+    }
     if (ending_) {
       return;
     }
@@ -161,8 +167,16 @@ void Service::StartIndexedShares() {
   } catch (const Error& error) {
     LogLine(VEXLO_SOURCE, __LINE__, std::string("the pause is not known, reason=") + error.what());
   }
-  for (const std::string& share : fileindex::FolderMgr().GetIndexedShares()) {
-    Create(share);
+  try {
+    for (const std::string& share : fileindex::FolderMgr().GetIndexedShares()) {
+      Create(share);
+    }
+    start_again_.reset();
+  } catch (const Error& error) {
+    start_wait_ = NextWait(start_wait_);
+    start_again_ = std::chrono::steady_clock::now() + start_wait_;
+    LogLine(VEXLO_SOURCE, __LINE__,
+            std::string("the folders are not known, reason=") + error.what());
   }
 }
 

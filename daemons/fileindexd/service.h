@@ -11,6 +11,7 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <thread>
 
@@ -65,6 +66,10 @@ class Service {
   Workers workers_;
   std::deque<Task> tasks_;
   bool ending_ = false;
+
+  // The thread's own: when to look for the list of folders again, while it cannot be read.
+  std::optional<std::chrono::steady_clock::time_point> start_again_;
+  std::chrono::seconds start_wait_{0};
 
   std::thread thread_;
 };

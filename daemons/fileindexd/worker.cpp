@@ -25,6 +25,7 @@ using fileindex::StatusMgr;
 using Clock = std::chrono::steady_clock;
 
 constexpr std::chrono::seconds kSpaceWait{60};
+constexpr uint64_t kUsualLineBytes = 100;
 constexpr int kBothBits = fileindex::SS_NEED_REINDEX | fileindex::SS_NEED_REBUILD;
 
 // The engine's answers that make creating or deleting what is there, or not there, no failure.
@@ -115,8 +116,10 @@ Json::Value Worker::Describe() const {
   }
   Json::Value value = stats_.ToJson();
   value["share"] = share_;
-  value["queue_bytes"] =
-      static_cast<Json::UInt64>(BytesOf(queue_path) + BytesOf(queue_path + ".tmp"));
+  const uint64_t bytes = BytesOf(queue_path) + BytesOf(queue_path + ".tmp");
+  value["queue"] = queue_path;
+  value["queue_bytes"] = static_cast<Json::UInt64>(bytes);
+  value["queue_lines"] = static_cast<Json::UInt64>((bytes + kUsualLineBytes - 1) / kUsualLineBytes);
   return value;
 }
 

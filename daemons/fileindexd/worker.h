@@ -59,7 +59,7 @@ class Worker {
   // True when the thread has ended within the time.
   bool AwaitEnd(std::chrono::steady_clock::time_point until);
 
-  // As the command "stats" tells it.
+  // As the command "stats" tells it. How many lines wait is told from how many bytes do.
   Json::Value Describe() const;
 
  private:

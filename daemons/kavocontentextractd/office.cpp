@@ -24,7 +24,7 @@ namespace reason = kavo::local::content_reason;
 
 // What a document may unpack to: of the largest that people write it is a multiple, of a bomb a
 // small part.
-constexpr uint64_t kMostUnpacked = uint64_t{256} << 20;
+constexpr uint64_t kMostUnpacked = uint64_t{128} << 20;
 constexpr size_t kMostEntries = 20000;
 constexpr size_t kBlockBytes = size_t{64} << 10;
 constexpr size_t kMostPageBytes = size_t{16} << 20;

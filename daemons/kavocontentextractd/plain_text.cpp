@@ -31,14 +31,6 @@ constexpr Mark kMarks[] = {
     {"\xFF\xFE", "UTF-16LE"},  {"\xFE\xFF", "UTF-16BE"},
 };
 
-// Of the control characters text has white space, backspace and escape sequences.
-bool HasBinaryControls(std::string_view bytes) {
-  return std::any_of(bytes.begin(), bytes.end(), [](char c) {
-    const auto byte = static_cast<unsigned char>(c);
-    return byte < 0x20 && (byte < '\b' || byte > '\r') && byte != 0x1B;
-  });
-}
-
 // Encodings of seven bits that shift to other characters look like ASCII.
 bool HasShifts(std::string_view bytes) {
   return bytes.find("\x1B$") != std::string_view::npos ||
@@ -46,6 +38,13 @@ bool HasShifts(std::string_view bytes) {
 }
 
 }  // namespace
+
+bool HasBinaryControls(std::string_view bytes) {
+  return std::any_of(bytes.begin(), bytes.end(), [](char c) {
+    const auto byte = static_cast<unsigned char>(c);
+    return byte < 0x20 && (byte < '\b' || byte > '\r') && byte != 0x1B;
+  });
+}
 
 bool IsUtf8(std::string_view bytes, bool has_more) {
   const auto* const start = reinterpret_cast<const uint8_t*>(bytes.data());

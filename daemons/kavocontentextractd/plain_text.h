@@ -24,6 +24,10 @@ std::string GuessEncoding(std::string_view bytes);
 // Whether all of it is UTF-8; when more would follow, the last character may be cut off.
 bool IsUtf8(std::string_view bytes, bool has_more);
 
+// Whether there are control characters that no text has; white space, backspace and escape
+// sequences are not among them.
+bool HasBinaryControls(std::string_view bytes);
+
 }  // namespace vexlo::extractd
 
 #endif  // DAEMONS_KAVOCONTENTEXTRACTD_PLAIN_TEXT_H_

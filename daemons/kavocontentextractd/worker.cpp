@@ -53,7 +53,7 @@ int RunWorker(size_t memory) {
   std::string text;
   int number = -1;
   while (kavo::local::ReceiveFrame(socket.Get(), kMaxRequestBytes, text, &number, kNever)) {
-    const daemon::UniqueFd file(number);
+    daemon::UniqueFd file(number);
     std::string reply;
     try {
       Json::Value request;
@@ -62,6 +62,7 @@ int RunWorker(size_t memory) {
     } catch (const std::bad_alloc&) {
       _exit(kOutOfMemory);  // There may be none for an answer, and what is left is in pieces.
     }
+    file.Reset();  // Nothing of it is held once the daemon has its answer.
     if (!kavo::local::SendFrame(socket.Get(), reply, -1, kNever)) {
       return 1;
     }

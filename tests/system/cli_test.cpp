@@ -62,6 +62,10 @@ const CliCase kCases[] = {
     {"AddNoShare", "queue add write vol", 3, "", "no share holds '"},
     {"PauseAlone", "pause", 0, "indexing is paused until 'fileindex resume'\n", "will go by"},
     {"PauseBadHours", "pause 0", 2, "", "'0' is no number of hours"},
+    {"ExtractText", "extract vol/photo/note.txt", 0, "*KAVOMDTextContent: The harbour", ""},
+    {"ExtractNoDaemon", "extract --json vol/photo/note.pdf", 1,
+     "*\"KAVOMDContentError\":\"unavailable: ", ""},
+    {"ExtractMissing", "extract none vol/photo/note.txt", 3, "*The harbour", "none: No such file"},
     {"RemoveShare", "share remove films", 0, "*removed: films", ""},
     {"RemoveShareTwice", "share remove films", 3, "", "films"},
 };
@@ -239,6 +243,8 @@ TEST_F(Cli, AnswersEveryCommandLine) {
   for (const char* needed : {"", "/../../../../tmp", "/../../../lib/kavo/fileindex/queue"}) {
     std::filesystem::create_directories(etc + needed);
   }
+  WriteText(files_ / "vol/photo/note.txt", "The harbour\nis closed");
+  WriteText(files_ / "vol/photo/note.pdf", "%PDF");
   for (const CliCase& row : kCases) {
     Check(row);
   }

@@ -78,8 +78,8 @@ class Coming {
 class Fileindexd : public testing::Test {
  protected:
   Fileindexd() {
-    for (const char* const folder : {"var", "vol", "tmp"}) {
-      fs::remove_all(kRoot / folder);
+    for (const char* const each : {"var", "vol", "tmp", "indexer.log"}) {
+      fs::remove_all(kRoot / each);
     }
     for (const char* const folder : {"var/run", "var/packages/Vexlo/etc", "vol/docs", "tmp"}) {
       kRoot.MakeFolder(folder);
@@ -105,6 +105,7 @@ class Fileindexd : public testing::Test {
   void StartEngine() { Start(engine_, KAVOELASTICD_PROGRAM, "engine.log"); }
   void StartIndexer() { Start(indexer_, FILEINDEXD_PROGRAM " --cycle 100", "indexer.log"); }
   int EndEngine(int signal) { return End(engine_, signal); }
+  void SignalEngine(int signal) { kill(engine_->pid, signal); }
   int EndIndexer(int signal) { return End(indexer_, signal); }
 
   // Both, and the first crawl done.
@@ -348,6 +349,8 @@ TEST_F(Fileindexd, CarriesOutEachOperation) {
        {"{", "\xFF", R"({"event":8,"path":""})", R"({"event":8,"path":"x"})",
         "{\"event\":8,\"path\":\"" + In("a\\u0000b") + "\"}",
         Line(EV_DELETE, kRoot / "vol", "", true), Line(EV_RENAME, In("sane"), "/"),
+        Line(EV_RENAME, In("sane"), In("sane")),
+        Line(EV_RENAME, In("moved/into"), In("moved"), true),
         Line(EV_CLOSE_WRITE, In(std::string(300, 'n'))),
         R"({"event":131072,"path":")" + In("") + R"(","data":7})",
         Line(EV_CLOSE_WRITE, In("sane"))},
@@ -555,6 +558,11 @@ TEST_F(Fileindexd, AnswersEveryCommandAtOnce) {
     const RawClient client(SocketPath(), LengthBytes(length) + "{");
     EXPECT_NE(client.Receive(100).find("the command is too long"), std::string::npos) << length;
   }
+  Program tool("exec 2>&1", FILEINDEX_PROGRAM " status --all");
+  EXPECT_EQ(tool.End(), 0);
+  EXPECT_NE(tool.text.find("\ndocs   idle   0 lines  0 changes, 1 file  0         not watched"),
+            std::string::npos)
+      << tool.text;
   // It is the next one's, whoever left it.
   EndIndexer(SIGKILL);
   EXPECT_TRUE(fs::exists(SocketPath()));
@@ -594,6 +602,37 @@ TEST_F(Fileindexd, ACrawlGoesOnWhereItWasKilledAndStopsInTime) {
   EXPECT_EQ(Search(R"({"below":")" + In("tree") + "\"}").size(), 10000U);  // As many as are asked.
 }
 
+TEST_F(Fileindexd, StopsInTimeWhenTheEngineDoesNotAnswer) {
+  StartAll();
+  SignalEngine(SIGSTOP);
+  Write("a", "alpha");
+  Append({Line(EV_CLOSE_WRITE, In("a"))});
+  ASSERT_TRUE(AwaitState("processing"));
+  const auto before = std::chrono::steady_clock::now();
+  EXPECT_EQ(EndIndexer(SIGTERM), 0);
+  EXPECT_LT(std::chrono::steady_clock::now() - before, std::chrono::seconds(2));
+  EXPECT_TRUE(fs::exists(queue_.string() + ".tmp"));
+  SignalEngine(SIGCONT);
+  StartIndexer();
+  Cycle({});
+  EXPECT_EQ(All(), (Paths{".", "a"}));
+}
+
+TEST_F(Fileindexd, WaitsForAListOfFoldersThatCanBeRead) {
+  const std::string folders = kRoot / "var/packages/Vexlo/etc/fileindex.folders";
+  const std::string text = ReadText(folders);
+  WriteText(folders, "{");
+  StartEngine();
+  StartIndexer();
+  Append({});
+  while (ReadText(kRoot / "indexer.log").find("the folders are not known") == std::string::npos) {
+  }
+  const Coming gone(queue_.parent_path(), IN_DELETE);
+  WriteText(folders, text);
+  EXPECT_TRUE(gone.Await(queue_.filename().string() + ".tmp"));
+  EXPECT_EQ(All(), Paths{"."});
+}
+
 // What a watcher would report of a random change, and its like in memory.
 class RandomDisk {
  public:
@@ -611,9 +650,11 @@ class RandomDisk {
         }
         [[fallthrough]];
       case 1:
-      case 2:
+      case 2: {
+        const bool is_new = !fs::exists(path);
         WriteText(path, "word" + to_string(++count_));
-        return Line(EV_CLOSE_WRITE, path);
+        return (is_new ? Line(EV_CREATE, path) + "\n" : "") + Line(EV_CLOSE_WRITE, path);
+      }
       case 3:
         if (fs::exists(path) && path != other) {
           fs::rename(path, other);

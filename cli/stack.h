@@ -1,0 +1,61 @@
+// The local stack's daemons as children of the tool.
+#ifndef CLI_STACK_H_
+#define CLI_STACK_H_
+
+#include <sys/types.h>
+
+#include <chrono>
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "cli/service.h"
+
+namespace vexlo::cli {
+
+// Starts those of the four daemons that do not run yet, and ends them: by Stop(), or by SIGTERM
+// from the kernel when the tool is killed. Their lines go to files below the root. The programs are
+// those beside the tool's own. For a program of one thread that blocks SIGINT, SIGTERM and SIGHUP;
+// the daemons do not inherit that, and signals of the terminal do not reach them.
+class Stack {
+ public:
+  // Told when a daemon has ended unasked.
+  using Notice = std::function<void(const std::string& sentence)>;
+
+  explicit Stack(Notice notice);
+  ~Stack();
+  Stack(const Stack&) = delete;
+  Stack& operator=(const Stack&) = delete;
+
+  // Starts them in order, each when the one before listens. Throws Failure when one ends instead,
+  // with the last line that it wrote. `is_stopped` is asked meanwhile; false when it said so.
+  bool Start(const std::function<bool()>& is_stopped);
+
+  // Starts anew those that have ended. Throws Failure for one that does so again and again.
+  void Tend();
+
+  // Asks those that it started to end, the ones that depend on others first, and kills after four
+  // seconds what has not ended.
+  void Stop();
+
+ private:
+  using Clock = std::chrono::steady_clock;
+
+  struct Child {
+    DaemonPlace place;
+    pid_t pid = 0;  // 0: not ours, or not running.
+    std::vector<Clock::time_point> starts;
+  };
+
+  void Spawn(Child& child);
+  bool HasEnded(Child& child);
+  std::string LogFile(const Child& child) const;
+  std::string LastWords(const Child& child) const;
+
+  const Notice notice_;
+  std::vector<Child> children_;
+};
+
+}  // namespace vexlo::cli
+
+#endif  // CLI_STACK_H_

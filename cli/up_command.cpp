@@ -1,0 +1,346 @@
+// "fileindex up DIR...": the whole local stack in the foreground.
+#include <json/value.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <csignal>
+#include <cstdlib>
+#include <ctime>
+#include <filesystem>
+#include <map>
+#include <optional>
+#include <thread>
+
+#include "cli/command.h"
+#include "cli/folder_change.h"
+#include "cli/service.h"
+#include "cli/stack.h"
+#include "cli/text.h"
+#include "common/file.h"
+#include "common/json.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/paths.h"
+
+namespace vexlo::cli {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+constexpr auto kProgressInterval = std::chrono::milliseconds(100);
+constexpr auto kLineInterval = std::chrono::seconds(2);  // Where there is no terminal.
+constexpr auto kFollowInterval = std::chrono::seconds(1);
+constexpr size_t kBarWidth = 30;
+
+// SIGINT, SIGTERM and SIGHUP, blocked as long as it lives.
+class StopSignals {
+ public:
+  StopSignals() {
+    sigemptyset(&signals_);
+    for (const int signal : {SIGINT, SIGTERM, SIGHUP}) {
+      sigaddset(&signals_, signal);
+    }
+    sigprocmask(SIG_BLOCK, &signals_, &before_);
+  }
+  ~StopSignals() { sigprocmask(SIG_SETMASK, &before_, nullptr); }
+  StopSignals(const StopSignals&) = delete;
+  StopSignals& operator=(const StopSignals&) = delete;
+
+  // Whether one has come by now, or comes within the time.
+  bool Await(std::chrono::milliseconds time) {
+    const timespec wait = {time.count() / 1000, time.count() % 1000 * 1000000};
+    stopped_ = stopped_ || sigtimedwait(&signals_, nullptr, &wait) > 0;
+    return stopped_;
+  }
+
+ private:
+  sigset_t signals_{};
+  sigset_t before_{};
+  bool stopped_ = false;
+};
+
+// Counts what is in folders, on a thread of its own.
+class Count {
+ public:
+  explicit Count(std::vector<std::string> folders)
+      : thread_([this, folders = std::move(folders)] { Run(folders); }) {}
+  ~Count() {
+    ending_ = true;
+    thread_.join();
+  }
+  Count(const Count&) = delete;
+  Count& operator=(const Count&) = delete;
+
+  uint64_t Get() const { return count_; }
+  bool IsDone() const { return done_; }
+
+ private:
+  void Run(const std::vector<std::string>& folders) {
+    for (const std::string& folder : folders) {
+      ++count_;
+      std::error_code error;
+      const auto options = std::filesystem::directory_options::skip_permission_denied;
+      for (std::filesystem::recursive_directory_iterator entry(folder, options, error), end;
+           !error && entry != end && !ending_; entry.increment(error)) {
+        ++count_;
+      }
+    }
+    done_ = true;
+  }
+
+  std::atomic<uint64_t> count_ = 0;
+  std::atomic<bool> done_ = false;
+  std::atomic<bool> ending_ = false;
+  std::thread thread_;
+};
+
+// Says things to people, or in JSON to programs: an object a line, with "event".
+class Voice {
+ public:
+  Voice(const Console& console, bool as_json)
+      : console_(console), as_json_(as_json), has_bar_(console.out_is_terminal && !as_json) {}
+
+  void Say(const char* event, const std::string& text, Json::Value fields = Json::objectValue) {
+    Wipe();
+    if (as_json_) {
+      fields["event"] = event;
+      fields["text"] = text;
+      console_.out << JsonToString(fields) << "\n" << std::flush;
+    } else {
+      console_.out << ForTerminal(text) << "\n" << std::flush;
+    }
+  }
+
+  // Drawn over the last one on a terminal, a line every other second elsewhere.
+  void ShowProgress(uint64_t done, const Count& total, double seconds) {
+    const auto rate = static_cast<uint64_t>(static_cast<double>(done) / std::max(seconds, 0.001));
+    std::string text = Counted(done, "file");
+    if (total.IsDone()) {
+      text += " of about " + Grouped(std::max(total.Get(), done));
+    }
+    text += ", " + Grouped(rate) + " a second";
+    if (total.IsDone() && rate > 0 && total.Get() > done) {
+      text += ", " + Counted((total.Get() - done) / rate + 1, "second") + " left";
+    }
+    if (has_bar_) {
+      const size_t most = std::max<uint64_t>({total.Get(), done, 1});
+      const size_t filled = total.IsDone() ? done * kBarWidth / most : 0;
+      console_.out << "\r\033[K[" << std::string(filled, '#')
+                   << std::string(kBarWidth - filled, '.') << "] " << text << std::flush;
+      drawn_ = true;
+    } else if (Clock::now() >= next_) {
+      next_ = Clock::now() + kLineInterval;
+      Json::Value fields;
+      fields["done"] = Json::UInt64{done};
+      fields["total"] = total.IsDone() ? Json::Value(Json::UInt64{total.Get()}) : Json::Value();
+      fields["rate"] = Json::UInt64{rate};
+      Say("progress", "indexing: " + text, fields);
+    }
+  }
+
+ private:
+  void Wipe() {
+    if (drawn_) {
+      console_.out << "\r\033[K";
+      drawn_ = false;
+    }
+  }
+
+  const Console& console_;
+  const bool as_json_;
+  const bool has_bar_;
+  bool drawn_ = false;
+  Clock::time_point next_ = Clock::now() + kLineInterval;
+};
+
+uint64_t FilesTaken(const Json::Value& shares) {
+  uint64_t files = 0;
+  for (const Json::Value& share : shares) {
+    files += share["files"].asUInt64();
+  }
+  return files;
+}
+
+// Whether every share has a worker that has nothing left to do, and every queue is fed.
+bool IsQuiet(const Json::Value& shares) {
+  const size_t wanted = fileindex::FolderMgr().GetIndexedShares().size();
+  const bool are_idle = std::all_of(shares.begin(), shares.end(), [](const Json::Value& share) {
+    const std::string state = share["state"].asString();
+    return (state == "idle" && share["queue_bytes"].asUInt64() == 0) || state == "unavailable" ||
+           state == "paused";
+  });
+  if (!are_idle || shares.size() < wanted) {
+    return false;
+  }
+  const Json::Value monitor = AskStats(LocalDaemons().back().socket);
+  const Json::Value& queues = monitor["queues"];
+  return queues.size() >= wanted &&
+         std::none_of(queues.begin(), queues.end(), [](const Json::Value& queue) {
+           return queue["state"] == "degraded" &&
+                  queue["reason"].asString().find("being read") != std::string::npos;
+         });
+}
+
+// The folders that are indexed already are left as they are. The full paths of all.
+std::vector<std::string> AddFolders(const std::vector<std::string>& folders, Voice& voice,
+                                    const Console& console) {
+  std::vector<std::string> full_paths;
+  for (const std::string& folder : folders) {
+    const std::string path = ShareFor(folder, console);
+    const bool is_new = !fileindex::FolderMgr().HasFolder(path);
+    if (is_new) {
+      AddFolder(NewFolder(path), console);
+    }
+    full_paths.push_back(RealPath(folder));
+    Json::Value fields;
+    fields["path"] = full_paths.back();
+    voice.Say("folder", (is_new ? "indexing " : "indexed already: ") + full_paths.back(), fields);
+  }
+  return full_paths;
+}
+
+// How a person calls this very program.
+std::string OwnCall() {
+  std::error_code error;
+  const char* const root = getenv("FILEINDEX_ROOT");  // NOLINT(concurrency-mt-unsafe)
+  return (root == nullptr ? "" : "FILEINDEX_ROOT=" + std::string(root) + " ") +
+         std::filesystem::read_symlink("/proc/self/exe", error).string();
+}
+
+std::string TimeOfDay() {
+  const time_t now = time(nullptr);
+  tm local{};
+  char text[16];
+  return {text, strftime(text, sizeof(text), "%H:%M:%S", localtime_r(&now, &local))};
+}
+
+// Says what each share's worker has done since the last time.
+void SayWhatIsNew(const Json::Value& shares, std::map<std::string, uint64_t>& operations,
+                  Voice& voice) {
+  for (const Json::Value& share : shares) {
+    const uint64_t now = share["operations"].asUInt64();
+    uint64_t& before = operations[share["share"].asString()];
+    if (now > before && share["state"] == "idle") {
+      Json::Value fields;
+      fields["share"] = share["share"];
+      fields["operations"] = Json::UInt64{now - before};
+      voice.Say("changes",
+                TimeOfDay() + "  " + share["share"].asString() + ": " +
+                    Counted(now - before, "change") + " indexed",
+                fields);
+    }
+    if (now < before || share["state"] == "idle") {  // Less: the daemon was started anew.
+      before = now;
+    }
+  }
+}
+
+// False when a signal came before all of it was found.
+bool AwaitFirstCrawl(const std::vector<std::string>& folders, StopSignals& signals, Stack& stack,
+                     Voice& voice) {
+  const Count total(folders);
+  const Clock::time_point began = Clock::now();
+  for (;;) {
+    const Json::Value shares = AskShares();
+    const uint64_t done = FilesTaken(shares);
+    const double seconds = std::chrono::duration<double>(Clock::now() - began).count();
+    if (IsQuiet(shares)) {
+      Json::Value fields;
+      fields["files"] = Json::UInt64{done};
+      fields["seconds"] = seconds;
+      char text[32];
+      snprintf(text, sizeof(text), "%.1f", seconds);
+      voice.Say("ready",
+                "everything can be found: " + Counted(done, "file") + " and folders indexed in " +
+                    text + " s",
+                fields);
+      return true;
+    }
+    voice.ShowProgress(done, total, seconds);
+    if (signals.Await(kProgressInterval)) {
+      return false;
+    }
+    stack.Tend();
+  }
+}
+
+// A root of its own may be new; a system's folders are the package's.
+void MakeRootFolders() {
+  const std::string& root = fileindex::GetFileIndexRoot();
+  for (const char* const folder : {"etc/kavo", "tmp", "var/run", "var/lib/kavo/fileindex/queue",
+                                   "var/lib/kavo/fileindex/db", "var/packages/Vexlo/etc"}) {
+    if (!root.empty()) {
+      std::filesystem::create_directories(root + "/" + folder);
+    }
+  }
+}
+
+ExitStatus Up(const Arguments& arguments, const Console& console) {
+  for (const std::string& folder : arguments.positional) {
+    if (!IsDirExist(RealPath(folder), /*follow_link=*/false)) {
+      throw Failure("'" + ForTerminal(folder) + "' is no folder");
+    }
+  }
+  MakeRootFolders();
+  StopSignals signals;
+  Voice voice(console, arguments.Has("--json"));
+  Stack stack([&voice](const std::string& sentence) { voice.Say("daemon", sentence); });
+  if (!stack.Start([&signals] { return signals.Await(std::chrono::milliseconds(0)); })) {
+    return kDone;
+  }
+  std::vector<std::string> folders = AddFolders(arguments.positional, voice, console);
+  if (folders.empty()) {
+    const fileindex::FolderMgr configured;
+    for (const auto& folder : configured.GetFolders()) {
+      folders.push_back(folder->GetFullPath());
+    }
+  }
+  if (folders.empty()) {
+    throw Failure("no folder is indexed; name one: fileindex up DIR");
+  }
+  if (!AwaitFirstCrawl(folders, signals, stack, voice)) {
+    return kDone;
+  }
+  Json::Value fields;
+  fields["call"] = OwnCall() + " search WORD...";
+  voice.Say("search", "search with: " + fields["call"].asString(), fields);
+  voice.Say("following", "following changes; Ctrl-C ends it");
+  std::map<std::string, uint64_t> operations;
+  const Json::Value shares_now = AskShares();
+  for (const Json::Value& share : shares_now) {
+    operations[share["share"].asString()] = share["operations"].asUInt64();
+  }
+  while (!signals.Await(kFollowInterval)) {
+    stack.Tend();
+    SayWhatIsNew(AskShares(), operations, voice);
+  }
+  voice.Say("stopping", "stopping");
+  stack.Stop();
+  return kDone;
+}
+
+}  // namespace
+
+std::vector<Command> UpCommands() {
+  return {
+      {"up",
+       "[DIR...]",
+       "starts everything, indexes folders and follows their changes until Ctrl-C",
+       "Starts the daemons that do not run yet, adds the folders (a folder that no share holds is\n"
+       "made a share), shows how far the first crawl is, and says so when everything can be "
+       "found.\n"
+       "Then it goes on following changes. Without DIR it goes on with the folders that are\n"
+       "indexed. Ctrl-C stops what it started within five seconds; the index stays. What the\n"
+       "daemons say is in var/log/fileindex below the root.\n"
+       "\n"
+       "  fileindex up ~/Documents\n",
+       {{"--json", nullptr, "one JSON object a line: event, text, and what belongs to it"}},
+       {},
+       0,
+       1000,
+       Up},
+  };
+}
+
+}  // namespace vexlo::cli

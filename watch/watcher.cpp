@@ -148,8 +148,7 @@ Watcher::Watcher(const std::vector<std::string>& roots, WatchOptions options, Si
     }
   }
   for (Root& root : roots_) {
-    root.covered = std::any_of(roots_.begin(), roots_.end(),
-                               [&](const Root& other) { return Covers(other.path, root.path); });
+    root.covered = IsCovered(root.path);
     if (!root.covered) {
       Walk({{kNoFolder, root.path, true}}, {});
       root.folder = tree_.Find(kNoFolder, root.path);
@@ -732,22 +731,29 @@ bool Watcher::Covers(const std::string& root, const std::string& path) const {
       [&](const std::string& name) { return way.find("/" + name + "/") != std::string::npos; });
 }
 
-// Neither above nor below a root, nor one itself.
-bool Watcher::IsApart(const std::string& path) const {
-  return std::none_of(roots_.begin(), roots_.end(), [&](const Root& root) {
-    return root.path == path || IsBelow(root.path, path) || IsBelow(path, root.path);
-  });
+bool Watcher::IsCovered(const std::string& path) const {
+  return std::any_of(roots_.begin(), roots_.end(),
+                     [&](const Root& root) { return Covers(root.path, path); });
+}
+
+bool Watcher::CoversARoot(const std::string& path) const {
+  return std::any_of(roots_.begin(), roots_.end(),
+                     [&](const Root& root) { return Covers(path, root.path); });
 }
 
 bool Watcher::AddRoot(const std::string& path, TimePoint now) {
   CheckPath(path);
-  if (!IsApart(path)) {
+  const bool known = std::any_of(roots_.begin(), roots_.end(),
+                                 [&](const Root& root) { return root.path == path; });
+  if (known || CoversARoot(path)) {
     return false;
   }
   now_ = now;
-  roots_.push_back({path});
-  Walk({{kNoFolder, path, true}}, {});
-  roots_.back().folder = tree_.Find(kNoFolder, path);
+  roots_.push_back({path, kNoFolder, IsCovered(path)});
+  if (!roots_.back().covered) {
+    Walk({{kNoFolder, path, true}}, {});
+    roots_.back().folder = tree_.Find(kNoFolder, path);
+  }
   LogChangedState();
   return true;
 }
@@ -755,17 +761,13 @@ bool Watcher::AddRoot(const std::string& path, TimePoint now) {
 bool Watcher::RemoveRoot(const std::string& path) {
   const auto found = std::find_if(roots_.begin(), roots_.end(),
                                   [&](const Root& root) { return root.path == path; });
-  if (found == roots_.end()) {
+  if (found == roots_.end() || (!found->covered && CoversARoot(path))) {
     return false;
   }
-  const Root root = *found;
+  const FolderId folder = found->folder;
   roots_.erase(found);
-  if (!IsApart(path)) {
-    roots_.push_back(root);
-    return false;
-  }
-  if (root.folder != kNoFolder) {
-    Drop(root.folder);
+  if (folder != kNoFolder) {
+    Drop(folder);
   }
   LogChangedState();
   return true;

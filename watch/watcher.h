@@ -97,8 +97,8 @@ class Watcher {
   TimePoint NextDeadline() const;
 
   // Watches one more root, or one less, and nothing is missed of the others meanwhile. False, and
-  // nothing has changed, for one that is there already or is not there, and where one of two roots
-  // is below the other. AddRoot() blocks and throws as the constructor does.
+  // nothing has changed, for one that is there already or is not there, and for one that has others
+  // below it. AddRoot() blocks and throws as the constructor does.
   bool AddRoot(const std::string& path, TimePoint now);
   bool RemoveRoot(const std::string& path);
 
@@ -164,8 +164,9 @@ class Watcher {
   void CheckRoots();
   void CheckMounts();
   void CheckPath(const std::string& path) const;
-  bool IsApart(const std::string& path) const;
   bool Covers(const std::string& root, const std::string& path) const;
+  bool IsCovered(const std::string& path) const;
+  bool CoversARoot(const std::string& path) const;
   bool IsAtRest() const;
   void Rescan();
   void LogChangedState();

@@ -43,9 +43,8 @@ struct QueueStats {
 //   told whatever it wants. Where it wants no renames, a rename is a delete and a create.
 // - Folders with the same list of ignored names share a Watcher. Where folders with different lists
 //   lie one in the other, each path is told of by the Watcher of the innermost one.
-// - A change of the registration
-//   leaves alone what it does not touch; only folders that are added above or below others make
-//   their Watcher start anew, and then each of its folders gets a reindex.
+// - A change of the registration leaves alone what it does not touch; only a folder that comes or
+//   goes above others makes their Watcher start anew, and then each of its folders gets a reindex.
 // - Lines that cannot be appended wait, and are tried again after 10 ms, then ever later, up to a
 //   second.
 //

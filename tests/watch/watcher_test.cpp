@@ -188,6 +188,7 @@ TEST_F(WatcherTest, RootsComeAndGoWithoutAGapForTheOthers) {
   Do("mkdir a/d; mkdir b/bin b/@eaDir");
   EXPECT_TRUE(watcher_->AddRoot(in_ + "/b", now_));
   EXPECT_TRUE(watcher_->AddRoot(in_ + "/later", now_));
+  EXPECT_TRUE(watcher_->AddRoot(in_ + "/b/c", now_)) << "told of by the one above";
   for (const char* const path : {"/b", "/b/c", ""}) {
     EXPECT_FALSE(watcher_->AddRoot(in_ + path, now_)) << path;
   }
@@ -200,6 +201,8 @@ TEST_F(WatcherTest, RootsComeAndGoWithoutAGapForTheOthers) {
             "b/@eaDir/f");
   EXPECT_TRUE(watcher_->RemoveRoot(in_ + "/a"));
   EXPECT_FALSE(watcher_->RemoveRoot(in_ + "/a"));
+  EXPECT_FALSE(watcher_->RemoveRoot(in_ + "/b")) << "the one below would go with it";
+  EXPECT_TRUE(watcher_->RemoveRoot(in_ + "/b/c"));
   Do("> a/g; > b/g");
   EXPECT_EQ(Text(Take()), "create b/g, write b/g");
 }

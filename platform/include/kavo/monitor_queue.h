@@ -8,6 +8,7 @@
 
 #include <string>
 
+// NOLINTNEXTLINE(readability-identifier-naming): callers know it by this name.
 namespace EVNOTIFYD {
 
 // Stored in registrations: never renumber.

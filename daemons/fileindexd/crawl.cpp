@@ -11,10 +11,10 @@ using Clock = std::chrono::steady_clock;
 
 constexpr unsigned kPage = 2000;
 constexpr size_t kMostGone = 10000;
-// From one committed point to the next: whichever comes first.
-constexpr unsigned kCheckpointFiles = 4000;
-constexpr std::chrono::seconds kCheckpointTime{5};
+constexpr unsigned kCommitStep = 4000;
+constexpr std::chrono::seconds kCheckpointTime{2};
 constexpr unsigned kProgressStep = 256;
+constexpr unsigned kClockStep = 16;
 
 // One pass over the folder.
 class Pass {
@@ -76,15 +76,14 @@ class Pass {
     if (++done_ % kProgressStep == 0) {
       deeds_.progress(done_, /*is_end=*/false);
     }
-    // The clock is asked now and then only.
-    const bool is_due = ++since_ >= kCheckpointFiles ||
-                        (since_ % 16 == 0 && Clock::now() - last_ >= kCheckpointTime);
-    if (is_due) {
+    const bool is_due = done_ % kClockStep == 0 && Clock::now() - saved_ >= kCheckpointTime;
+    if (is_due || done_ % kCommitStep == 0) {
       deeds_.commit();
+    }
+    if (is_due) {
       point_.after = path;
       deeds_.save(point_);
-      since_ = 0;
-      last_ = Clock::now();
+      saved_ = Clock::now();
     }
   }
 
@@ -96,8 +95,7 @@ class Pass {
   GoneList gone_;
   bool has_overflowed_ = false;
   uint64_t done_ = 0;
-  unsigned since_ = 0;
-  Clock::time_point last_ = Clock::now();
+  Clock::time_point saved_ = Clock::now();
 };
 
 }  // namespace

@@ -178,10 +178,7 @@ void Cycle::UpdateAttributes(const std::string& path) {
   }
   Json::Value requests(Json::arrayValue);
   requests.append(MakeAttributes(id_, path, *now));
-  has_sent_ = true;
-  for (const FailedItem& failed : SendList(std::move(requests))) {
-    throw Error(static_cast<ErrorCode>(failed.code), failed.reason);
-  }
+  SendCounted(std::move(requests));
 }
 
 void Cycle::Rename(const std::string& path, const std::string& path_old) {
@@ -200,14 +197,15 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
   facts.document_inode = document ? InodeOf(document->stamp) : std::nullopt;
   facts.old_inode = InodeOf(StampOfPath(path_old, /*content=*/false));
   facts.new_inode = InodeOf(now);
-  const RenameStep step = PlanRename(facts);
+  RenameStep step = PlanRename(facts);
   // What was handed over before this may be of what came after it: see touched_.
   const bool is_mixed = WasTouched(path) || WasTouched(path_old);
   ForgetTaken(path);
   ForgetTaken(path_old);
+  if (step == RenameStep::kMove && !Move(path, path_old)) {
+    step = RenameStep::kReconcile;
+  }
   if (step == RenameStep::kMove) {
-    has_sent_ = true;
-    elastic::IndexRename(share_, path, path_old);
     if (now) {
       FinishMove(path, document->stamp, *now);
       // What lies below keeps what it was indexed with, unless other settings hold now.
@@ -227,6 +225,21 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
   }
 }
 
+// False when the engine refuses these documents.
+bool Cycle::Move(const std::string& path, const std::string& path_old) {
+  has_sent_ = true;
+  try {
+    elastic::IndexRename(share_, path, path_old);
+    return true;
+  } catch (const Error& error) {
+    if (OfOperation(error.GetErrorCode()) != Consequence::kGoOn) {
+      throw;
+    }
+    Count(error.GetErrorCode(), error.what(), path);
+    return false;
+  }
+}
+
 // The renamed object's own document: its dates are new, and its type may be.
 void Cycle::FinishMove(const std::string& path, const std::optional<Stamp>& before,
                        const Stamp& now) {
@@ -236,7 +249,7 @@ void Cycle::FinishMove(const std::string& path, const std::optional<Stamp>& befo
   }
   Json::Value requests(Json::arrayValue);
   requests.append(MakeAttributes(id_, path, now));
-  SendList(std::move(requests));
+  SendCounted(std::move(requests));
 }
 
 // Where documents may stand at each other's paths. Files that were made in the same tick have the
@@ -409,16 +422,19 @@ bool Cycle::WasTouched(const std::string& path) const {
 }
 
 void Cycle::FlushDeletes() {
-  if (deletes_.empty()) {
-    return;
+  if (!deletes_.empty()) {
+    SendCounted(std::exchange(deletes_, Json::Value(Json::arrayValue)));
   }
+}
+
+void Cycle::SendCounted(Json::Value requests) {
   has_sent_ = true;
-  for (const FailedItem& failed :
-       SendList(std::exchange(deletes_, Json::Value(Json::arrayValue)))) {
+  for (const FailedItem& failed : SendList(requests)) {
     if (OfOperation(failed.code) != Consequence::kGoOn) {
       throw Error(static_cast<ErrorCode>(failed.code), failed.reason);
     }
-    Count(failed.code, failed.reason, "");
+    const Json::Value& path = requests[static_cast<Json::ArrayIndex>(failed.at)]["data"]["doc_id"];
+    Count(failed.code, failed.reason, path.isString() ? path.asString() : "");
   }
 }
 

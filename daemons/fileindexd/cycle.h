@@ -50,6 +50,7 @@ class Cycle {
   void Upsert(const std::string& path);
   void UpdateAttributes(const std::string& path);
   void Rename(const std::string& path, const std::string& path_old);
+  bool Move(const std::string& path, const std::string& path_old);
   void FinishMove(const std::string& path, const std::optional<Stamp>& before, const Stamp& now);
 
   // Compares what is at and below the path with the index. `types` names the types of files that
@@ -67,6 +68,8 @@ class Cycle {
   void NoteTouched(const std::string& path);
   bool WasTouched(const std::string& path) const;
   void FlushDeletes();
+  // Sends them as one; what fails alone is counted.
+  void SendCounted(Json::Value requests);
   // Returns when the engine has everything that was taken.
   void Settle();
   void Commit();

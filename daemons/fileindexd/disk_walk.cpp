@@ -56,6 +56,7 @@ DiskWalk::DiskWalk(const std::string& root, std::string after, WalkRules rules, 
   above.device = info.st_dev;
   above.keys = {Basename(root), Basename(root) + "/"};
   above.is_complete = true;
+  above.is_above_root = true;
   frames_.push_back(std::move(above));
 }
 
@@ -103,7 +104,8 @@ std::optional<DiskEntry> DiskWalk::Look(Frame& frame, const std::string& name) {
     if (!MayEnter(frame, name, entry.path)) {
       return std::nullopt;
     }
-  } else if (entry.info.st_dev != frame.device && !rules_.allows(entry.path)) {
+  } else if ((frame.is_above_root || entry.info.st_dev != frame.device) &&
+             !rules_.allows(entry.path)) {
     return std::nullopt;
   }
   return frame.is_covered || rules_.covers(entry.path) ? std::optional(std::move(entry))

@@ -27,7 +27,8 @@ struct WalkRules {
   using Question = std::function<bool(const std::string& path)>;
   Question covers;  // Whether it belongs to the index at all, with everything below it.
   Question leads;   // Whether something below it is covered.
-  Question allows;  // Whether the policy lets it in. Asked for folders, and for what is mounted.
+  // Whether the policy lets it in. Asked for the root, for folders, and for what is mounted.
+  Question allows;
 };
 
 // The order is that of full paths as bytes: "a", "a.txt", "a/b". A folder's own path so stands
@@ -59,6 +60,7 @@ class DiskWalk {
     daemon::UniqueFd fd;
     dev_t device = 0;
     bool is_covered = false;
+    bool is_above_root = false;
     // Names in order; one with "/" behind it stands for what is below.
     std::vector<std::string> keys;
     size_t next = 0;

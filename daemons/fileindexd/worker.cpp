@@ -77,7 +77,7 @@ std::optional<long> Pause::End() const {
   return IsOn() && resume_time != 0 ? std::optional(resume_time) : std::nullopt;
 }
 
-Worker::Worker(std::string share, const Pause& pause, std::chrono::milliseconds coalescing)
+Worker::Worker(std::string share, Pause& pause, std::chrono::milliseconds coalescing)
     : share_(std::move(share)),
       pause_(pause),
       coalescing_(coalescing),
@@ -138,7 +138,7 @@ Worker::Outcome Worker::RunGuarded() {
   try {
     return RunCycle();
   } catch (const Interrupted&) {
-    return pause_.IsOn() ? Outcome::kPaused : Outcome::kDone;
+    return pause_.IsOn() ? Outcome::kPaused : Outcome::kAgain;
   } catch (const Error& error) {
     return Judge(error.GetErrorCode(), error.what());
   } catch (const std::exception& error) {
@@ -154,6 +154,7 @@ Worker::Outcome Worker::RunCycle() {
     queue_path_ = queue_path;
   }
   watch_.Watch(queue_path);
+  pause_.Reload();
   if (pause_.IsOn()) {
     return Outcome::kPaused;
   }
@@ -165,6 +166,7 @@ Worker::Outcome Worker::RunCycle() {
   stats_.SetState(WorkerState::kProcessing);
   const bool fills = MakeIndexIfAsked();
   fileindex::QueueMgr queue(queue_path);
+  const bool was_left = IsFileExist(queue_path + ".tmp");
   queue.PrepareTmpQueue();
   Cycle cycle(share_, share.GetPath(), SnapshotName(queue_path + ".tmp"), state_, stats_,
               [this] { return IsInterrupted(); });
@@ -184,7 +186,8 @@ Worker::Outcome Worker::RunCycle() {
   queue.DeleteTmp();  // Also where its lines came down to nothing.
   wait_ = std::chrono::seconds(0);
   space_is_told_ = false;
-  return Outcome::kDone;
+  // Behind a snapshot that was there before, lines may wait of which nobody will tell any more.
+  return was_left ? Outcome::kAgain : Outcome::kDone;
 }
 
 // Whether everything is to be compared, in an index that may be new.

@@ -44,7 +44,7 @@ class Worker {
  public:
   // Starts the thread. `pause` outlives the worker; a cycle begins `coalescing` after the first new
   // line.
-  Worker(std::string share, const Pause& pause, std::chrono::milliseconds coalescing);
+  Worker(std::string share, Pause& pause, std::chrono::milliseconds coalescing);
   // Stops it, and waits for what is under way.
   ~Worker();
   Worker(const Worker&) = delete;
@@ -76,7 +76,7 @@ class Worker {
   bool HasSpace() const;
 
   const std::string share_;
-  const Pause& pause_;
+  Pause& pause_;
   const std::chrono::milliseconds coalescing_;
   std::atomic<bool> stopping_ = false;
   std::atomic<bool> kicked_ = false;

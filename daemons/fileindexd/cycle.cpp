@@ -118,7 +118,12 @@ void Cycle::Carry(const fileindex::OP& op, const std::string& path) {
 void Cycle::CarryKnown(const fileindex::OP& op, const std::string& path) {
   switch (op.op) {
     case fileindex::OP_DELETE:
-      Delete(path);
+      // A folder that is made at once where something was deleted leaves the delete alone.
+      if (IsGone(path) || !IsWanted(path)) {
+        Delete(path);
+      } else {
+        ReconcileMixed(path);
+      }
       break;
     case fileindex::OP_UPSERT:
       Upsert(path);

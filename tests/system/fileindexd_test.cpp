@@ -324,6 +324,25 @@ TEST_F(Fileindexd, CarriesOutEachOperation) {
        {".", "moved", "moved/b.txt", "hard", "new.txt", "late"},
        "outside",
        {}},
+      {"FolderInTheFilesPlace",
+       [&] {
+         fs::remove(In("late"));
+         Write("late/inside.txt", "deep");
+       },
+       {Line(EV_DELETE, In("late")), Line(EV_CREATE, In("late"), "", true)},
+       {".", "moved", "moved/b.txt", "hard", "new.txt", "late", "late/inside.txt"},
+       "deep",
+       {"late/inside.txt"}},
+      {"FileInTheFoldersPlace",
+       [&] {
+         fs::remove_all(In("late"));
+         Write("late", "flat");
+       },
+       {Line(EV_DELETE, In("late"), "", true), Line(EV_CREATE, In("late")),
+        Line(EV_CLOSE_WRITE, In("late"))},
+       {".", "moved", "moved/b.txt", "hard", "new.txt", "late"},
+       "deep",
+       {}},
       {"ReindexFindsWhatNobodyTold",
        [&] {
          ReplaceWithDates(In("new.txt"), "other");

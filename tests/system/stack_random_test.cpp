@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "kavo/monitor_queue.h"
 #include "support/index_listing.h"
 #include "support/random_tree.h"
 #include "support/stack.h"
@@ -49,6 +50,21 @@ void Empty(const std::string& folder) {
   }
 }
 
+// Another queue that is fed with all that happens, and that nobody takes.
+std::string HistoryFile() { return kRoot / "logs/history"; }
+void RecordHistory(const Stack& stack) {
+  Json::Value description;
+  description["queue"] = HistoryFile();
+  Json::Value folder;
+  folder["path"] = stack.In();
+  folder["mask"] = 0xFFCC;
+  folder["ignore"].append("@eaDir");
+  description["config"].append(folder);
+  WriteText(HistoryFile(), "");
+  ASSERT_TRUE(EVNOTIFYD::MonitorQueue::Upsert(EVNOTIFYD::MonitorQueue(description), "history",
+                                              EVNOTIFYD::MONITOR_QUEUE_TYPE_APPLICATION));
+}
+
 // Waits until there is nothing left to do, and then for the index to be what the disk is.
 void ExpectIndexed(Stack& stack, const RandomTree& tree) {
   EXPECT_TRUE(stack.AwaitQuiet()) << tree.Text();
@@ -58,15 +74,17 @@ void ExpectIndexed(Stack& stack, const RandomTree& tree) {
     return differences.empty();
   };
   EXPECT_TRUE(Stack::Await(is_same, std::chrono::seconds(20)))
-      << differences << tree.Text() << stack.Logs();
+      << differences << tree.Text() << ReadText(HistoryFile()) << stack.Logs();
 }
 
 TEST(Stack, FollowsRandomChanges) {
   Stack stack(kRoot);
+  RecordHistory(stack);
   ForSeeds([&](unsigned seed) {
     SCOPED_TRACE("seed " + std::to_string(seed));
     Empty(stack.In());
     Empty(stack.Out());
+    std::filesystem::resize_file(HistoryFile(), 0);
     RandomTree tree(stack.In(), stack.Out(), seed);
     // From all at once to each in another cycle.
     const unsigned longest_pause = tree.Below(3) * 5000;
@@ -80,12 +98,14 @@ TEST(Stack, FollowsRandomChanges) {
 
 TEST(Stack, LosesNothingToKills) {
   Stack stack(kRoot);
+  RecordHistory(stack);
   const std::vector<std::string> names = {"kavoelasticd", "kavocontentextractd", "fileindexd",
                                           "evnotifyd"};
   ForSeeds([&](unsigned seed) {
     SCOPED_TRACE("seed " + std::to_string(seed));
     Empty(stack.In());
     Empty(stack.Out());
+    std::filesystem::resize_file(HistoryFile(), 0);
     RandomTree tree(stack.In(), stack.Out(), seed);
     for (int i = 0; i < kChanges; ++i) {
       tree.Change();

@@ -165,6 +165,8 @@ Worker::Outcome Worker::RunCycle() {
   stats_.SetState(WorkerState::kProcessing);
   const bool fills = MakeIndexIfAsked();
   fileindex::QueueMgr queue(queue_path);
+  // Lines that came before the queue was watched wait behind it.
+  const bool was_left = IsFileExist(queue_path + ".tmp");
   queue.PrepareTmpQueue();
   Cycle cycle(share_, share.GetPath(), SnapshotName(queue_path + ".tmp"), state_, stats_,
               [this] { return IsInterrupted(); });
@@ -184,7 +186,7 @@ Worker::Outcome Worker::RunCycle() {
   queue.DeleteTmp();  // Also where its lines came down to nothing.
   wait_ = std::chrono::seconds(0);
   space_is_told_ = false;
-  return Outcome::kDone;
+  return was_left ? Outcome::kAgain : Outcome::kDone;
 }
 
 // Whether everything is to be compared, in an index that may be new.

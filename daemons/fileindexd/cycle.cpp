@@ -118,7 +118,13 @@ void Cycle::Carry(const fileindex::OP& op, const std::string& path) {
 void Cycle::CarryKnown(const fileindex::OP& op, const std::string& path) {
   switch (op.op) {
     case fileindex::OP_DELETE:
-      Delete(path);
+      // A folder that is made at once where something was deleted leaves the delete alone.
+      if (IsGone(path) || !IsWanted(path)) {
+        ForgetMissed(path);
+        Delete(path);
+      } else {
+        ReconcileMixed(path);
+      }
       break;
     case fileindex::OP_UPSERT:
       Upsert(path);
@@ -151,9 +157,16 @@ void Cycle::Delete(const std::string& path) {
   }
 }
 
+void Cycle::DeleteUnwanted(const std::string& path) {
+  if (scope_.Covers(path) && IsGone(path)) {
+    NoteMissed(path);
+  }
+  Delete(path);
+}
+
 void Cycle::Upsert(const std::string& path) {
   if (!IsWanted(path)) {
-    Delete(path);
+    DeleteUnwanted(path);
     return;
   }
   FlushDeletes();
@@ -162,7 +175,7 @@ void Cycle::Upsert(const std::string& path) {
 
 void Cycle::UpdateAttributes(const std::string& path) {
   if (!IsWanted(path)) {
-    Delete(path);
+    DeleteUnwanted(path);
     return;
   }
   Settle();
@@ -199,7 +212,9 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
   facts.new_inode = InodeOf(now);
   RenameStep step = PlanRename(facts);
   // What was handed over before this may be of what came after it: see touched_.
-  const bool is_mixed = WasTouched(path) || WasTouched(path_old);
+  const bool has_missed = state_.missed.HaveBelow(path_old);
+  const bool is_mixed = has_missed || WasTouched(path) || WasTouched(path_old);
+  ForgetMissed(path_old);
   ForgetTaken(path);
   ForgetTaken(path_old);
   if (step == RenameStep::kMove && !Move(path, path_old)) {
@@ -212,6 +227,8 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
       if (is_mixed || !scope_.HaveSameSettings(path, path_old)) {
         ReconcileMixed(path);
       }
+    } else if (has_missed) {
+      NoteMissed(path);  // It was renamed on.
     }
   } else if (step == RenameStep::kReconcile) {
     ReconcileMixed(path);
@@ -288,6 +305,13 @@ void Cycle::ReconcileNewFolders() {
 void Cycle::Reconcile(const std::string& root, const Json::Value& types, const char* cause) {
   Settle();
   scope_.CheckShare();
+  const std::vector<std::string>& folders = scope_.Folders();
+  if (std::all_of(folders.begin(), folders.end(),
+                  [&](const std::string& folder) { return IsSameOrBelow(folder, root); })) {
+    state_.missed.Clear();
+    state_changed_ = true;
+  }
+  ForgetMissed(root);
   stats_.SetState(WorkerState::kCrawling);
   CrawlPoint point;
   point.root = root;
@@ -347,6 +371,9 @@ void Cycle::Remove(const std::vector<GoneList::Gone>& gone) {
   scope_.CheckShare();
   for (const auto& [path, with_all_below] : gone) {
     const bool is_gone = IsGone(path);
+    if (is_gone) {
+      NoteMissed(path);
+    }
     if (is_gone && with_all_below) {
       Delete(path);
     } else if (is_gone || !IsWanted(path)) {
@@ -392,6 +419,18 @@ void Cycle::Submit(const std::string& path) {
     taken_[path] = *now;
   }
   indexer_.Upsert(path, content);
+}
+
+void Cycle::NoteMissed(const std::string& path) {
+  state_.missed.Note(path);
+  state_changed_ = true;
+}
+
+void Cycle::ForgetMissed(const std::string& path) {
+  if (state_.missed.HaveBelow(path)) {
+    state_.missed.Forget(path);
+    state_changed_ = true;
+  }
 }
 
 void Cycle::ForgetTaken(const std::string& path) {
@@ -454,6 +493,9 @@ void Cycle::Commit() {
 
 void Cycle::Finish() {
   Commit();
+  for (const std::string& path : indexer_.TakeGone()) {
+    NoteMissed(path);
+  }
   if (state_changed_) {
     SaveShareState(ShareStateFile(share_), state_);
     state_changed_ = false;

@@ -64,6 +64,10 @@ class Cycle {
   // Whether the path belongs into the index. One that does not exist does not.
   bool IsWanted(const std::string& path) const;
   void Submit(const std::string& path);
+  // An upsert's or an attribute update's path that is not there.
+  void DeleteUnwanted(const std::string& path);
+  void NoteMissed(const std::string& path);
+  void ForgetMissed(const std::string& path);
   void ForgetTaken(const std::string& path);
   void NoteTouched(const std::string& path);
   bool WasTouched(const std::string& path) const;

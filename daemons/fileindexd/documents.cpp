@@ -20,6 +20,8 @@ namespace {
 
 namespace field = fileindex::elastic::field;
 
+constexpr char kDelete[] = "document_del_by_id";
+
 Json::Value MakeItem(const char* command, const std::string& id, const std::string& path) {
   Json::Value item;
   item["command"] = command;
@@ -104,16 +106,21 @@ Json::Value MakePut(const std::string& id, const std::string& path, bool content
   // The stamp first: a change while the file is read makes the document look old, never new.
   const std::optional<Stamp> stamp = StampOfPath(path, content);
   Json::Value fields;
-  if (!stamp || (!Parse(path, content, &fields) && !(content && Parse(path, false, &fields)))) {
-    VEXLO_CHECK(stamp && !IsGone(path), ERR_PARSE_FILE, "Parse failed, path=" + path);
-    return MakeItem("document_del_by_id", id, path);
+  const bool is_parsed = stamp && (Parse(path, content, &fields) ||
+                                   (content && Parse(path, /*content=*/false, &fields)));
+  // Of a file that went while it was read there is a part at best.
+  if (!stamp || IsGone(path)) {
+    return MakeItem(kDelete, id, path);
   }
+  VEXLO_CHECK(!is_parsed, ERR_PARSE_FILE, "Parse failed, path=" + path);
   AddCopies(&fields);
   fields[kStampField] = ToJson(*stamp);
   Json::Value item = MakeItem("document_upsert_by_id", id, path);
   item["data"]["data"] = std::move(fields);
   return item;
 }
+
+bool IsDelete(const Json::Value& item) { return item["command"] == kDelete; }
 
 Json::Value MakeAttributes(const std::string& id, const std::string& path, const Stamp& stamp) {
   Json::Value fields;

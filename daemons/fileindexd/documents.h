@@ -34,6 +34,9 @@ std::vector<IndexedPath> ListBelow(const std::string& id, const std::string& fol
 // what the file system tells. Throws Error 914 when that cannot be told either.
 Json::Value MakePut(const std::string& id, const std::string& path, bool content);
 
+// Whether MakePut() found nothing there.
+bool IsDelete(const Json::Value& item);
+
 // The request that updates what can be told without reading the content; `stamp` goes with it.
 Json::Value MakeAttributes(const std::string& id, const std::string& path, const Stamp& stamp);
 

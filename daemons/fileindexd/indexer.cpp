@@ -97,6 +97,11 @@ size_t Indexer::InWork() {
   return in_work_.size();
 }
 
+std::vector<std::string> Indexer::TakeGone() {
+  const std::lock_guard lock(mutex_);
+  return std::exchange(gone_, {});
+}
+
 bool Indexer::TakeWasUsed() {
   const std::lock_guard lock(mutex_);
   return std::exchange(was_used_, false);
@@ -166,6 +171,10 @@ void Indexer::Extract(const Job& job, Batch* batch) {
   batch->paths.push_back(job.path);
   try {
     Json::Value item = MakePut(id_, job.path, job.content);
+    if (IsDelete(item)) {
+      const std::lock_guard lock(mutex_);
+      gone_.push_back(job.path);
+    }
     batch->bytes += TextBytes(item);
     batch->requests.append(std::move(item));
   } catch (const Error& error) {

@@ -48,6 +48,9 @@ class Indexer {
   // Paths that were taken and not answered yet.
   size_t InWork();
 
+  // Paths that were gone when their turn came, since the last call.
+  std::vector<std::string> TakeGone();
+
   // Whether anything was taken since the last call.
   bool TakeWasUsed();
 
@@ -77,6 +80,7 @@ class Indexer {
   std::deque<Job> waiting_;
   std::unordered_set<std::string> in_work_;  // Taken and not answered, those that wait among them.
   std::exception_ptr failure_;
+  std::vector<std::string> gone_;
   bool was_used_ = false;
   bool ending_ = false;
 

@@ -21,6 +21,11 @@ ShareState FromJson(const Json::Value& value) {
   const std::vector<std::string> crawled = JsonArr2Vec<std::string>(value["crawled"]);
   state.crawled.insert(crawled.begin(), crawled.end());
   GetJsonValue(state.rebuilt, value, "rebuilt", /*required=*/false);
+  if (value.isMember("missed")) {
+    for (const std::string& path : JsonArr2Vec<std::string>(value["missed"])) {
+      state.missed.Note(path);
+    }
+  }
   if (const Json::Value& crawl = value["crawl"]; !crawl.isNull()) {
     CrawlPoint& point = state.crawl.emplace();
     GetJsonValue(point.root, crawl, "root", /*required=*/true);
@@ -56,6 +61,9 @@ void SaveShareState(const std::string& file, const ShareState& state) {
   Json::Value value(Json::objectValue);
   value["crawled"] = Vec2JsonArr<std::string>({state.crawled.begin(), state.crawled.end()});
   value["rebuilt"] = state.rebuilt;
+  if (const std::set<std::string>& missed = state.missed.Paths(); !missed.empty()) {
+    value["missed"] = Vec2JsonArr<std::string>({missed.begin(), missed.end()});
+  }
   if (state.crawl) {
     Json::Value& crawl = value["crawl"];
     crawl["root"] = state.crawl->root;

@@ -7,6 +7,8 @@
 #include <set>
 #include <string>
 
+#include "daemons/fileindexd/missed_paths.h"
+
 namespace vexlo::fileindexd {
 
 // A crawl that was begun. The index holds what it found up to `after`, committed.
@@ -25,6 +27,7 @@ struct ShareState {
   std::optional<CrawlPoint> crawl;
   // The index was made anew as the status file asked for, and is still to be filled.
   bool rebuilt = false;
+  MissedPaths missed;
 
   bool operator==(const ShareState&) const = default;
 };

@@ -332,6 +332,25 @@ TEST_F(Fileindexd, CarriesOutEachOperation) {
        {".", "moved", "moved/b.txt", "hard", "new.txt", "late"},
        "outside",
        {}},
+      {"FolderInTheFilesPlace",
+       [&] {
+         fs::remove(In("late"));
+         Write("late/inside.txt", "deep");
+       },
+       {Line(EV_DELETE, In("late")), Line(EV_CREATE, In("late"), "", true)},
+       {".", "moved", "moved/b.txt", "hard", "new.txt", "late", "late/inside.txt"},
+       "deep",
+       {"late/inside.txt"}},
+      {"FileInTheFoldersPlace",
+       [&] {
+         fs::remove_all(In("late"));
+         Write("late", "flat");
+       },
+       {Line(EV_DELETE, In("late"), "", true), Line(EV_CREATE, In("late")),
+        Line(EV_CLOSE_WRITE, In("late"))},
+       {".", "moved", "moved/b.txt", "hard", "new.txt", "late"},
+       "deep",
+       {}},
       {"ReindexFindsWhatNobodyTold",
        [&] {
          ReplaceWithDates(In("new.txt"), "other");
@@ -366,6 +385,22 @@ TEST_F(Fileindexd, CarriesOutEachOperation) {
        {".", "moved", "moved/b.txt", "moved/late", "new.txt", "after", "sane"},
        "sane",
        {"sane"}},
+      // By the time of the upsert the file has another path, of which the queue tells later.
+      {"WriteInAFolderThatIsRenamedMeanwhile",
+       [&] {
+         Write("moved/missed.txt", "elusive");
+         fs::rename(In("moved"), In("away"));
+       },
+       {Line(EV_CREATE, In("moved/missed.txt")), Line(EV_CLOSE_WRITE, In("moved/missed.txt"))},
+       {".", "moved", "moved/b.txt", "moved/late", "new.txt", "after", "sane"},
+       "elusive",
+       {}},
+      {"RenameOfAFolderThatWasMissedIn",
+       [&] {},
+       {Line(EV_RENAME, In("away"), In("moved"), true)},
+       {".", "away", "away/b.txt", "away/late", "away/missed.txt", "new.txt", "after", "sane"},
+       "elusive",
+       {"away/missed.txt"}},
   };
   for (const auto& step : steps) {
     SCOPED_TRACE(step.name);

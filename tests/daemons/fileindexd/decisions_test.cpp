@@ -2,6 +2,8 @@
 #include <gtest/gtest.h>
 
 #include <functional>
+#include <map>
+#include <set>
 
 #include "common/json.h"
 #include "daemons/fileindexd/consequence.h"
@@ -14,6 +16,7 @@
 namespace {
 
 using vexlo::fileindexd::Consequence;
+using vexlo::fileindexd::MissedPaths;
 using vexlo::fileindexd::RenameFacts;
 using vexlo::fileindexd::RenameStep;
 using vexlo::fileindexd::ShareState;
@@ -132,6 +135,31 @@ TEST(Decisions, WhatIsNoStampIsNone) {
   }
 }
 
+TEST(MissedPaths, AreKnownBelowWhatIsRenamedUntilTheyAreTooMany) {
+  MissedPaths missed;
+  missed.Note("/v/a/b");
+  missed.Note("/v/a.b");
+  for (const auto& [path, want] : std::map<std::string, bool>{{"/v", true},
+                                                              {"/v/a", true},
+                                                              {"/v/a/b", true},
+                                                              {"/v/a/b/c", false},
+                                                              {"/v/a/", false},
+                                                              {"/v/a.", false},
+                                                              {"/v/a.b", true}}) {
+    EXPECT_EQ(missed.HaveBelow(path), want) << path;
+  }
+  missed.Forget("/v/a");
+  EXPECT_EQ(missed.Paths(), std::set<std::string>{"/v/a.b"});
+  for (int i = 0; i < 10000; ++i) {
+    missed.Note("/v/" + std::to_string(i));
+  }
+  EXPECT_TRUE(missed.HaveBelow("/elsewhere"));
+  missed.Forget("/elsewhere");
+  EXPECT_TRUE(missed.HaveBelow("/elsewhere"));
+  missed.Clear();
+  EXPECT_FALSE(missed.HaveBelow("/v"));
+}
+
 TEST(ShareState, IsReadAsItWasSaved) {
   const TempFolder folder;
   const SyslogCapture log;
@@ -140,6 +168,7 @@ TEST(ShareState, IsReadAsItWasSaved) {
   EXPECT_EQ(vexlo::fileindexd::LoadShareState(file), state);
   state.crawled = {"/v/a", "/v/\xE9"};
   state.rebuilt = true;
+  state.missed.Note("/v/\xFF");
   SaveShareState(file, state);
   EXPECT_EQ(vexlo::fileindexd::LoadShareState(file), state);
   state.crawl = {"/v/a", "why", "/v/a/\xE9", 2, true};

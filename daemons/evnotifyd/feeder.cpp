@@ -75,6 +75,7 @@ void Feeder::Start(const Names& ignored, Group& group) {
   options.ignored_names = {ignored.begin(), ignored.end()};
   options.takes_missing_roots = true;
   options.polls_roots = false;
+  options.takes_hints = true;
   options.stop = stop_;
   const std::vector<std::string> roots(group.roots.begin(), group.roots.end());
   group.watcher.reset();  // First: the system allows only so many.
@@ -177,6 +178,7 @@ std::vector<int> Feeder::Fds() const {
   for (const auto& [ignored, group] : groups_) {
     if (group.watcher != nullptr) {
       fds.push_back(group.watcher->fd());
+      fds.push_back(group.watcher->hints_fd());
     }
   }
   return fds;

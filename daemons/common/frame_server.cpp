@@ -624,6 +624,9 @@ void FrameServer::BeginStop() {
   stopping_ = true;
   stop_deadline_ = now_ + options_.stop_timeout;
   RemoveSocket();
+  if (options_.stopping) {
+    options_.stopping();
+  }
   std::vector<Connection*> incomplete;
   for (const auto& [fd, connection] : connections_) {
     if (connection->state != Connection::State::kWriting) {

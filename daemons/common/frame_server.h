@@ -42,6 +42,10 @@ struct FrameServerOptions {
   // closed without one.
   std::function<std::string(Refusal)> refusal;
 
+  // Called once when the server begins to stop, so that requests in work can be cut short. May be
+  // unset.
+  std::function<void()> stopping;
+
   size_t workers = 8;
   // Further ones wait in the kernel's queue, and their connect() when that is full.
   size_t max_connections = 1024;

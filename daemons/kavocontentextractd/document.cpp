@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <chrono>
 #include <cmath>
+#include <utility>
 
 #include "fileindex/elastic_control/schema.h"
 #include "kavo/local/content.h"
@@ -107,11 +108,11 @@ bool ParseTime(std::string_view text, int64_t& seconds) {
     if (hours < 0 || minutes < 0) {
       return false;
     }
-    zone = (hours * 60 + minutes) * (is_east ? 60 : -60);
+    zone = int64_t{is_east ? 60 : -60} * (hours * 60 + minutes);
   } else {
     TakeOneOf(text, "Z");
   }
-  seconds = (hour * 60 + minute) * 60 + second - zone;
+  seconds = int64_t{60} * (hour * 60 + minute) + second - zone;
   return text.empty();
 }
 
@@ -204,7 +205,7 @@ Json::Value Document::Take(const std::string& fault) {
   if (!fault.empty()) {
     fields_[kavo::local::kContentErrorField] = fault;
   }
-  return std::move(fields_);
+  return std::exchange(fields_, Json::Value(Json::objectValue));
 }
 
 bool ParseDate(std::string_view text, int64_t& seconds) {

@@ -7,6 +7,7 @@
 
 #include "daemons/kavocontentextractd/fault.h"
 #include "daemons/kavocontentextractd/formats.h"
+#include "daemons/kavocontentextractd/plain_text.h"
 #include "fileindex/elastic_control/schema.h"
 #include "kavo/local/content.h"
 
@@ -28,23 +29,8 @@ constexpr unsigned kMostJumps = 500;
 std::string Utf8(const std::wstring& text) {
   std::string utf8;
   utf8.reserve(text.size());
-  for (const wchar_t wide : text) {
-    const auto c = static_cast<uint32_t>(wide);
-    if (c < 0x80) {
-      utf8 += static_cast<char>(c);
-    } else if (c < 0x800) {
-      utf8 += static_cast<char>(0xC0U | (c >> 6U));
-      utf8 += static_cast<char>(0x80U | (c & 0x3FU));
-    } else if (c < 0x10000) {
-      utf8 += static_cast<char>(0xE0U | (c >> 12U));
-      utf8 += static_cast<char>(0x80U | ((c >> 6U) & 0x3FU));
-      utf8 += static_cast<char>(0x80U | (c & 0x3FU));
-    } else if (c < 0x110000) {
-      utf8 += static_cast<char>(0xF0U | (c >> 18U));
-      utf8 += static_cast<char>(0x80U | ((c >> 12U) & 0x3FU));
-      utf8 += static_cast<char>(0x80U | ((c >> 6U) & 0x3FU));
-      utf8 += static_cast<char>(0x80U | (c & 0x3FU));
-    }
+  for (const wchar_t character : text) {
+    AppendUtf8(utf8, static_cast<char32_t>(character));
   }
   return utf8;
 }
@@ -79,40 +65,40 @@ void Feed(MediaInfo& media, const Source& source) {
 }
 
 struct Parameter {
-  stream_t stream;
   const wchar_t* name;
   const char* field;
+  stream_t stream;
   enum { kText, kNumber, kMilliseconds, kDate, kYear } kind;
 };
 // Where two rows fill one field, the later one counts; of several streams, the first.
 constexpr Parameter kParameters[] = {
-    {MediaInfoLib::Stream_General, L"Duration", field::KAVOMDDurationSecond,
+    {L"Duration", field::KAVOMDDurationSecond, MediaInfoLib::Stream_General,
      Parameter::kMilliseconds},
-    {MediaInfoLib::Stream_General, L"Title", field::KAVOMDTitle, Parameter::kText},
-    {MediaInfoLib::Stream_General, L"Performer", field::KAVOMDAuthors, Parameter::kText},
-    {MediaInfoLib::Stream_General, L"Director", field::KAVOMDAuthors, Parameter::kText},
-    {MediaInfoLib::Stream_General, L"Album", field::KAVOMDAlbum, Parameter::kText},
-    {MediaInfoLib::Stream_General, L"Genre", field::KAVOMDMusicalGenre, Parameter::kText},
-    {MediaInfoLib::Stream_General, L"Composer", field::KAVOMDComposer, Parameter::kText},
-    {MediaInfoLib::Stream_General, L"Comment", field::KAVOMDComment, Parameter::kText},
-    {MediaInfoLib::Stream_General, L"Description", field::KAVOMDDescription, Parameter::kText},
-    {MediaInfoLib::Stream_General, L"Copyright", field::KAVOMDCopyright, Parameter::kText},
-    {MediaInfoLib::Stream_General, L"Keywords", field::KAVOMDKeywords, Parameter::kText},
-    {MediaInfoLib::Stream_General, L"Track/Position", field::KAVOMDAudioTrackNumber,
+    {L"Title", field::KAVOMDTitle, MediaInfoLib::Stream_General, Parameter::kText},
+    {L"Performer", field::KAVOMDAuthors, MediaInfoLib::Stream_General, Parameter::kText},
+    {L"Director", field::KAVOMDAuthors, MediaInfoLib::Stream_General, Parameter::kText},
+    {L"Album", field::KAVOMDAlbum, MediaInfoLib::Stream_General, Parameter::kText},
+    {L"Genre", field::KAVOMDMusicalGenre, MediaInfoLib::Stream_General, Parameter::kText},
+    {L"Composer", field::KAVOMDComposer, MediaInfoLib::Stream_General, Parameter::kText},
+    {L"Comment", field::KAVOMDComment, MediaInfoLib::Stream_General, Parameter::kText},
+    {L"Description", field::KAVOMDDescription, MediaInfoLib::Stream_General, Parameter::kText},
+    {L"Copyright", field::KAVOMDCopyright, MediaInfoLib::Stream_General, Parameter::kText},
+    {L"Keywords", field::KAVOMDKeywords, MediaInfoLib::Stream_General, Parameter::kText},
+    {L"Track/Position", field::KAVOMDAudioTrackNumber, MediaInfoLib::Stream_General,
      Parameter::kNumber},
-    {MediaInfoLib::Stream_General, L"Recorded_Date", field::KAVOMDRecordingYear, Parameter::kYear},
-    {MediaInfoLib::Stream_General, L"Encoded_Date", field::KAVOMDContentCreationDate,
+    {L"Recorded_Date", field::KAVOMDRecordingYear, MediaInfoLib::Stream_General, Parameter::kYear},
+    {L"Encoded_Date", field::KAVOMDContentCreationDate, MediaInfoLib::Stream_General,
      Parameter::kDate},
-    {MediaInfoLib::Stream_General, L"Encoded_Application", field::KAVOMDEncodingApplications,
+    {L"Encoded_Application", field::KAVOMDEncodingApplications, MediaInfoLib::Stream_General,
      Parameter::kText},
-    {MediaInfoLib::Stream_General, L"OverallBitRate", field::KAVOMDTotalBitRate,
+    {L"OverallBitRate", field::KAVOMDTotalBitRate, MediaInfoLib::Stream_General,
      Parameter::kNumber},
-    {MediaInfoLib::Stream_Video, L"Width", field::KAVOMDPixelWidth, Parameter::kNumber},
-    {MediaInfoLib::Stream_Video, L"Height", field::KAVOMDPixelHeight, Parameter::kNumber},
-    {MediaInfoLib::Stream_Video, L"BitRate", field::KAVOMDVideoBitRate, Parameter::kNumber},
-    {MediaInfoLib::Stream_Audio, L"BitRate", field::KAVOMDAudioBitRate, Parameter::kNumber},
-    {MediaInfoLib::Stream_Audio, L"SamplingRate", field::KAVOMDAudioSampleRate, Parameter::kNumber},
-    {MediaInfoLib::Stream_Audio, L"Channel(s)", field::KAVOMDAudioChannelCount, Parameter::kNumber},
+    {L"Width", field::KAVOMDPixelWidth, MediaInfoLib::Stream_Video, Parameter::kNumber},
+    {L"Height", field::KAVOMDPixelHeight, MediaInfoLib::Stream_Video, Parameter::kNumber},
+    {L"BitRate", field::KAVOMDVideoBitRate, MediaInfoLib::Stream_Video, Parameter::kNumber},
+    {L"BitRate", field::KAVOMDAudioBitRate, MediaInfoLib::Stream_Audio, Parameter::kNumber},
+    {L"SamplingRate", field::KAVOMDAudioSampleRate, MediaInfoLib::Stream_Audio, Parameter::kNumber},
+    {L"Channel(s)", field::KAVOMDAudioChannelCount, MediaInfoLib::Stream_Audio, Parameter::kNumber},
 };
 
 void SetParameter(const Parameter& row, std::string value, Document& document) {

@@ -39,6 +39,18 @@ bool HasShifts(std::string_view bytes) {
 
 }  // namespace
 
+void AppendUtf8(std::string& out, char32_t character) {
+  uint8_t bytes[U8_MAX_LENGTH];
+  int32_t size = 0;
+  UBool is_error = 0;
+  U8_APPEND(bytes, size, U8_MAX_LENGTH, static_cast<UChar32>(character), is_error);
+  if (is_error != 0) {
+    out += kReplacement;
+  } else {
+    out.append(reinterpret_cast<const char*>(bytes), static_cast<size_t>(size));
+  }
+}
+
 bool HasBinaryControls(std::string_view bytes) {
   return std::any_of(bytes.begin(), bytes.end(), [](char c) {
     const auto byte = static_cast<unsigned char>(c);

@@ -18,6 +18,9 @@ std::optional<std::string> DecodeText(std::string_view bytes, bool has_more);
 // characters becomes U+FFFD.
 std::optional<std::string> Convert(std::string_view bytes, const std::string& encoding);
 
+// Appends the character; U+FFFD for what is none.
+void AppendUtf8(std::string& out, char32_t character);
+
 // The encoding that the letters look like most, windows-1252 when they do not tell.
 std::string GuessEncoding(std::string_view bytes);
 

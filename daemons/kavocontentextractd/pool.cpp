@@ -23,6 +23,7 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
+constexpr char kEnding[] = "kavocontentextractd ends";
 // From the end of a worker's socket to that of the worker.
 constexpr int kEndMilliseconds = 500;
 
@@ -150,6 +151,7 @@ class Pool::Worker {
     return {Outcome::kDied, status ? "the worker " + StatusText(*status) : "the worker is gone"};
   }
 
+  int Socket() const { return socket_.Get(); }
   size_t Served() const { return served_; }
   bool IsAlive() const { return pid_ > 0; }
 
@@ -185,56 +187,81 @@ Pool::Pool(PoolOptions options) : options_(std::move(options)) {}
 
 Pool::~Pool() = default;
 
-std::unique_ptr<Pool::Worker> Pool::Take(Outcome& refusal) {
-  std::unique_lock<std::mutex> lock(mutex_);
-  if (!came_free_.wait_for(lock, options_.wait_limit,
-                           [this] { return taken_ < options_.workers; })) {
-    refusal = {Outcome::kNoWorker, "every worker is busy"};
-    return nullptr;
-  }
-  ++taken_;
+// Null when one must be started. Called with the lock.
+std::unique_ptr<Pool::Worker> Pool::TakeIdle(bool new_worker) {
   while (!idle_.empty()) {
     std::unique_ptr<Worker> worker = std::move(idle_.back());
     idle_.pop_back();
+    if (new_worker) {
+      break;  // It makes room for the new one.
+    }
     if (worker->IsIdle()) {
       return worker;
     }
   }
-  lock.unlock();
-  std::string reason;
-  std::unique_ptr<Worker> worker = Worker::Start(options_, reason);
+  return nullptr;
+}
+
+std::unique_ptr<Pool::Worker> Pool::Take(bool new_worker, Outcome& refusal) {
+  std::unique_lock<std::mutex> lock(mutex_);
+  const bool is_free = came_free_.wait_for(
+      lock, options_.wait_limit, [this] { return taken_ < options_.workers || stopping_; });
+  if (!is_free || stopping_) {
+    refusal.text = stopping_ ? kEnding : "every worker is busy";
+    return nullptr;
+  }
+  ++taken_;
+  std::unique_ptr<Worker> worker = TakeIdle(new_worker);
   if (worker == nullptr) {
-    LogLine(VEXLO_SOURCE, __LINE__, reason);
-    refusal = {Outcome::kNoWorker, reason};
+    lock.unlock();
+    worker = Worker::Start(options_, refusal.text);
     lock.lock();
+  }
+  if (worker == nullptr) {
+    LogLine(VEXLO_SOURCE, __LINE__, refusal.text);
     --taken_;
     came_free_.notify_one();
+  } else {
+    busy_.insert(worker->Socket());
   }
   return worker;
 }
 
 void Pool::GiveBack(std::unique_ptr<Worker> worker) {
   const bool is_alive = worker->IsAlive();
-  if (!is_alive || worker->Served() >= options_.files_per_worker) {
-    worker.reset();
-  }
+  const bool is_used_up = !is_alive || worker->Served() >= options_.files_per_worker;
   const std::lock_guard<std::mutex> lock(mutex_);
+  busy_.erase(worker->Socket());
   --taken_;
-  deaths_ += is_alive ? 0 : 1;
-  if (worker != nullptr) {
+  deaths_ += is_alive || stopping_ ? 0 : 1;
+  if (is_used_up) {
+    worker.reset();
+  } else {
     idle_.push_back(std::move(worker));
   }
   came_free_.notify_one();
 }
 
-Pool::Outcome Pool::Run(const std::string& request, int file) {
+Pool::Outcome Pool::Run(const std::string& request, int file, bool new_worker) {
   Outcome outcome = {Outcome::kNoWorker, ""};
-  std::unique_ptr<Worker> worker = Take(outcome);
-  if (worker != nullptr) {
-    outcome = worker->Ask(request, file, Clock::now() + options_.deadline);
-    GiveBack(std::move(worker));
+  std::unique_ptr<Worker> worker = Take(new_worker, outcome);
+  if (worker == nullptr) {
+    return outcome;
   }
-  return outcome;
+  outcome = worker->Ask(request, file, Clock::now() + options_.deadline);
+  GiveBack(std::move(worker));
+  const std::lock_guard<std::mutex> lock(mutex_);
+  return stopping_ && outcome.kind != Outcome::kReply ? Outcome{Outcome::kNoWorker, kEnding}
+                                                      : std::move(outcome);
+}
+
+void Pool::Stop() {
+  const std::lock_guard<std::mutex> lock(mutex_);
+  stopping_ = true;
+  for (const int socket : busy_) {
+    shutdown(socket, SHUT_RDWR);  // Whoever waits on it takes the worker for dead.
+  }
+  came_free_.notify_all();
 }
 
 size_t Pool::Workers() {

@@ -10,6 +10,7 @@
 #include <cstddef>
 #include <memory>
 #include <mutex>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -55,8 +56,11 @@ class Pool {
   Pool(const Pool&) = delete;
   Pool& operator=(const Pool&) = delete;
 
-  // Has a worker answer the request about the file.
-  Outcome Run(const std::string& request, int file);
+  // Has a worker answer the request about the file, with `new_worker` one that has read no other.
+  Outcome Run(const std::string& request, int file, bool new_worker);
+
+  // Cuts all files in work short, and refuses others: kNoWorker.
+  void Stop();
 
   // How many there are at present, and how many were lost while they read a file.
   size_t Workers();
@@ -65,7 +69,8 @@ class Pool {
  private:
   class Worker;
 
-  std::unique_ptr<Worker> Take(Outcome& refusal);
+  std::unique_ptr<Worker> Take(bool new_worker, Outcome& refusal);
+  std::unique_ptr<Worker> TakeIdle(bool new_worker);
   void GiveBack(std::unique_ptr<Worker> worker);
 
   const PoolOptions options_;
@@ -73,7 +78,9 @@ class Pool {
   std::condition_variable came_free_;
   // Guarded by mutex_:
   std::vector<std::unique_ptr<Worker>> idle_;
+  std::set<int> busy_;  // The sockets of workers that read.
   size_t taken_ = 0;
+  bool stopping_ = false;
   size_t deaths_ = 0;
 };
 

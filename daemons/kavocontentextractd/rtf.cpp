@@ -67,24 +67,6 @@ const Row* Find(const Row (&rows)[N], std::string_view word) {
   return found == std::end(rows) ? nullptr : found;
 }
 
-void AppendUtf8(std::string& out, uint32_t character) {
-  if (character < 0x80) {
-    out += static_cast<char>(character);
-  } else if (character < 0x800) {
-    out += static_cast<char>(0xC0U | (character >> 6U));
-    out += static_cast<char>(0x80U | (character & 0x3FU));
-  } else if (character < 0x10000) {
-    out += static_cast<char>(0xE0U | (character >> 12U));
-    out += static_cast<char>(0x80U | ((character >> 6U) & 0x3FU));
-    out += static_cast<char>(0x80U | (character & 0x3FU));
-  } else {
-    out += static_cast<char>(0xF0U | (character >> 18U));
-    out += static_cast<char>(0x80U | ((character >> 12U) & 0x3FU));
-    out += static_cast<char>(0x80U | ((character >> 6U) & 0x3FU));
-    out += static_cast<char>(0x80U | (character & 0x3FU));
-  }
-}
-
 class RtfReader {
  public:
   RtfReader(std::string_view rtf, Document& document) : rtf_(rtf), document_(document) {}

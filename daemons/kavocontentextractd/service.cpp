@@ -124,7 +124,7 @@ std::string Service::Extract(const std::string& path, int file) {
   const std::string text = JsonToString(request);
   std::optional<Fault> fault;
   for (unsigned i = 0; i < kTries; ++i) {
-    Pool::Outcome outcome = pool_.Run(text, file);
+    Pool::Outcome outcome = pool_.Run(text, file, /*new_worker=*/i > 0);
     if (outcome.kind == Pool::Outcome::kNoWorker) {
       return Refusal(reason::kUnavailable, outcome.text);
     }
@@ -206,6 +206,7 @@ void Serve(daemon::Daemon& daemon, const Settings& settings, const std::string& 
   server_options.file_handler = [&service](const std::string& request, daemon::UniqueFd file) {
     return service.Answer(request, std::move(file));
   };
+  server_options.stopping = [&service] { service.Stop(); };
   server_options.refusal = [](daemon::Refusal refusal) {
     return Refusal(reason::kUnavailable, refusal == daemon::Refusal::kTooLong
                                              ? "the request is too long"

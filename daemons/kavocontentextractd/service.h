@@ -27,6 +27,9 @@ class Service {
   // and its wait limit.
   std::string Answer(const std::string& request, daemon::UniqueFd file);
 
+  // Cuts all requests short, those in work and those to come.
+  void Stop() { pool_.Stop(); }
+
  private:
   std::string Extract(const std::string& path, int file);
   Json::Value Stats();

@@ -1,10 +1,12 @@
 #include "daemons/kavocontentextractd/worker.h"
 
+#include <grp.h>
 #include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <csignal>
 #include <exception>
 #include <new>
@@ -28,14 +30,26 @@ bool Limit(int resource, rlim_t value) {
   return setrlimit(resource, &limit) == 0;
 }
 
+// The files come open, so the user who owns nothing can read them. A superuser who may not do that
+// has little to give up.
+bool BecomeNobody() {
+  constexpr unsigned kNobody = 65534;
+  return geteuid() != 0 ||
+         (setgroups(0, nullptr) == 0 && setresgid(kNobody, kNobody, kNobody) == 0 &&
+          setresuid(kNobody, kNobody, kNobody) == 0) ||
+         errno == EPERM;
+}
+
 bool GiveUpRights(size_t memory) {
   // A file over the limit is an error where it is written, not a signal.
   signal(SIGXFSZ, SIG_IGN);
-  // The daemon's end ends a worker that is busy, too; an idle one sees its socket closed.
   close_range(kWorkerSocket + 1, ~0U, 0);  // What whoever started the daemon has left open.
   prctl(PR_SET_NAME, "kavoce-worker");     // It was started as "exe".
-  return prctl(PR_SET_PDEATHSIG, SIGKILL) == 0 && prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
-         Limit(RLIMIT_FSIZE, 0) && Limit(RLIMIT_CORE, 0) &&
+  // The daemon's end ends a worker that is busy, too; an idle one sees its socket closed. A change
+  // of the user would undo it.
+  return BecomeNobody() && prctl(PR_SET_PDEATHSIG, SIGKILL) == 0 &&
+         prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 && Limit(RLIMIT_FSIZE, 0) &&
+         Limit(RLIMIT_CORE, 0) &&
          (memory == 0 || Limit(RLIMIT_AS, static_cast<rlim_t>(memory) << 20));
 }
 

@@ -7,7 +7,8 @@
 namespace vexlo::extractd {
 
 // Gives up what a reader of files does not need: `memory` MiB of address space remain (0 for no
-// limit), nothing can be written to files, no core is dumped, no program can raise its privileges.
+// limit), nothing can be written to files, no core is dumped, no program can raise its privileges,
+// and a superuser becomes the user "nobody".
 // Then says on kWorkerSocket that it is ready, by an empty message, and answers there until the
 // daemon closes it. The exit status.
 //

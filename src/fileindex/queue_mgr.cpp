@@ -5,8 +5,11 @@
 #include <cerrno>
 #include <cstdio>
 #include <cstring>
+#include <optional>
+#include <utility>
 
 #include "common/check.h"
+#include "common/error.h"
 #include "common/file.h"
 #include "common/json.h"
 #include "common/lock.h"
@@ -14,6 +17,7 @@
 #include "fileindex/folder_mgr.h"
 #include "fileindex/optree/line_parser.h"
 #include "fileindex/optree/line_reader.h"
+#include "fileindex/optree/reindex_notes.h"
 
 namespace vexlo::fileindex {
 namespace {
@@ -39,33 +43,74 @@ bool AwaitWholeLine(LineReader& reader, QueueLine& line) {
   return true;
 }
 
-// Whether `matches` holds for some event of the file, up to the first one. No file has no events.
-template <typename Matches>
-bool ScanQueue(const std::string& path, Matches matches) {
+// Opens a queue for a scan; false when there is none. Throws for one that cannot be opened.
+bool IsThere(const std::string& path, std::optional<LineReader>& reader) {
   if (!IsFileExist(path)) {
     return false;
   }
   errno = 0;
-  LineReader reader(path);
-  if (!reader.IsOpen() && errno == ENOENT) {
+  reader.emplace(path);
+  if (!reader->IsOpen() && errno == ENOENT) {
     return false;  // Renamed to its snapshot, or deleted, since we looked.
   }
   // Log monitors know this site by the name of another function.
-  VEXLO_CHECK_AT((LogSite{"queue_mgr", 32, "PrepareTmpQueue", "!input_stream"}), !reader.IsOpen(),
+  VEXLO_CHECK_AT((LogSite{"queue_mgr", 32, "PrepareTmpQueue", "!input_stream"}), !reader->IsOpen(),
                  ERR_SYSTEM, std::string("Failed to open queue, reason=") + strerror(errno));
+  return true;
+}
+
+// Whether matches(line, event) holds for some line from where the reader stands, up to the first
+// one.
+template <typename Matches>
+bool ScanLines(LineReader& reader, Matches matches) {
   LineParser parser;
   QueueLine line;
   while (reader.Next(line)) {
     if (!line.terminated && !AwaitWholeLine(reader, line)) {
       break;
     }
-    if (matches(parser.Parse(line))) {
+    if (matches(line, parser.Parse(line))) {
       return true;
     }
   }
   VEXLO_CHECK(reader.Failed(), ERR_SYSTEM,
               std::string("Failed to read queue, reason=") + strerror(errno));
   return false;
+}
+
+bool HasEventFor(const std::string& path, const std::string& full_path) {
+  std::optional<LineReader> reader;
+  return IsThere(path, reader) &&
+         ScanLines(*reader, [&full_path](const QueueLine&, const EventView& event) {
+           return IsSameOrBelow(event.path, full_path) || IsSameOrBelow(event.path_old, full_path);
+         });
+}
+
+// Whoever adds events one by one asks this before each; so what was read is noted, and only new
+// lines are read the next time.
+bool HasReindexFor(const std::string& path, const std::string& full_path) {
+  std::optional<LineReader> reader;
+  if (!IsThere(path, reader)) {
+    return false;
+  }
+  ReindexNote note = ReindexNotes::Take(*reader);
+  const auto keep = [&] { ReindexNotes::Keep(*reader, std::move(note)); };
+  if (note.Covers(full_path)) {
+    keep();
+    return true;
+  }
+  bool notes = reader->Seek(note.Offset());
+  try {
+    const bool found = ScanLines(*reader, [&](const QueueLine& line, const EventView& event) {
+      notes = notes && note.Add(line, event, reader->LineOffset());
+      return event.event == EV_REINDEX && IsSameOrBelow(full_path, event.path);
+    });
+    keep();
+    return found;
+  } catch (const Error&) {
+    keep();
+    throw;
+  }
 }
 
 }  // namespace
@@ -117,17 +162,11 @@ bool QueueMgr::IsFullPathProcessing(const std::string& full_path) {
   // Whoever asks trusts the list of folders: one that cannot be loaded must not look like an idle
   // queue.
   const FolderMgr folders;
-  const auto concerns = [&full_path](const EventView& event) {
-    return IsSameOrBelow(event.path, full_path) || IsSameOrBelow(event.path_old, full_path);
-  };
-  return ScanQueue(queue_path_, concerns) || ScanQueue(queue_path_tmp_, concerns);
+  return HasEventFor(queue_path_, full_path) || HasEventFor(queue_path_tmp_, full_path);
 }
 
 bool QueueMgr::IsFullPathHasReindex(const std::string& full_path) {
-  const auto reindexes = [&full_path](const EventView& event) {
-    return event.event == EV_REINDEX && IsSameOrBelow(full_path, event.path);
-  };
-  return ScanQueue(queue_path_, reindexes) || ScanQueue(queue_path_tmp_, reindexes);
+  return HasReindexFor(queue_path_, full_path) || HasReindexFor(queue_path_tmp_, full_path);
 }
 
 }  // namespace vexlo::fileindex

@@ -8,8 +8,10 @@
 #include <unistd.h>
 
 #include <cstdio>
+#include <filesystem>
 #include <functional>
 #include <memory>
+#include <random>
 #include <sstream>
 #include <string>
 
@@ -203,6 +205,57 @@ TEST_F(Queue, WaitsForATornLastLine) {
     EXPECT_EQ(HasReindex("/v/s/b"), row.answer);
     EXPECT_GE(sleeps, 1);
     EXPECT_LE(sleeps, 10);
+  }
+}
+
+// What was read before is not read again, and no answer tells.
+TEST_F(Queue, AnswersAgainAsOneWhoReadsAllOfIt) {
+  std::mt19937 random(3);
+  const auto path = [&random] {
+    std::string text;
+    for (size_t left = random() % 4; left > 0; --left) {
+      text += std::string("/") + "abc"[random() % 3];
+    }
+    return text;
+  };
+  const auto line = [&] {
+    return random() % 200 == 0 ? std::string("nonsense\n")
+                               : R"({"event":)" + std::string(random() % 3 == 0 ? "65536" : "8") +
+                                     R"(,"path":")" + path() + "\"}\n";
+  };
+  const std::string copy = live + ".copy";
+  for (int step = 0; step < 3000; ++step) {
+    const size_t size = std::filesystem::exists(live) ? std::filesystem::file_size(live) : 0;
+    switch (random() % 20) {
+      case 0:  // A cycle of the index daemon.
+        rename(live.c_str(), snapshot.c_str());
+        break;
+      case 1:
+        unlink(snapshot.c_str());
+        break;
+      case 2:  // A failed append is cut back, and others write there.
+        truncate(live.c_str(), static_cast<off_t>(random() % (size + 1)));
+        std::ofstream(live, std::ios::app) << "\n" << line();
+        break;
+      default:
+        std::ofstream(live, std::ios::app) << line();
+    }
+    const std::string asked = path() + "/a";
+    const std::string got = HasReindex(asked);
+    // A copy is a file that was never read.
+    for (const std::string end : {"", ".tmp"}) {
+      std::error_code none;
+      std::filesystem::remove(copy + end, none);
+      std::filesystem::copy_file(live + end, copy + end, none);
+    }
+    QueueMgr fresh(copy);
+    std::string want;
+    try {
+      want = fresh.IsFullPathHasReindex(asked) ? "true" : "false";
+    } catch (const Error& error) {
+      want = std::to_string(error.GetErrorCode()) + " " + error.what();
+    }
+    ASSERT_EQ(got, want) << step;
   }
 }
 

@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <sys/sysmacros.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -86,6 +87,22 @@ bool LineReader::Seek(uint64_t offset) {
   begin_ = scanned_ = end_ = 0;
   next_offset_ = offset;
   return lseek(fd_, static_cast<off_t>(offset), SEEK_SET) >= 0;
+}
+
+std::optional<FileIdentity> LineReader::Identity() const {
+  struct statx info {};
+  if (statx(fd_, "", AT_EMPTY_PATH, STATX_INO | STATX_BTIME, &info) != 0 ||
+      (info.stx_mask & STATX_BTIME) == 0) {
+    return std::nullopt;
+  }
+  return FileIdentity{makedev(info.stx_dev_major, info.stx_dev_minor), info.stx_ino,
+                      info.stx_btime.tv_sec, info.stx_btime.tv_nsec};
+}
+
+bool LineReader::ReadBefore(uint64_t offset, std::string& text) const {
+  return offset >= text.size() &&
+         pread(fd_, text.data(), text.size(), static_cast<off_t>(offset - text.size())) ==
+             static_cast<ssize_t>(text.size());
 }
 
 // Reads more behind buffer_[begin_, end_); false at the end of the file or at an error.

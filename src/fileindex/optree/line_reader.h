@@ -4,6 +4,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -15,6 +16,16 @@ struct QueueLine {
   std::string_view text;   // Without its newline. Of a line that is too long, the start.
   bool terminated = true;  // A newline follows.
   uint64_t length = 0;     // In bytes; more than `text` holds when the line is too long.
+};
+
+// Tells a file from every other, also from one that has its inode later.
+struct FileIdentity {
+  uint64_t device = 0;
+  uint64_t inode = 0;
+  int64_t birth_seconds = 0;
+  uint32_t birth_nanoseconds = 0;
+
+  bool operator==(const FileIdentity&) const = default;
 };
 
 // Lines as std::getline finds them: what follows the last newline is a line unless it is empty. A
@@ -44,6 +55,12 @@ class LineReader {
 
   // Goes on at `offset`, with what stands in the file by now. False with errno when that fails.
   bool Seek(uint64_t offset);
+
+  // None when the file system does not tell when the file was made.
+  std::optional<FileIdentity> Identity() const;
+
+  // Fills `text` with the bytes that stand before `offset`; false when there are not so many.
+  bool ReadBefore(uint64_t offset, std::string& text) const;
 
   uint64_t BytesRead() const { return next_offset_; }
   uint64_t FileBytes() const { return file_bytes_; }  // When it was opened.

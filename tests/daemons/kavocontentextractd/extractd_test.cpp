@@ -2,7 +2,6 @@
 #include <fcntl.h>
 #include <json/writer.h>
 #include <poll.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
 
@@ -10,6 +9,7 @@
 #include <chrono>
 #include <filesystem>
 #include <optional>
+#include <sstream>
 #include <thread>
 
 #include "common/json.h"
@@ -84,18 +84,20 @@ class ExtractdTest : public testing::Test {
     }
     return workers;
   }
-  // Sends the signal to each worker that reads the file. One that is just being
+  // Sends the signal to each worker that reads the file; how many it were. One that is just being
   // started has what the daemon has open, but another name.
-  void SignalReadersOf(const std::string& path, int signal) const {
+  int SignalReadersOf(const std::string& path, int signal) const {
+    int readers = 0;
     for (const pid_t worker : Workers()) {
       const std::string proc = "/proc/" + std::to_string(worker);
       std::error_code error;
       for (const auto& fd : std::filesystem::directory_iterator(proc + "/fd", error)) {
         if (LinkOf(fd.path()) == path && ReadText(proc + "/comm") == "kavoce-worker\n") {
-          kill(worker, signal);
+          readers += kill(worker, signal) == 0 ? 1 : 0;
         }
       }
     }
+    return readers;
   }
   // What is said of the file while each worker that reads it gets the signal.
   std::string ErrorUnder(int signal, const std::string& path) const {
@@ -245,21 +247,20 @@ TEST_F(ExtractdTest, GivesWorkersNothingTheyDoNotNeed) {
   Parse(Write("a.pdf", Pdf()));
   ASSERT_EQ(Workers().size(), 1);
   const pid_t worker = Workers()[0];
-  const struct {
-    const char* name;
-    __rlimit_resource resource;
-    rlim_t limit;
-  } rows[] = {{"memory", RLIMIT_AS, rlim_t{512} << 20},
-              {"files", RLIMIT_FSIZE, 0},
-              {"core", RLIMIT_CORE, 0}};
-  for (const auto& row : rows) {
-    struct rlimit limit {};
-    EXPECT_EQ(prlimit(worker, row.resource, nullptr, &limit), 0);
-    EXPECT_EQ(limit.rlim_cur, row.limit) << row.name;
-    EXPECT_EQ(limit.rlim_max, row.limit) << row.name;
-  }
   const std::string proc = "/proc/" + std::to_string(worker);
-  EXPECT_NE(ReadText(proc + "/status").find("NoNewPrivs:\t1"), std::string::npos);
+  std::istringstream limits(ReadText(proc + "/limits"));
+  std::string found;
+  for (std::string line; std::getline(limits, line);) {
+    std::erase(line, ' ');
+    found += line + ";";
+  }
+  for (const char* const limit :
+       {"Maxaddressspace536870912536870912bytes", "Maxfilesize00bytes", "Maxcorefilesize00bytes"}) {
+    EXPECT_NE(found.find(limit), std::string::npos) << limit << " is not in " << found;
+  }
+  const std::string status = ReadText(proc + "/status");
+  EXPECT_NE(status.find("NoNewPrivs:\t1"), std::string::npos);
+  EXPECT_EQ(status.find("Uid:\t0"), std::string::npos) << status;
   for (const auto& fd : std::filesystem::directory_iterator(proc + "/fd")) {
     const std::string link = LinkOf(fd.path());
     EXPECT_TRUE(link == "/dev/null" || (fd.path().filename() == "3" && link.starts_with("socket:")))
@@ -322,6 +323,20 @@ TEST_F(ExtractdTest, QuarantinesWhatTakesTooLongOrTooMuch) {
   EXPECT_EQ(ErrorUnder(SIGSTOP, slow), "deadline: reading takes over 1 seconds");
   EXPECT_EQ(Stats()["quarantined"], 2);
   EXPECT_EQ(Stats()["deaths"], 4);
+}
+
+TEST_F(ExtractdTest, EndsInOrderWhileAFileIsRead) {
+  Start("--deadline 600 ");
+  const std::string path = Write("slow.docx", SlowDocument());
+  std::thread ending([&] {
+    while (SignalReadersOf(path, SIGSTOP) == 0) {
+      std::this_thread::yield();
+    }
+    kill(daemon_->pid, SIGTERM);
+  });
+  EXPECT_TRUE(ErrorOf(path).starts_with("unavailable: "));
+  ending.join();
+  Stop();
 }
 
 TEST_F(ExtractdTest, LeavesNoWorkerBehind) {

@@ -245,7 +245,10 @@ void Feeder::Take(const Names& ignored, QueueEvent&& event) {
 
 void Feeder::Add(const QueueEvent& event) {
   backlog_.Add(event);
-  if (backlog_.Text().size() >= kAppendBytes) {
+  const size_t bytes = backlog_.Text().size();
+  tried_bytes_ = std::min(tried_bytes_, bytes);
+  if (bytes >= tried_bytes_ + kAppendBytes) {
+    retry_ = now_;  // The clock stands while events are taken.
     Append();
   }
 }
@@ -258,6 +261,7 @@ void Feeder::Append() {
     lines_ += backlog_.Lines();
     overflows_ += backlog_.Crashed();
     backlog_.Clear();
+    tried_bytes_ = 0;
     pause_ = milliseconds(0);
     if (!fault_.empty()) {
       fault_.clear();
@@ -266,6 +270,7 @@ void Feeder::Append() {
     return;
   }
   const int error = errno;
+  tried_bytes_ = backlog_.Text().size();
   pause_ = std::clamp(2 * pause_, kFirstPause, kLongestPause);
   retry_ = now_ + pause_;
   // A lock is held for a moment by everybody who uses it.

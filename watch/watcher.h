@@ -94,7 +94,7 @@ class Watcher {
   // Readable when there is something for Poll() to read. The watcher's own, for poll() and alike.
   int fd() const { return fd_.Get(); }
   // One more of this kind, with takes_hints; -1 while there is none.
-  int hints_fd() const { return hints_ ? hints_->fd() : -1; }
+  int HintsFd() const { return hints_ ? hints_->fd() : -1; }
 
   // Reads what the kernel has and does what is due; never waits for anything. To be called when
   // fd() is readable and when NextDeadline() has come. Nothing thrown: what cannot be done shows in

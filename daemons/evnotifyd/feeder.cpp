@@ -178,7 +178,7 @@ std::vector<int> Feeder::Fds() const {
   for (const auto& [ignored, group] : groups_) {
     if (group.watcher != nullptr) {
       fds.push_back(group.watcher->fd());
-      fds.push_back(group.watcher->hints_fd());
+      fds.push_back(group.watcher->HintsFd());
     }
   }
   return fds;

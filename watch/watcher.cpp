@@ -27,6 +27,7 @@ constexpr char kWatchLimitFile[] = "/proc/sys/fs/inotify/max_user_watches";
 constexpr size_t kMaxWaiting = size_t{1} << 20;
 constexpr size_t kFoldersBetweenPulls = 256;
 constexpr size_t kMaxOpenFolders = 32;
+constexpr std::chrono::milliseconds kHintWait(500);
 constexpr size_t kRescanAtOnce = 1024;  // Folders, so that events are not kept waiting for longer.
 
 Fd StartInotify() {
@@ -201,6 +202,7 @@ void Watcher::Poll(TimePoint now) {
       }
     }
   }
+  TakeHints();
   Rescan();
   LogChangedState();
   tree_.Reclaim();
@@ -210,8 +212,9 @@ TimePoint Watcher::NextDeadline() const {
   if (!rescan_.empty() || !drained_) {
     return TimePoint::min();
   }
-  return std::min(IsAtRest() ? TimePoint::max() : next_rescan_,
-                  changes_.NextDeadline().value_or(TimePoint::max()));
+  return std::min({IsAtRest() ? TimePoint::max() : next_rescan_,
+                   hinted_.empty() ? TimePoint::max() : next_hinted_,
+                   changes_.NextDeadline().value_or(TimePoint::max())});
 }
 
 // Nothing is there that only time will tell.
@@ -510,6 +513,11 @@ Watcher::Entered Watcher::Enter(const Visit& visit, int parent_fd, bool deep) {
   }
   if (wd < 0) {
     unwatched_[entered.folder] = 0;
+    if (options_.takes_hints) {
+      (hints_ ? *hints_ : hints_.emplace()).Add(entered.folder, fd.Get());  // Before it is read.
+    }
+  } else if (hints_) {
+    hints_->Remove(entered.folder);
   }
   if (read || wd < 0 || entered.before) {
     entered.fd = std::move(fd);
@@ -666,6 +674,10 @@ void Watcher::Drop(FolderId folder) {
     unwatched_.erase(id);
     unreadable_.erase(id);
     unsettled_.erase(id);
+    hinted_.erase(id);
+    if (hints_) {
+      hints_->Remove(id);
+    }
   });
 }
 
@@ -821,6 +833,25 @@ void Watcher::CheckRoots() {
   }
 }
 
+// A folder that is written to all the time is looked at once in a while.
+void Watcher::TakeHints() {
+  if (hints_ && unwatched_.empty()) {
+    hints_.reset();  // The mark comes to much for a busy file system.
+  }
+  if (hints_) {
+    for (const FolderId folder : hints_->Take()) {
+      if (hinted_.empty()) {
+        next_hinted_ = now_ + kHintWait;
+      }
+      hinted_.insert(folder);
+    }
+  }
+  if (!hinted_.empty() && now_ >= next_hinted_) {
+    rescan_.insert(rescan_.end(), hinted_.begin(), hinted_.end());
+    hinted_.clear();
+  }
+}
+
 void Watcher::Rescan() {
   for (size_t i = 0; i < kRescanAtOnce && !rescan_.empty(); ++i) {
     const FolderId folder = rescan_.back();
@@ -846,16 +877,18 @@ WatchState Watcher::State() const {
     std::string allowed = "?";
     std::ifstream(kWatchLimitFile) >> allowed;
     const size_t needed = state.watched + state.unwatched;
-    state.text += Count(state.unwatched, "folder") + " of " + std::to_string(needed) +
-                  " not watched, but looked at every " +
-                  std::to_string(options_.rescan_interval.count() / 1000) +
-                  " s: " + std::to_string(needed) + " watches are needed, " +
-                  (options_.max_watches != 0
-                       ? std::to_string(options_.max_watches) + " allowed to this watcher and "
-                       : std::string()) +
-                  allowed +
-                  " allowed by the system (fs.inotify.max_user_watches, which all programs of the "
-                  "user share); ";
+    state.text +=
+        Count(state.unwatched, "folder") + " of " + std::to_string(needed) +
+        " not watched, but looked at " +
+        (hints_ && hints_->size() == state.unwatched ? "after changes in them and " : "") +
+        "every " + std::to_string(options_.rescan_interval.count() / 1000) +
+        " s: " + std::to_string(needed) + " watches are needed, " +
+        (options_.max_watches != 0
+             ? std::to_string(options_.max_watches) + " allowed to this watcher and "
+             : std::string()) +
+        allowed +
+        " allowed by the system (fs.inotify.max_user_watches, which all programs of the "
+        "user share); ";
   }
   if (state.unreadable != 0) {
     state.text += Count(state.unreadable, "folder") + " cannot be read; ";

@@ -16,6 +16,7 @@
 #include <vector>
 
 #include "watch/directory.h"
+#include "watch/folder_hints.h"
 #include "watch/folder_tree.h"
 #include "watch/kernel_event.h"
 #include "watch/queue_line.h"
@@ -41,6 +42,9 @@ struct WatchOptions {
   // tells of a mount over one or below it, or of a move of a folder above. Without it there is no
   // deadline at rest, and the caller calls CheckRoots() when it learns of such things.
   bool polls_roots = true;
+  // Hear of changes in folders that could not be watched by a mark on their file system, where that
+  // is permitted, and look at them then. Each event there, of whatever folder, wakes the caller.
+  bool takes_hints = false;
   // Ends a walk under way when it is asked to stop. Of no use from then on, the watcher is only to
   // be destroyed.
   std::stop_token stop = {};
@@ -69,7 +73,8 @@ struct WatchState {
 //   created when a folder stands at its path again, which is looked for every `rescan_interval`.
 //
 // Folders that exceed the system's or the caller's limit of watches are read every
-// `rescan_interval` and compared with what they held, by a hash of 8 bytes: slow, but never silent.
+// `rescan_interval`, or soon after a hint, and compared with what they held, by a hash of 8 bytes:
+// slow, but never silent.
 // See FolderTree on memory. Not for concurrent use; has no thread of its own.
 class Watcher {
  public:
@@ -88,6 +93,8 @@ class Watcher {
 
   // Readable when there is something for Poll() to read. The watcher's own, for poll() and alike.
   int fd() const { return fd_.Get(); }
+  // One more of this kind, with takes_hints; -1 while there is none.
+  int HintsFd() const { return hints_ ? hints_->fd() : -1; }
 
   // Reads what the kernel has and does what is due; never waits for anything. To be called when
   // fd() is readable and when NextDeadline() has come. Nothing thrown: what cannot be done shows in
@@ -162,6 +169,7 @@ class Watcher {
   Root* RootOf(FolderId folder);
   void RootGone(Root& root);
   void CheckRoots();
+  void TakeHints();
   void CheckMounts();
   void CheckPath(const std::string& path) const;
   bool Covers(const std::string& root, const std::string& path) const;
@@ -194,6 +202,9 @@ class Watcher {
   // Folders that could not be reached where the events so far place them. The events to come tell
   // of the move; when all are read, these are looked at again.
   std::unordered_set<FolderId> unsettled_;
+  std::optional<FolderHints> hints_;  // There while folders are not watched, if at all.
+  std::unordered_set<FolderId> hinted_;
+  TimePoint next_hinted_;         // When these are looked at.
   std::vector<FolderId> rescan_;  // What is left of the rescan under way.
   TimePoint next_rescan_;
   std::set<std::string> mounts_;      // As they were at the last look, before anything was opened.

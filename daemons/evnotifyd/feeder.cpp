@@ -75,6 +75,7 @@ void Feeder::Start(const Names& ignored, Group& group) {
   options.ignored_names = {ignored.begin(), ignored.end()};
   options.takes_missing_roots = true;
   options.polls_roots = false;
+  options.takes_hints = true;
   options.stop = stop_;
   const std::vector<std::string> roots(group.roots.begin(), group.roots.end());
   group.watcher.reset();  // First: the system allows only so many.
@@ -177,6 +178,7 @@ std::vector<int> Feeder::Fds() const {
   for (const auto& [ignored, group] : groups_) {
     if (group.watcher != nullptr) {
       fds.push_back(group.watcher->fd());
+      fds.push_back(group.watcher->HintsFd());
     }
   }
   return fds;
@@ -243,7 +245,10 @@ void Feeder::Take(const Names& ignored, QueueEvent&& event) {
 
 void Feeder::Add(const QueueEvent& event) {
   backlog_.Add(event);
-  if (backlog_.Text().size() >= kAppendBytes) {
+  const size_t bytes = backlog_.Text().size();
+  tried_bytes_ = std::min(tried_bytes_, bytes);
+  if (bytes >= tried_bytes_ + kAppendBytes) {
+    retry_ = now_;  // The clock stands while events are taken.
     Append();
   }
 }
@@ -256,6 +261,7 @@ void Feeder::Append() {
     lines_ += backlog_.Lines();
     overflows_ += backlog_.Crashed();
     backlog_.Clear();
+    tried_bytes_ = 0;
     pause_ = milliseconds(0);
     if (!fault_.empty()) {
       fault_.clear();
@@ -264,6 +270,7 @@ void Feeder::Append() {
     return;
   }
   const int error = errno;
+  tried_bytes_ = backlog_.Text().size();
   pause_ = std::clamp(2 * pause_, kFirstPause, kLongestPause);
   retry_ = now_ + pause_;
   // A lock is held for a moment by everybody who uses it.

@@ -109,7 +109,8 @@ class Feeder {
   uint64_t overflows_ = 0;
   std::chrono::milliseconds pause_{0};  // Before the next try; 0 while writing works.
   TimePoint retry_;
-  std::string fault_;  // Why the queue cannot be written, once it is worth telling.
+  size_t tried_bytes_ = 0;  // Of the backlog, at the last try that failed.
+  std::string fault_;       // Why the queue cannot be written, once it is worth telling.
 };
 
 }  // namespace vexlo::evnotifyd

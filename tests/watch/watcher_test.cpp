@@ -157,6 +157,29 @@ TEST_F(WatcherTest, FoldersBeyondTheLimitAreLookedAt) {
   EXPECT_EQ(Text(Take()), "create c/n/, create d/n/");
 }
 
+TEST_F(WatcherTest, HintsShortenTheWaitForThem) {
+  Do("mkdir -p a b/c");
+  Start({in_}, {.max_watches = 1, .takes_hints = true});
+  if (watcher_->State().text.find("looked at after changes in them and every 30 s") ==
+      std::string::npos) {
+    GTEST_SKIP() << "not permitted here: " << watcher_->State().text;
+  }
+  Take();
+  Do("> a/f; > b/c/f; > ../out/f; chmod 700 b");
+  EXPECT_EQ(Text(Take()), "attr b/") << "they are not looked at for each event";
+  std::vector<QueueEvent> events = Take(std::chrono::seconds(1));
+  std::sort(events.begin(), events.end(),
+            [](const QueueEvent& left, const QueueEvent& right) { return left.path < right.path; });
+  EXPECT_EQ(Text(events), "reindex a/, reindex b/c/");
+  for (const auto& [deeds, want] : {std::pair{"rm -r b/c; mkdir a/d; > a/d/f", "reindex a/"},
+                                    {"echo more > a/d/f", "reindex a/d/"}}) {
+    Do(deeds);
+    EXPECT_EQ(Text(Take()), "");
+    EXPECT_NE(Text(Take(std::chrono::seconds(1))).find(want), std::string::npos) << deeds;
+  }
+  EXPECT_LT(watcher_->NextDeadline(), now_ + kRescan);
+}
+
 TEST_F(WatcherTest, RootThatGoesAndComesBack) {
   const std::pair<const char*, const char*> cases[] = {
       {"rm -r r", "mkdir -p r/d"},

@@ -1,6 +1,7 @@
 #include "daemons/evnotifyd/feeder.h"
 
 #include <gtest/gtest.h>
+#include <sys/file.h>
 #include <sys/inotify.h>
 
 #include <map>
@@ -15,6 +16,7 @@
 #include "support/syslog_capture.h"
 #include "support/temp_folder.h"
 
+FAULTABLE(int, flock, (int fd, int operation) noexcept, (fd, operation))
 FAULTABLE(int, inotify_init1, (int flags) noexcept, (flags))
 FAULTABLE(ssize_t, write, (int fd, const void* data, size_t size), (fd, data, size))
 
@@ -174,6 +176,24 @@ TEST_F(FeederTest, WhatIsTooMuchToWaitIsTold) {
   Poll();
   EXPECT_EQ(Take(), "40 c/g");
   EXPECT_EQ(feeder_->Stats().overflows, 2U);
+}
+
+TEST_F(FeederTest, ALockThatIsHeldForAMomentLosesNothingOfABurst) {
+  FeederOptions options;
+  options.backlog_bytes = size_t{3} << 20;
+  std::string deep = "a";
+  for (int i = 0; i < 10; ++i) {
+    deep += "/" + std::string(250, 'x');
+  }
+  std::filesystem::create_directories(base_ / deep);
+  Start({{"a", kAll, {}}}, options);
+  Do("cd " + deep + "; i=0; while [ $i -lt 1500 ]; do > $i; i=$((i+1)); done");
+  const ScopedFault fault("flock", EWOULDBLOCK);
+  Poll();
+  EXPECT_TRUE(fault.Fired());
+  Poll(seconds(1));
+  EXPECT_EQ(feeder_->Stats().lines, 3001U);
+  EXPECT_EQ(feeder_->Stats().overflows, 0U);
 }
 
 TEST_F(FeederTest, WithoutInotifyItAsksForReindexesTimeAfterTime) {

@@ -62,6 +62,7 @@ struct Command {
 };
 
 // One a command family.
+std::vector<Command> AuditCommands();
 std::vector<Command> ConfigCommands();
 std::vector<Command> ExplainCommands();
 std::vector<Command> ExtractCommands();

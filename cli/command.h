@@ -66,6 +66,7 @@ std::vector<Command> AuditCommands();
 std::vector<Command> ConfigCommands();
 std::vector<Command> ExplainCommands();
 std::vector<Command> ExtractCommands();
+std::vector<Command> FailedCommands();
 std::vector<Command> FolderCommands();
 std::vector<Command> IndexCommands();
 std::vector<Command> PauseCommands();

@@ -64,6 +64,7 @@ struct Command {
 // One a command family.
 std::vector<Command> AuditCommands();
 std::vector<Command> ConfigCommands();
+std::vector<Command> DoctorCommands();
 std::vector<Command> ExplainCommands();
 std::vector<Command> ExtractCommands();
 std::vector<Command> FailedCommands();

@@ -14,7 +14,7 @@ int main(int argc, char** argv) {
         vexlo::cli::ShareCommands, vexlo::cli::IndexCommands, vexlo::cli::SearchCommands,
         vexlo::cli::PauseCommands, vexlo::cli::ConfigCommands, vexlo::cli::FolderCommands,
         vexlo::cli::StatusCommands, vexlo::cli::ExtractCommands, vexlo::cli::AuditCommands,
-        vexlo::cli::FailedCommands}) {
+        vexlo::cli::DoctorCommands, vexlo::cli::FailedCommands}) {
     const std::vector<Command> more = family();
     commands.insert(commands.end(), more.begin(), more.end());
   }

@@ -245,7 +245,7 @@ void Examination::LookAtPermissions() {
                                   names + " as user " + std::to_string(owner));
     }
   }
-  Add(Severity::kOk, "folders and locks of the state can be used, " + Grouped(well) + " of them");
+  Add(Severity::kOk, Grouped(well) + " folders and locks can be used");
 }
 
 // Says what does not work without the daemon when it does not answer.
@@ -294,8 +294,8 @@ void Examination::LookAtEngine() {
               Quoted("/" + share));
     }
   }
-  Add(Severity::kOk,
-      "listens and answers; " + Counted(active, "active index") + (active == 1 ? "" : "es"));
+  Add(Severity::kOk, "listens and answers; " + Grouped(active) +
+                         (active == 1 ? " index is active" : " indexes are active"));
 }
 
 void Examination::LookAtIndexDaemon() {

@@ -18,9 +18,9 @@
 #include "fileindex/elastic_control/share_index.h"
 #include "fileindex/paths.h"
 #include "fileindex/status_mgr.h"
+#include "support/fake_engine.h"
 #include "support/private_root.h"
 #include "support/program.h"
-#include "support/raw_client.h"
 
 namespace {
 
@@ -356,6 +356,167 @@ TEST_F(AuditTest, SaysWhatKeepsItFromComparing) {
       EXPECT_EQ(found.out, step.out);
     }
     EXPECT_NE(found.err.find(step.err), std::string::npos) << found.err;
+    step.back();
+  }
+}
+
+TEST_F(AuditTest, ListsFilesWithoutText) {
+  StartIndexer();
+  EXPECT_EQ(Run("failed").status, 1);
+  // Nobody runs who would read them.
+  for (const char* const name : {"a.pdf", "b\n.pdf", "crash.pdf", "mended.pdf", "plain.txt"}) {
+    Write(name);
+  }
+  const auto entry = [&](const std::string& name, int64_t changed_by) {
+    struct stat info {};
+    stat(In(name).c_str(), &info);
+    const auto nanoseconds = [](const timespec& time) {
+      return std::to_string(time.tv_sec * 1'000'000'000 + time.tv_nsec);
+    };
+    return R"({"device":)" + std::to_string(info.st_dev) +
+           ",\"inode\":" + std::to_string(info.st_ino) +
+           ",\"size\":" + std::to_string(info.st_size + changed_by) +
+           ",\"modified\":" + nanoseconds(info.st_mtim) +
+           ",\"changed\":" + nanoseconds(info.st_ctim) +
+           R"(,"reason":"crash","msg":"it died","time":1,"path":")" + In(name) + "\"}";
+  };
+  const std::string list = kRoot.MakeFolder("var/lib/kavo/extract") + "/quarantine.json";
+  WriteText(list, "{\"files\":[" + entry("crash.pdf", 0) + "," + entry("mended.pdf", 1) + "]}");
+  EXPECT_EQ(Run("failed").out, "crash.pdf: crash: it died (quarantined)\n");
+  fs::remove(In("mended.pdf"));
+  EXPECT_EQ(Run("audit --repair").status, 0);
+  const std::string unavailable =
+      ": unavailable: kavocontentextractd does not run (nobody answers on " +
+      (kRoot / "var/run/kavocontentextractd.sock") + ")";
+  const Result found = Run("failed");
+  EXPECT_EQ(found.status, 0);
+  EXPECT_EQ(found.out, "a.pdf" + unavailable + "\nb\\012.pdf" + unavailable + "\ncrash.pdf" +
+                           unavailable + " (quarantined)\n");
+  EXPECT_EQ(found.err, "3 files unavailable\n");
+  EXPECT_TRUE(Run("failed --json")
+                  .out.ends_with(R"("path":"crash.pdf","quarantined":true,"reason":"unavailable"})"
+                                 "\n"));
+  WriteText(list, "{");
+  EXPECT_NE(Run("failed").err.find("without the quarantine: "), std::string::npos);
+  ShareIndexPause("docs");
+  EXPECT_EQ(Run("failed").status, 3);
+}
+
+TEST_F(AuditTest, TheDoctorFindsWhatIsWrong) {
+  Write("a");
+  StartIndexer();
+  std::unique_ptr<FakeEngine> fake;
+  const std::string notify = "error    evnotifyd: does not run, so changes of files go unseen";
+  const struct {
+    const char* name;
+    std::function<void()> change;
+    std::vector<std::string> lines;  // Each stands in the report, with its remedy.
+    std::function<void()> back;
+  } cases[] = {
+      {"DaemonsDoNotRun",
+       [] {},
+       {notify, "warning  kavocontentextractd: does not run, ",
+        "ok       kavoelasticd: listens and answers; 1 index is active\n",
+        "ok       fileindexd: listens and answers; 1 worker\n", "ok       clock: no file",
+        "ok       shares: indexing is not paused\n"},
+       [] {}},
+      {"Pause",
+       [] { StatusMgr().Pause(0); },
+       {"warning  shares: indexing is paused without an end\n         $ fileindex resume\n"},
+       [] { StatusMgr().Resume(); }},
+      {"PauseWithAnEnd",
+       [] { StatusMgr().Pause(1); },
+       {"ok       shares: indexing is paused for "},
+       [] { StatusMgr().Resume(); }},
+      {"PausedIndex",
+       [] { ShareIndexPause("docs"); },
+       {"warning  kavoelasticd: the index of 'docs' is paused, so it is not searched\n"
+        "         $ fileindex index resume 'docs'\n"},
+       [] { ShareIndexResume("docs"); }},
+      {"Marked",
+       [&] {
+         EndIndexer();
+         StatusMgr().SetShareStatus("docs", 1);
+       },
+       {"warning  shares: 'docs' is marked for a reindex", "$ fileindex folder reindex '/docs'\n",
+        "error    fileindexd: does not run, so changes wait in the queues"},
+       [] { StatusMgr().ClearShareStatus("docs"); }},
+      {"FutureDates",
+       [&] {
+         const std::string path = In("it's");
+         Send(R"({"command":"document_upsert_by_id","data":{"id":"fileindex_docs","doc_id":")" +
+              path + R"(","data":{"KAVOMDPath":")" + path +
+              R"(","KAVOMDFSContentChangeDate":4000000000}}})");
+         Send(R"({"command":"commit","data":{"id":"fileindex_docs"}})");
+       },
+       {"warning  clock: 1 file is dated in the future", "         $ touch -c 'it'\\''s'\n"},
+       [] {}},
+      {"NotifyDaemonIsDegraded",
+       [&] {
+         fake = std::make_unique<FakeEngine>(kRoot / "var/run/evnotifyd.sock");
+         fake->Script({R"({"queues":[{"lines":1,"overflows":2,"queue":"/q","roots":["/elsewhere"],
+             "reason":"4 watches are needed, 3 allowed by fs.inotify.max_user_watches",
+             "state":"degraded","watches":100000000}]})"});
+       },
+       {"warning  evnotifyd: not all changes are seen at once for /q: 4 watches are needed",
+        "error    evnotifyd: nobody watches the indexed folder '" + docs_ + "/in'\n",
+        "warning  inotify: 100,000,000 folders are watched of ",
+        "         $ sudo sysctl fs.inotify.max_user_watches=200016384\n",
+        "warning  inotify: events were lost 2 times"},
+       [] {}},
+      {"NotifyDaemonIsOutOfItsMind",
+       [&] { fake->Script({"[]"}); },
+       {"error    evnotifyd: runs but gives no answer, ",
+        "         $ kill $(cat '" + (kRoot / "var/run/evnotifyd.pid") + "')\n"},
+       [&] { fake.reset(); }},
+      {"ReadOnlyShare",
+       [&] { SetShare(R"(,"read_only":true)"); },
+       {"error    shares: 'docs' is read-only"},
+       [&] { SetShare(""); }},
+      {"BadFolders",
+       [] {
+         SetFolders({"/docs/in", "/films/x"});
+       },
+       {"folders: .[1]: there is no share 'films' for '/films/x'\n"
+        "         $ fileindex folder prune\n"},
+       [] { SetFolders({"/docs/in"}); }},
+      {"Rights",
+       [] {
+         chmod((kRoot / "tmp").c_str(), 0500);
+         WriteText(vexlo::fileindex::kFileIndexStatusLockPath.Get(), "");
+         chmod(vexlo::fileindex::kFileIndexStatusLockPath.Get().c_str(), 0);
+       },
+       {"error    state: '" + (kRoot / "tmp") +
+            "' cannot be written: Permission denied\n"
+            "         $ sudo chown " +
+            std::to_string(geteuid()) + " '" + (kRoot / "tmp") + "'\n",
+        "error    state: the lock file '"},
+       [] {
+         chmod((kRoot / "tmp").c_str(), 0700);
+         fs::remove(vexlo::fileindex::kFileIndexStatusLockPath.Get());
+       }},
+      {"NoFolderForLocks",
+       [] { fs::remove_all(kRoot / "tmp"); },
+       {"         $ mkdir -p '" + (kRoot / "tmp") + "'\n"},
+       [] { kRoot.MakeFolder("tmp"); }},
+      {"NoIndex",
+       [] { vexlo::fileindex::elastic::ShareIndexDelete("docs"); },
+       {"error    kavoelasticd: the share 'docs' has no index\n"},
+       [] {}},
+      {"NoEngine",
+       [&] { EndEngine(); },
+       {"error    kavoelasticd: does not run, so nothing is searched or indexed",
+        "         $ '" KAVOELASTICD_PROGRAM "' &\n"},
+       [] {}},
+  };
+  for (const auto& step : cases) {
+    SCOPED_TRACE(step.name);
+    step.change();
+    const Result found = Run("doctor", WithoutRights());
+    EXPECT_EQ(found.status, 1);
+    for (const std::string& line : step.lines) {
+      EXPECT_NE(found.out.find(line), std::string::npos) << line << "is not in\n" << found.out;
+    }
     step.back();
   }
 }

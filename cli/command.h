@@ -62,9 +62,12 @@ struct Command {
 };
 
 // One a command family.
+std::vector<Command> AuditCommands();
 std::vector<Command> ConfigCommands();
+std::vector<Command> DoctorCommands();
 std::vector<Command> ExplainCommands();
 std::vector<Command> ExtractCommands();
+std::vector<Command> FailedCommands();
 std::vector<Command> FolderCommands();
 std::vector<Command> IndexCommands();
 std::vector<Command> PauseCommands();

@@ -13,7 +13,8 @@ int main(int argc, char** argv) {
        {vexlo::cli::WatchCommands, vexlo::cli::QueueCommands, vexlo::cli::ExplainCommands,
         vexlo::cli::ShareCommands, vexlo::cli::IndexCommands, vexlo::cli::SearchCommands,
         vexlo::cli::PauseCommands, vexlo::cli::ConfigCommands, vexlo::cli::FolderCommands,
-        vexlo::cli::StatusCommands, vexlo::cli::ExtractCommands, vexlo::cli::UpCommands}) {
+        vexlo::cli::StatusCommands, vexlo::cli::ExtractCommands, vexlo::cli::AuditCommands,
+        vexlo::cli::DoctorCommands, vexlo::cli::FailedCommands, vexlo::cli::UpCommands}) {
     const std::vector<Command> more = family();
     commands.insert(commands.end(), more.begin(), more.end());
   }

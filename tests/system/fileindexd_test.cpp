@@ -79,7 +79,7 @@ class Coming {
 class Fileindexd : public testing::Test {
  protected:
   Fileindexd() {
-    for (const char* const each : {"var", "vol", "tmp", "indexer.log"}) {
+    for (const char* const each : {"var", "vol", "tmp", "fileindexd.log"}) {
       fs::remove_all(kRoot / each);
     }
     for (const char* const folder : {"var/run", "var/packages/Vexlo/etc", "vol/docs", "tmp"}) {
@@ -89,8 +89,10 @@ class Fileindexd : public testing::Test {
     WriteText(kRoot / "var/packages/Vexlo/etc/fileindex.folders",
               "[" + FolderText("/docs/in") + "]");
     fs::create_directory(docs_ / "in");
+    Start(extractor_, KAVOCONTENTEXTRACTD_PROGRAM, "kavocontentextractd");
   }
   ~Fileindexd() override {
+    End(extractor_, SIGKILL);
     EndIndexer(SIGKILL);
     EndEngine(SIGKILL);
   }
@@ -103,8 +105,8 @@ class Fileindexd : public testing::Test {
     kRoot.SetShares(R"({"name":"docs","path":")" + docs_.string() + "\"" + more + "}");
   }
 
-  void StartEngine() { Start(engine_, KAVOELASTICD_PROGRAM, "engine.log"); }
-  void StartIndexer() { Start(indexer_, FILEINDEXD_PROGRAM " --cycle 100", "indexer.log"); }
+  void StartEngine() { Start(engine_, KAVOELASTICD_PROGRAM, "kavoelasticd"); }
+  void StartIndexer() { Start(indexer_, FILEINDEXD_PROGRAM " --cycle 100", "fileindexd"); }
   int EndEngine(int signal) { return End(engine_, signal); }
   void SignalEngine(int signal) { kill(engine_->pid, signal); }
   int EndIndexer(int signal) { return End(indexer_, signal); }
@@ -125,7 +127,7 @@ class Fileindexd : public testing::Test {
   // `gone` watches the queue's folder.
   void AwaitAllDone(const Coming& gone) const {
     do {
-      ASSERT_TRUE(gone.Await(SnapshotName())) << ReadText(kRoot / "indexer.log");
+      ASSERT_TRUE(gone.Await(SnapshotName())) << ReadText(kRoot / "fileindexd.log");
     } while (fs::exists(queue_) || fs::exists(queue_.string() + ".tmp"));
   }
   void Append(const std::vector<std::string>& lines) const {
@@ -197,18 +199,19 @@ class Fileindexd : public testing::Test {
 
  private:
   static void Start(std::unique_ptr<Program>& program, const std::string& command,
-                    const std::string& log) {
+                    const std::string& name) {
     // The log goes to a file, as a pipe that nobody reads would hold the daemon up.
     const Coming ready(kRoot / "var/run", IN_MOVED_TO);
-    program = std::make_unique<Program>("exec 2>>" + (kRoot / log), command);
-    const std::string name = log == "engine.log" ? "kavoelasticd.sock" : "fileindexd.sock";
-    ASSERT_TRUE(ready.Await(name)) << ReadText(kRoot / log);
+    const std::string log = kRoot / (name + ".log");
+    program = std::make_unique<Program>("exec 2>>" + log, command);
+    ASSERT_TRUE(ready.Await(name + ".sock")) << ReadText(log);
   }
   static int End(std::unique_ptr<Program>& program, int signal) {
     const std::unique_ptr<Program> ended = std::move(program);
     return ended == nullptr ? 0 : ended->End(signal);
   }
 
+  std::unique_ptr<Program> extractor_;
   std::unique_ptr<Program> engine_;
   std::unique_ptr<Program> indexer_;
 };
@@ -689,7 +692,8 @@ TEST_F(Fileindexd, WaitsForAListOfFoldersThatCanBeRead) {
   StartEngine();
   StartIndexer();
   Append({});
-  while (ReadText(kRoot / "indexer.log").find("the folders are not known") == std::string::npos) {
+  while (ReadText(kRoot / "fileindexd.log").find("the folders are not known") ==
+         std::string::npos) {
   }
   const Coming gone(queue_.parent_path(), IN_DELETE);
   WriteText(folders, text);

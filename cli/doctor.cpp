@@ -1,0 +1,575 @@
+#include "cli/doctor.h"
+
+#include <json/value.h>
+#include <sys/stat.h>
+#include <sys/statvfs.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <charconv>
+#include <ctime>
+#include <filesystem>
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <set>
+#include <system_error>
+#include <utility>
+
+#include "cli/config_check.h"
+#include "cli/daemon_stats.h"
+#include "cli/quarantine_list.h"
+#include "cli/text.h"
+#include "common/error.h"
+#include "common/file.h"
+#include "common/json.h"
+#include "common/sdk/share.h"
+#include "common/string.h"
+#include "fileindex/elastic_control/share_index.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/paths.h"
+#include "fileindex/status_mgr.h"
+#include "fileindex/util/path_policy.h"
+#include "kavo/local/content.h"
+#include "kavo/local/monitor_queues.h"
+#include "kavo/local/shares.h"
+
+namespace vexlo::cli {
+namespace {
+
+using fileindex::FixedPath;
+
+constexpr FixedPath kRunFolder("/var/run");
+constexpr FixedPath kNotifySocket("/var/run/evnotifyd.sock");
+
+// Where the daemons and this tool keep what they know.
+constexpr FixedPath kStateFolders[] = {
+    FixedPath("/var/run"),
+    FixedPath("/tmp"),
+    FixedPath("/etc/kavo"),
+    FixedPath("/var/packages/Vexlo/etc"),
+    FixedPath("/var/lib/kavo/elastic"),
+    FixedPath("/var/lib/kavo/evnotify"),
+    FixedPath("/var/lib/kavo/extract"),
+    FixedPath("/var/lib/kavo/fileindex"),
+    FixedPath("/var/lib/kavo/fileindex/db"),
+    FixedPath("/var/lib/kavo/fileindex/queue"),
+    FixedPath("/var/lib/kavo/fileindexd"),
+};
+constexpr FixedPath kLockFiles[] = {
+    fileindex::kFileIndexFoldersLockPath,
+    fileindex::kFileIndexStatusLockPath,
+    FixedPath("/etc/kavo/shares.json.lock"),
+};
+
+constexpr uint64_t kLeastFree = uint64_t{100} << 20;  // Below it nothing is indexed.
+constexpr uint64_t kLittleFree = uint64_t{1} << 30;
+constexpr uint64_t kFewWatches = 8192;          // More that a tree may want at any time.
+constexpr uint64_t kUsualQueuedEvents = 16384;  // The kernel's own default.
+constexpr uint64_t kWantedQueuedEvents = 131072;
+constexpr uint64_t kSpareInstances = 8;  // For everybody else's programs.
+constexpr int64_t kFuture = 3600;        // Seconds that a clock may be ahead.
+constexpr size_t kMostNamed = 3;
+
+constexpr int kIndexMissing = 2002;
+
+std::string Quoted(const std::string& word) {
+  std::string quoted = "'";
+  for (const char c : word) {
+    quoted += c == '\'' ? std::string("'\\''") : std::string(1, c);
+  }
+  return quoted + "'";
+}
+
+std::string Mebibytes(uint64_t bytes) { return Grouped(bytes >> 20) + " MiB"; }
+
+// A number of the kernel's, 0 when it is not told.
+uint64_t ReadLimit(const std::string& name) {
+  std::string text;
+  uint64_t number = 0;
+  if (ReadFile(text, "/proc/sys/fs/inotify/" + name)) {
+    std::from_chars(text.data(), text.data() + text.size(), number);
+  }
+  return number;
+}
+
+std::string SetLimit(const std::string& name, uint64_t value) {
+  return "sudo sysctl fs.inotify." + name + "=" + std::to_string(value);
+}
+
+// The program that stands beside this one, or what the shell finds under its name.
+std::string StartCommand(const std::string& program) {
+  std::error_code ignored;
+  const auto self = std::filesystem::read_symlink("/proc/self/exe", ignored);
+  const auto beside = self.parent_path() / program;
+  return (!ignored && access(beside.c_str(), X_OK) == 0 ? Quoted(beside.string()) : program) + " &";
+}
+
+class Examination {
+ public:
+  std::vector<Finding> Run() {
+    const std::pair<const char*, void (Examination::*)()> steps[] = {
+        {"config", &Examination::LookAtConfig},
+        {"state", &Examination::LookAtPermissions},
+        {"kavoelasticd", &Examination::LookAtEngine},
+        {"fileindexd", &Examination::LookAtIndexDaemon},
+        {"evnotifyd", &Examination::LookAtNotifyDaemon},
+        {"kavocontentextractd", &Examination::LookAtExtractor},
+        {"inotify", &Examination::LookAtInotify},
+        {"mounts", &Examination::LookAtMounts},
+        {"space", &Examination::LookAtSpace},
+        {"shares", &Examination::LookAtStatus},
+        {"clock", &Examination::LookAtDates},
+    };
+    for (const auto& [subject, step] : steps) {
+      subject_ = subject;
+      const size_t before = findings_.size();
+      try {
+        (this->*step)();
+      } catch (const std::exception& error) {
+        Add(Severity::kError, std::string("cannot be looked at: ") + error.what());
+      }
+      const auto begin = findings_.begin() + static_cast<ptrdiff_t>(before);
+      std::stable_sort(begin, findings_.end(),
+                       [](const Finding& a, const Finding& b) { return a.severity > b.severity; });
+    }
+    return std::move(findings_);
+  }
+
+ private:
+  void Add(Severity severity, std::string what, std::string remedy = "") {
+    findings_.push_back({severity, subject_, std::move(what), std::move(remedy)});
+  }
+
+  void LookAtConfig();
+  void LookAtPermissions();
+  void LookAtEngine();
+  void LookAtIndexDaemon();
+  void LookAtNotifyDaemon();
+  void LookAtExtractor();
+  void LookAtInotify();
+  void LookAtMounts();
+  void LookAtSpace();
+  void LookAtStatus();
+  void LookAtDates();
+
+  std::optional<Json::Value> AskOne(const std::string& socket, const std::string& request,
+                                    Severity severity, const std::string& effect);
+  void LookAtVolume(const std::string& path, const std::string& of);
+
+  const char* subject_ = "";
+  std::vector<Finding> findings_;
+  // What the steps before found; null where they could not.
+  std::unique_ptr<fileindex::FolderMgr> folders_;
+  std::set<std::string> shares_;  // Indexed and there.
+  std::optional<Json::Value> notify_stats_;
+  bool engine_answers_ = false;
+};
+
+void Examination::LookAtConfig() {
+  size_t count = 0;
+  for (const auto& [file, place, what] : CheckConfig(count)) {
+    const bool is_gone_share = what.starts_with("there is no share '");
+    Add(Severity::kError, file + ": " + (place.empty() ? "" : place + ": ") + what,
+        is_gone_share ? "fileindex folder prune" : "${EDITOR:-vi} " + Quoted(file));
+  }
+  try {
+    folders_ = std::make_unique<fileindex::FolderMgr>();
+    const std::set<std::string> known = sdk::SDKShare::Enum();
+    for (const std::string& share : folders_->GetIndexedShares()) {
+      if (known.contains(share)) {
+        shares_.insert(share);
+      }
+    }
+  } catch (const Error&) {
+    return;  // Told above.
+  }
+  Add(Severity::kOk, Counted(count, "folder") + " of " + Counted(shares_.size(), "share") +
+                         (count == 1 ? " is" : " are") + " configured");
+}
+
+void Examination::LookAtPermissions() {
+  size_t well = 0;
+  for (const FixedPath& fixed : kStateFolders) {
+    const std::string path = fixed.Get();
+    const bool is_needed = path == fileindex::GetFileIndexRoot() + "/tmp";
+    struct stat info {};
+    const int error = stat(path.c_str(), &info) == 0 ? 0 : errno;
+    if (error == ENOENT) {
+      // The others are made by whoever needs them.
+      if (is_needed) {
+        Add(Severity::kError, "'" + path + "' is missing, and holds the locks",
+            "mkdir -p " + Quoted(path));
+      }
+    } else if (error == 0 && !S_ISDIR(info.st_mode)) {
+      Add(Severity::kError, "'" + path + "' is no folder",
+          "mv " + Quoted(path) + " " + Quoted(path + ".old"));
+    } else if (error != 0 || access(path.c_str(), R_OK | W_OK | X_OK) != 0) {
+      Add(Severity::kError,
+          "'" + path + "' cannot be written: " + std::generic_category().message(errno),
+          "sudo chown " + std::to_string(geteuid()) + " " + Quoted(path));
+    } else {
+      ++well;
+    }
+  }
+  for (const FixedPath& fixed : kLockFiles) {
+    const std::string path = fixed.Get();
+    struct stat info {};
+    if (lstat(path.c_str(), &info) != 0) {
+      continue;
+    }
+    if (!S_ISREG(info.st_mode) || access(path.c_str(), R_OK) != 0) {
+      Add(Severity::kError,
+          "the lock file '" + path + "' of user " + std::to_string(info.st_uid) +
+              " cannot be opened",
+          "sudo rm " + Quoted(path));
+    } else {
+      ++well;
+    }
+  }
+  std::map<uid_t, std::string> owners;
+  for (const char* const name :
+       {"kavoelasticd", "fileindexd", "evnotifyd", "kavocontentextractd"}) {
+    struct stat info {};
+    const std::string path = kRunFolder.Get() + "/" + name + ".sock";
+    if (lstat(path.c_str(), &info) == 0) {
+      std::string& names = owners[info.st_uid];
+      names += (names.empty() ? "" : ", ") + std::string(name);
+    }
+  }
+  for (const auto& [owner, names] : owners) {
+    if (owners.size() > 1) {
+      Add(Severity::kWarning, "the daemons run as different users, and may not reach each other: " +
+                                  names + " as user " + std::to_string(owner));
+    }
+  }
+  Add(Severity::kOk, Grouped(well) + " folders and locks can be used");
+}
+
+// Says what does not work without the daemon when it does not answer.
+std::optional<Json::Value> Examination::AskOne(const std::string& socket,
+                                               const std::string& request, Severity severity,
+                                               const std::string& effect) {
+  std::string reason;
+  std::optional<Json::Value> reply = AskDaemon(socket, request, &reason);
+  if (!reply) {
+    const bool is_listening = !reason.starts_with("nobody answers");
+    Add(severity,
+        (is_listening ? "runs but gives no answer, " : "does not run, ") + effect + " (" + reason +
+            ")",
+        is_listening ? "kill $(cat " + Quoted(kRunFolder.Get() + "/" + subject_ + ".pid") + ")"
+                     : StartCommand(subject_));
+  }
+  return reply;
+}
+
+void Examination::LookAtEngine() {
+  const auto reply = AskOne(fileindex::kElasticdSocketPath.Get(), R"({"command":"index_list"})",
+                            Severity::kError, "so nothing is searched or indexed");
+  if (!reply) {
+    return;
+  }
+  engine_answers_ = true;
+  std::map<std::string, std::string> states;
+  for (const Json::Value& index : (*reply)["data"]) {
+    states[index["id"].asString()] = index["state"].asString();
+  }
+  size_t active = 0;
+  for (const std::string& share : shares_) {
+    const std::string state = states[fileindex::elastic::GetFileIndexID(share)];
+    if (state == "active") {
+      ++active;
+    } else if (state == "paused") {
+      Add(Severity::kWarning, "the index of '" + share + "' is paused, so it is not searched",
+          "fileindex index resume " + Quoted(share));
+    } else if (state.empty()) {
+      Add(Severity::kError, "the share '" + share + "' has no index",
+          "fileindex index create " + Quoted(share) + " && fileindex folder reindex " +
+              Quoted("/" + share));
+    } else {
+      Add(Severity::kError, "the index of '" + share + "' is " + state,
+          "fileindex index delete " + Quoted(share) + " && fileindex folder reindex " +
+              Quoted("/" + share));
+    }
+  }
+  Add(Severity::kOk, "listens and answers; " + Grouped(active) +
+                         (active == 1 ? " index is active" : " indexes are active"));
+}
+
+void Examination::LookAtIndexDaemon() {
+  const auto reply =
+      AskOne(fileindex::kFileIndexDaemonSocketPath.Get(), R"({"type":"stats","data":null})",
+             Severity::kError, "so changes wait in the queues");
+  if (!reply) {
+    return;
+  }
+  std::set<std::string> without = shares_;
+  for (const Json::Value& worker : (*reply)["shares"]) {
+    const std::string share = worker["share"].asString();
+    const std::string state = worker["state"].asString();
+    without.erase(share);
+    if (state == "failing" || state == "unavailable") {
+      const std::string reason = worker["last_error"].asString();
+      Add(Severity::kError,
+          "indexing of '" + share + "' is " + state + (reason.empty() ? "" : ": " + reason));
+    }
+  }
+  for (const std::string& share : without) {
+    Add(Severity::kError, "nobody works on the indexed share '" + share + "'",
+        "fileindex folder reindex " + Quoted("/" + share));
+  }
+  Add(Severity::kOk, "listens and answers; " + Counted((*reply)["shares"].size(), "worker"));
+}
+
+void Examination::LookAtNotifyDaemon() {
+  notify_stats_ = AskOne(kNotifySocket.Get(), R"({"command":"stats"})", Severity::kError,
+                         "so changes of files go unseen until it is started");
+  if (!notify_stats_) {
+    return;
+  }
+  std::vector<std::string> roots;
+  for (const Json::Value& queue : (*notify_stats_)["queues"]) {
+    for (const Json::Value& root : queue["roots"]) {
+      roots.push_back(root.asString());
+    }
+    if (queue["state"] != "degraded") {
+      continue;
+    }
+    const std::string reason = queue["reason"].asString();
+    const bool wants_watches = reason.find("max_user_watches") != std::string::npos;
+    const bool wants_instances = reason.find("max_user_instances") != std::string::npos ||
+                                 reason.find("inotify cannot be used") != std::string::npos;
+    Add(Severity::kWarning,
+        "not all changes are seen at once for " + queue["queue"].asString() + ": " + reason,
+        wants_watches     ? SetLimit("max_user_watches", 2 * ReadLimit("max_user_watches"))
+        : wants_instances ? SetLimit("max_user_instances", 2 * ReadLimit("max_user_instances"))
+                          : "");
+  }
+  if (folders_ != nullptr) {
+    for (const auto& folder : folders_->GetFolders()) {
+      if (!shares_.contains(folder->GetShare())) {
+        continue;
+      }
+      const std::string path = folder->GetFullPath();
+      if (std::none_of(roots.begin(), roots.end(),
+                       [&](const std::string& root) { return IsSameOrBelow(path, root); })) {
+        Add(Severity::kError, "nobody watches the indexed folder '" + path + "'",
+            "fileindex folder delete " + Quoted(folder->GetPath()) + " && fileindex folder add " +
+                Quoted(path));
+      }
+    }
+  }
+  for (const auto& [app, reason] : kavo::local::ReadMonitorQueues().unreadable) {
+    Add(Severity::kError, "the registrations of '" + app + "' cannot be used: " + reason);
+  }
+  Add(Severity::kOk, "listens and answers; " + Counted(roots.size(), "folder") + " watched");
+}
+
+void Examination::LookAtExtractor() {
+  const auto reply =
+      AskOne(kavo::local::ContentSocket(), R"({"command":"stats"})", Severity::kWarning,
+             "so of all but plain texts the content is not indexed");
+  const QuarantineList quarantine = ReadQuarantine();
+  const uint64_t count =
+      reply ? (*reply)["quarantined"].asUInt64() : uint64_t{quarantine.files.size()};
+  if (!quarantine.files.empty() || (!quarantine.fault.empty() && count > 0)) {
+    Add(Severity::kWarning,
+        Counted(quarantine.fault.empty() ? quarantine.files.size() : count, "file") +
+            " ended the processes that read them, and are left alone until they change",
+        "fileindex failed");
+  }
+  if (!quarantine.fault.empty()) {
+    Add(Severity::kWarning, "the list of quarantined files is not known: " + quarantine.fault);
+  }
+  if (reply) {
+    Add(Severity::kOk, "listens and answers; " + Counted((*reply)["files"].asUInt64(), "file") +
+                           " asked for, " + Counted((*reply)["deaths"].asUInt64(), "worker") +
+                           " lost");
+  }
+}
+
+void Examination::LookAtInotify() {
+  const uint64_t most = ReadLimit("max_user_watches");
+  const uint64_t instances = ReadLimit("max_user_instances");
+  const uint64_t events = ReadLimit("max_queued_events");
+  uint64_t watches = 0;
+  uint64_t queues = 0;
+  uint64_t overflows = 0;
+  if (notify_stats_) {
+    for (const Json::Value& queue : (*notify_stats_)["queues"]) {
+      watches += queue["watches"].asUInt64();
+      overflows += queue["overflows"].asUInt64();
+      ++queues;
+    }
+  }
+  const size_t before = findings_.size();
+  if (watches + std::max(kFewWatches, watches / 4) > most) {
+    Add(Severity::kWarning,
+        Grouped(watches) + " folders are watched of " + Grouped(most) +
+            " that all programs of a user may watch (max_user_watches)",
+        SetLimit("max_user_watches", 2 * (watches + kFewWatches)));
+  }
+  if (queues + kSpareInstances > instances) {
+    Add(Severity::kWarning,
+        Counted(queues, "queue") + " and " + Grouped(instances) +
+            " inotify instances for all programs of a user (max_user_instances)",
+        SetLimit("max_user_instances", 2 * (queues + 2 * kSpareInstances)));
+  }
+  if (events < kUsualQueuedEvents || overflows > 0) {
+    Add(Severity::kWarning,
+        (overflows > 0 ? "events were lost " + Counted(overflows, "time") +
+                             " and shares compared "
+                             "as a whole: "
+                       : "") +
+            "the kernel keeps " + Grouped(events) + " events (max_queued_events)",
+        SetLimit("max_queued_events", std::max(kWantedQueuedEvents, 2 * events)));
+  }
+  if (findings_.size() == before) {
+    Add(Severity::kOk, Grouped(watches) + " of " + Grouped(most) + " watches are used, " +
+                           Grouped(instances) + " instances and " + Grouped(events) +
+                           " queued events allowed");
+  }
+}
+
+void Examination::LookAtMounts() {
+  if (folders_ == nullptr) {
+    return;
+  }
+  size_t well = 0;
+  for (const auto& folder : folders_->GetFolders()) {
+    if (!shares_.contains(folder->GetShare())) {
+      continue;
+    }
+    const std::string path = folder->GetFullPath();
+    bool is_well = true;
+    // Of one that is not there nothing else can be told, and that is told above.
+    for (const fileindex::RuleVerdict& verdict : fileindex::ExplainFullPath(path)) {
+      const std::string_view rule = verdict.rule;
+      if (verdict.answer == fileindex::RuleVerdict::kRefuses && access(path.c_str(), F_OK) == 0 &&
+          (rule == "file_system" || rule == "mount_point" || rule == "snapshot")) {
+        is_well = false;
+        Add(Severity::kError, "'" + path + "' is not indexed: " + verdict.reason,
+            "fileindex folder delete " + Quoted(folder->GetPath()));
+      }
+    }
+    well += is_well ? 1 : 0;
+  }
+  Add(Severity::kOk, Counted(well, "folder") + " on file systems that are indexed");
+}
+
+void Examination::LookAtVolume(const std::string& path, const std::string& of) {
+  std::filesystem::path there = path;
+  struct statvfs info {};
+  while (statvfs(there.c_str(), &info) != 0 && there.has_relative_path()) {
+    there = there.parent_path();
+  }
+  const uint64_t free = uint64_t{info.f_bavail} * info.f_frsize;
+  const bool lacks_inodes = info.f_files > 0 && info.f_favail < 1000;
+  const Severity severity = free < kLeastFree || lacks_inodes ? Severity::kError
+                            : free < kLittleFree              ? Severity::kWarning
+                                                              : Severity::kOk;
+  Add(severity,
+      Mebibytes(free) + " are free for " + of + " in '" + path + "'" +
+          (lacks_inodes ? ", and " + Counted(info.f_favail, "inode") : ""),
+      severity == Severity::kOk ? "" : "df -h " + Quoted(there.string()));
+}
+
+void Examination::LookAtSpace() {
+  LookAtVolume(kavo::local::Root() + "/var/lib/kavo/fileindex/queue", "the queues");
+  std::set<std::string> seen;
+  for (const std::string& share : shares_) {
+    const std::string folder = Dirname(sdk::SDKShare(share).GetDBPath());
+    if (seen.insert(folder).second) {
+      LookAtVolume(folder, "the index");
+    }
+  }
+}
+
+void Examination::LookAtStatus() {
+  const fileindex::StatusMgr status;
+  for (const std::string& share : shares_) {
+    const unsigned bits = status.GetShareStatus(share);
+    if (bits != 0) {
+      Add(Severity::kWarning,
+          "'" + share + "' is marked " +
+              ((bits & fileindex::SS_NEED_REBUILD) != 0 ? "to be built anew"
+                                                        : "for a reindex, as a change was lost"),
+          "fileindex folder reindex " + Quoted("/" + share));
+    }
+    const sdk::SDKShare asked(share);
+    if (IsDirExist(asked.GetPath(), /*follow_link=*/false) && !asked.CanBeIndexed()) {
+      Add(Severity::kError, "'" + share + "' is " +
+                                (asked.IsLocked() ? "locked by encryption" : "read-only") +
+                                ", so its index rests");
+    }
+  }
+  const long resume_time = status.GetPauseInfo();
+  if (resume_time == 0) {
+    Add(Severity::kWarning, "indexing is paused without an end", "fileindex resume");
+  } else if (resume_time > time(nullptr)) {
+    Add(Severity::kOk, "indexing is paused for " +
+                           Counted(static_cast<uint64_t>(resume_time - time(nullptr)), "second"));
+  } else {
+    Add(Severity::kOk, "indexing is not paused");
+  }
+}
+
+// Files that are newer than now are found first by every search for new ones.
+void Examination::LookAtDates() {
+  if (!engine_answers_ || shares_.empty()) {
+    return;
+  }
+  Json::Value request;
+  request["command"] = "search";
+  for (const std::string& share : shares_) {
+    request["data"]["ids"].append(fileindex::elastic::GetFileIndexID(share));
+  }
+  request["data"]["modified_min"] = Json::Int64{time(nullptr) + kFuture};
+  request["data"]["size"] = static_cast<Json::UInt>(kMostNamed);
+  request["data"]["sort"] = "modified";
+  request["data"]["descending"] = true;
+  std::string reason;
+  const auto reply =
+      AskDaemon(fileindex::kElasticdSocketPath.Get(), JsonToString(request), &reason);
+  if (!reply || !(*reply)["success"].asBool()) {
+    const int code = reply ? (*reply)["error"]["code"].asInt() : 0;
+    if (code != kIndexMissing) {  // Told above.
+      Add(Severity::kWarning,
+          "the dates of files cannot be asked for" + (reason.empty() ? "" : ": " + reason));
+    }
+    return;
+  }
+  const uint64_t total = (*reply)["total"].asUInt64();
+  if (total == 0) {
+    Add(Severity::kOk, "no file is of the future");
+    return;
+  }
+  std::string paths;
+  for (const Json::Value& hit : (*reply)["data"]) {
+    paths += (paths.empty() ? "" : " ") + Quoted(hit["path"].asString());
+  }
+  Add(Severity::kWarning,
+      Counted(total, "file") + (total == 1 ? " is" : " are") +
+          " dated in the future: the clock of this machine or of another one is wrong",
+      "touch -c " + paths);
+}
+
+}  // namespace
+
+const char* NameOf(Severity severity) {
+  switch (severity) {
+    case Severity::kOk:
+      return "ok";
+    case Severity::kWarning:
+      return "warning";
+    case Severity::kError:
+      break;
+  }
+  return "error";
+}
+
+std::vector<Finding> Diagnose() { return Examination().Run(); }
+
+}  // namespace vexlo::cli

@@ -6,6 +6,7 @@
 #include <filesystem>
 #include <fstream>
 
+#include "support/program.h"
 #include "support/temp_folder.h"
 
 namespace {
@@ -84,6 +85,9 @@ const CliCase kEngineCases[] = {
     {"SearchFilesOnly", "search --type document --below vol --newer 1d --larger 5 --sort -size", 0,
      "*a.txt\n", ""},
     {"SearchNothing", "search", 2, "", "wants words"},
+    {"PutPage", "doc put docs vol/docs/page.html", 0, "*indexed: /", ""},
+    {"SearchPage", "search lighthouse", 0, "*vol/docs/page.html\n", ""},
+    {"SearchMarkup", "search strong", 1, "", "0 files found"},
     {"SearchBadSize", "search x --larger 5q", 2, "", "'5q' is no size"},
     {"SearchBadDate", "search x --newer soon", 2, "", "'soon' is no date"},
     {"SearchBadType", "search x --type film", 2, "", "'film' is no type"},
@@ -179,6 +183,7 @@ TEST_F(Cli, SearchesWhatItHasIndexed) {
   std::filesystem::create_directories(files_ / "vol/docs");
   WriteText(files_ / "vol/docs/a.txt", "The harbour museum.");
   WriteText(files_ / "vol/docs/Caf\xC3\xA9 \xE9.md", "apples");
+  WriteText(files_ / "vol/docs/page.html", "<html><p>The <strong>light</strong>house");
   Start("search museum");
   EXPECT_EQ(End(), 3);
   EXPECT_NE(err_.find("kavoelasticd does not run"), std::string::npos) << err_;
@@ -191,9 +196,13 @@ TEST_F(Cli, SearchesWhatItHasIndexed) {
   ASSERT_TRUE(fgets(line, sizeof(line), engine) != nullptr);
   const std::string said = line;
   ASSERT_NE(said.find("ready"), std::string::npos) << said;
+  Program extractor("cd " + files_.Path() + "; export FILEINDEX_ROOT=$PWD/root",
+                    "timeout 60 " KAVOCONTENTEXTRACTD_PROGRAM " 2>&1");
+  ASSERT_TRUE(extractor.Await("ready\n")) << extractor.text;
   for (const CliCase& row : kEngineCases) {
     Check(row);
   }
+  EXPECT_EQ(extractor.End(SIGTERM), 0);
   kill(std::stoi(said.substr(said.find('[') + 1)), SIGTERM);
   while (fgets(line, sizeof(line), engine) != nullptr) {
   }

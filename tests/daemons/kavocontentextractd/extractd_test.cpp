@@ -255,8 +255,10 @@ TEST_F(ExtractdTest, GivesWorkersNothingTheyDoNotNeed) {
     std::erase(line, ' ');
     found += line + ";";
   }
-  for (const char* const limit :
-       {"Maxaddressspace536870912536870912bytes", "Maxfilesize00bytes", "Maxcorefilesize00bytes"}) {
+  const std::string memory = kLimitsMemory ? "536870912536870912" : "unlimitedunlimited";
+  const std::string limits_wanted[] = {"Maxaddressspace" + memory + "bytes", "Maxfilesize00bytes",
+                                       "Maxcorefilesize00bytes"};
+  for (const std::string& limit : limits_wanted) {
     EXPECT_NE(found.find(limit), std::string::npos) << limit << " is not in " << found;
   }
   const std::string status = ReadText(proc + "/status");

@@ -133,8 +133,7 @@ void Read(const Source& source, std::string type, const std::string& head, Docum
 }  // namespace
 
 Extractor::Extractor()
-    : types_(magic_open(MAGIC_MIME_TYPE | MAGIC_NO_CHECK_COMPRESS | MAGIC_NO_CHECK_TAR |
-                        MAGIC_NO_CHECK_ELF | MAGIC_NO_CHECK_CDF | MAGIC_NO_CHECK_JSON |
+    : types_(magic_open(MAGIC_MIME_TYPE | MAGIC_NO_CHECK_COMPRESS | MAGIC_NO_CHECK_JSON |
                         MAGIC_NO_CHECK_CSV),
              magic_close) {
   if (types_ == nullptr || magic_load(types_.get(), nullptr) != 0) {

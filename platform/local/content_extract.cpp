@@ -176,7 +176,12 @@ bool ParseReply(const std::string& text, Json::Value& reply) {
   Json::CharReaderBuilder builder;
   builder["collectComments"] = false;
   const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
-  return reader->parse(text.data(), text.data() + text.size(), &reply, nullptr) && reply.isObject();
+  try {
+    return reader->parse(text.data(), text.data() + text.size(), &reply, nullptr) &&
+           reply.isObject();
+  } catch (const Json::Exception&) {  // Nested too deep.
+    return false;
+  }
 }
 
 std::string ToText(const Json::Value& value) {

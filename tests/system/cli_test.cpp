@@ -103,6 +103,9 @@ const CliCase kEngineCases[] = {
     {"SearchFilesOnly", "search --type document --below vol --newer 1d --larger 5 --sort -size", 0,
      "*a.txt\n", ""},
     {"SearchNothing", "search", 2, "", "wants words"},
+    {"PutPage", "doc put docs vol/docs/page.html", 0, "*indexed: /", ""},
+    {"SearchPage", "search lighthouse", 0, "*vol/docs/page.html\n", ""},
+    {"SearchMarkup", "search strong", 1, "", "0 files found"},
     {"SearchBadSize", "search x --larger 5q", 2, "", "'5q' is no size"},
     {"SearchBadDate", "search x --newer soon", 2, "", "'soon' is no date"},
     {"SearchBadType", "search x --type film", 2, "", "'film' is no type"},
@@ -267,10 +270,15 @@ TEST_F(Cli, SearchesWhatItHasIndexed) {
   std::filesystem::create_directories(files_ / "vol/docs");
   WriteText(files_ / "vol/docs/a.txt", "The harbour museum.");
   WriteText(files_ / "vol/docs/Caf\xC3\xA9 \xE9.md", "apples");
+  WriteText(files_ / "vol/docs/page.html", "<html><p>The <strong>light</strong>house");
   Start("search museum");
   EXPECT_EQ(End(), 3);
   EXPECT_NE(err_.find("kavoelasticd does not run"), std::string::npos) << err_;
+  const std::string in_root = "cd " + files_.Path() + "; export FILEINDEX_ROOT=$PWD/root";
+  Program extractor(in_root, "timeout 60 " KAVOCONTENTEXTRACTD_PROGRAM " 2>&1");
+  ASSERT_TRUE(extractor.Await("ready\n")) << extractor.text;
   CheckWithEngine(kEngineCases);
+  EXPECT_EQ(extractor.End(SIGTERM), 0);
 }
 
 TEST_F(Cli, AdministersFolders) {

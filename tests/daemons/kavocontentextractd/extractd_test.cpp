@@ -25,6 +25,7 @@ namespace vexlo::extractd {
 namespace {
 
 const PrivateRoot kRoot;
+constexpr bool kLimitsMemory = *WORKER_MEMORY == '\0';
 
 std::string LinkOf(const std::filesystem::path& link) {
   std::error_code error;
@@ -40,11 +41,11 @@ class ExtractdTest : public testing::Test {
     std::filesystem::remove_all(kRoot / "var");
   }
 
-  void Start(const std::string& arguments = "", bool limits_memory = false) {
+  void Start(const std::string& arguments = "") {
     if (!std::filesystem::exists(kRoot / "var/run")) {
       kRoot.MakeFolder("var/run");
     }
-    daemon_.emplace(":", EXTRACTD " " + arguments + (limits_memory ? "" : WORKER_MEMORY) + " 2>&1");
+    daemon_.emplace(":", EXTRACTD " " + arguments + WORKER_MEMORY " 2>&1");
     ASSERT_TRUE(daemon_->Await("ready\n")) << daemon_->text;
   }
   void Stop(int signal = SIGTERM) {
@@ -243,7 +244,7 @@ TEST_F(ExtractdTest, RefusesWhatIsNoRequest) {
 }
 
 TEST_F(ExtractdTest, GivesWorkersNothingTheyDoNotNeed) {
-  Start("--workers 1 ", /*limits_memory=*/true);
+  Start("--workers 1 ");
   Parse(Write("a.pdf", Pdf()));
   ASSERT_EQ(Workers().size(), 1);
   const pid_t worker = Workers()[0];
@@ -254,8 +255,10 @@ TEST_F(ExtractdTest, GivesWorkersNothingTheyDoNotNeed) {
     std::erase(line, ' ');
     found += line + ";";
   }
-  for (const char* const limit :
-       {"Maxaddressspace536870912536870912bytes", "Maxfilesize00bytes", "Maxcorefilesize00bytes"}) {
+  const std::string memory = kLimitsMemory ? "536870912536870912" : "unlimitedunlimited";
+  const std::string limits_wanted[] = {"Maxaddressspace" + memory + "bytes", "Maxfilesize00bytes",
+                                       "Maxcorefilesize00bytes"};
+  for (const std::string& limit : limits_wanted) {
     EXPECT_NE(found.find(limit), std::string::npos) << limit << " is not in " << found;
   }
   const std::string status = ReadText(proc + "/status");
@@ -311,10 +314,10 @@ TEST_F(ExtractdTest, QuarantinesWhatKillsTwoWorkersUntilItChanges) {
 }
 
 TEST_F(ExtractdTest, QuarantinesWhatTakesTooLongOrTooMuch) {
-  if (*WORKER_MEMORY != '\0') {
+  if (!kLimitsMemory) {
     GTEST_SKIP() << "a sanitizer takes more memory than a worker may";
   }
-  Start("--deadline 1 --memory 128 ", /*limits_memory=*/true);
+  Start("--deadline 1 --memory 128 ");
   const std::string hungry = Write("a.html", std::string(32 << 20, 'x'));
   EXPECT_EQ(ErrorOf(hungry), "memory: reading takes over 128 MiB of memory");
   EXPECT_EQ(Stats()["quarantined"], 1);

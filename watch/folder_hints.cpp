@@ -81,12 +81,8 @@ void FolderHints::TakeEvents(const char* events, size_t length,
                              std::vector<FolderId>* changed) const {
   for (size_t at = 0; at + sizeof(fanotify_event_metadata) <= length;) {
     const auto* event = reinterpret_cast<const fanotify_event_metadata*>(events + at);
-    if ((event->mask & FAN_Q_OVERFLOW) != 0) {
-      for (const auto& [folder, handle] : handles_) {
-        changed->push_back(folder);
-      }
-    } else if (event->event_len >=
-               event->metadata_len + sizeof(fanotify_event_info_fid) + sizeof(file_handle)) {
+    if (event->event_len >=
+        event->metadata_len + sizeof(fanotify_event_info_fid) + sizeof(file_handle)) {
       const auto* info =
           reinterpret_cast<const fanotify_event_info_fid*>(events + at + event->metadata_len);
       const auto* handle = reinterpret_cast<const file_handle*>(

@@ -27,8 +27,9 @@ class FolderHints {
   // Readable when there is something to take; -1 when there never is.
   int fd() const { return fd_.Get(); }
 
-  // The folders whose entries have changed since the last call, some of them several times. All of
-  // them when the kernel has lost count.
+  // The folders whose entries have changed since the last call, some of them several times. When
+  // the kernel has lost events of a busy file system, some are missing: who takes hints looks at
+  // all folders from time to time.
   std::vector<FolderId> Take();
 
   size_t size() const { return handles_.size(); }

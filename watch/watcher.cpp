@@ -27,7 +27,7 @@ constexpr char kWatchLimitFile[] = "/proc/sys/fs/inotify/max_user_watches";
 constexpr size_t kMaxWaiting = size_t{1} << 20;
 constexpr size_t kFoldersBetweenPulls = 256;
 constexpr size_t kMaxOpenFolders = 32;
-constexpr std::chrono::milliseconds kHintWait(500);
+constexpr std::chrono::milliseconds kHintWait(2000);
 constexpr size_t kRescanAtOnce = 1024;  // Folders, so that events are not kept waiting for longer.
 
 Fd StartInotify() {

@@ -167,7 +167,7 @@ TEST_F(WatcherTest, HintsShortenTheWaitForThem) {
   Take();
   Do("> a/f; > b/c/f; > ../out/f; chmod 700 b");
   EXPECT_EQ(Text(Take()), "attr b/") << "they are not looked at for each event";
-  std::vector<QueueEvent> events = Take(std::chrono::seconds(1));
+  std::vector<QueueEvent> events = Take(std::chrono::seconds(2));
   std::sort(events.begin(), events.end(),
             [](const QueueEvent& left, const QueueEvent& right) { return left.path < right.path; });
   EXPECT_EQ(Text(events), "reindex a/, reindex b/c/");
@@ -175,7 +175,7 @@ TEST_F(WatcherTest, HintsShortenTheWaitForThem) {
                                     {"echo more > a/d/f", "reindex a/d/"}}) {
     Do(deeds);
     EXPECT_EQ(Text(Take()), "");
-    EXPECT_NE(Text(Take(std::chrono::seconds(1))).find(want), std::string::npos) << deeds;
+    EXPECT_NE(Text(Take(std::chrono::seconds(2))).find(want), std::string::npos) << deeds;
   }
   EXPECT_LT(watcher_->NextDeadline(), now_ + kRescan);
 }

@@ -567,6 +567,7 @@ TEST_F(Fileindexd, AnswersEveryCommandAtOnce) {
     const RawClient client(SocketPath(), LengthBytes(length) + "{");
     EXPECT_NE(client.Receive(100).find("the command is too long"), std::string::npos) << length;
   }
+  ASSERT_TRUE(AwaitState("idle"));
   Program tool("exec 2>&1", FILEINDEX_PROGRAM " stats");
   EXPECT_EQ(tool.End(), 0);
   EXPECT_NE(tool.text.find("docs  idle  about 0 lines queued, 0 operations, 1 files, 0 files/s\n"),

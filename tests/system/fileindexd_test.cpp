@@ -730,8 +730,13 @@ TEST_F(Fileindexd, NothingIsLostToKillsAtAnyMoment) {
       Append(lines);
       // At any moment of the cycle that begins 100 ms from now.
       usleep(random() % 200000);
-      EndIndexer(SIGKILL);
-      StartIndexer();
+      if (random() % 8 == 0) {
+        EndEngine(SIGKILL);
+        StartEngine();
+      } else {
+        EndIndexer(SIGKILL);
+        StartIndexer();
+      }
     }
     Cycle({});
     std::map<std::string, std::string> want;

@@ -67,7 +67,8 @@ Cycle::Cycle(const std::string& share, const std::string& share_path, std::strin
       state_(state),
       stats_(stats),
       is_interrupted_(std::move(is_interrupted)),
-      indexer_(id_, stats, is_interrupted_) {}
+      indexer_(id_, stats, is_interrupted_),
+      engine_run_(EngineRun()) {}
 
 void Cycle::Handle(const fileindex::OP& op) {
   Check();
@@ -487,6 +488,9 @@ void Cycle::Commit() {
   if (indexer_.TakeWasUsed() || has_sent_) {
     has_sent_ = true;  // Until it is done.
     elastic::IndexCommit(share_);
+    // A run that was killed has lost what it had taken, and the next one does not know.
+    VEXLO_CHECK(EngineRun() != engine_run_, ERR_ELASTIC_REQUEST,
+                "the engine was started anew before the commit");
     has_sent_ = false;
   }
 }

@@ -89,6 +89,7 @@ class Cycle {
   const std::function<bool()> is_interrupted_;
   Indexer indexer_;
 
+  std::string engine_run_;  // That has taken what was sent since the last commit.
   Json::Value deletes_ = Json::Value(Json::arrayValue);  // Wait to be sent as one request.
   bool has_sent_ = false;                                // Something to be committed.
   bool state_changed_ = false;

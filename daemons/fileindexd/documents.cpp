@@ -149,6 +149,16 @@ bool IsGone(const std::string& path) {
   return !Stat(path, &info) && (errno == ENOENT || errno == ENOTDIR);
 }
 
+std::string EngineRun() {
+  // Each run makes its socket anew.
+  struct stat info {};
+  if (!Stat(fileindex::kElasticdSocketPath.Get(), &info)) {
+    return "";
+  }
+  return std::to_string(info.st_ino) + "-" + std::to_string(info.st_ctim.tv_sec) + "." +
+         std::to_string(info.st_ctim.tv_nsec);
+}
+
 std::vector<FailedItem> SendList(Json::Value requests) {
   Json::Value request;
   request["compound"] = std::move(requests);

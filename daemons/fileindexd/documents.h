@@ -47,6 +47,9 @@ std::optional<Stamp> StampOfPath(const std::string& path, bool content);
 // Whether nothing is at the path, for certain.
 bool IsGone(const std::string& path);
 
+// Tells one run of the engine from the next; "" while it does not run.
+std::string EngineRun();
+
 // A failure of one request of a list.
 struct FailedItem {
   size_t at;

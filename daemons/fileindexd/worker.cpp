@@ -167,17 +167,24 @@ Worker::Outcome Worker::RunCycle() {
   const bool fills = MakeIndexIfAsked();
   fileindex::QueueMgr queue(queue_path);
   const bool was_left = IsFileExist(queue_path + ".tmp");
-  queue.PrepareTmpQueue();
-  Cycle cycle(share_, share.GetPath(), SnapshotName(queue_path + ".tmp"), state_, stats_,
-              [this] { return IsInterrupted(); });
-  queue.ProcessOP([&cycle](std::shared_ptr<fileindex::OP> op) { cycle.Handle(*op); },
+  // Made when the snapshot has been taken: settings that were changed before a line was queued go
+  // for it.
+  std::optional<Cycle> made;
+  const auto cycle = [&]() -> Cycle& {
+    if (!made) {
+      made.emplace(share_, share.GetPath(), SnapshotName(queue_path + ".tmp"), state_, stats_,
+                   [this] { return IsInterrupted(); });
+    }
+    return *made;
+  };
+  queue.ProcessOP([&](std::shared_ptr<fileindex::OP> op) { cycle().Handle(*op); },
                   /*use_tmp=*/true);
   if (fills) {
-    cycle.ReconcileShare();
+    cycle().ReconcileShare();
   } else {
-    cycle.ReconcileNewFolders();
+    cycle().ReconcileNewFolders();
   }
-  cycle.Finish();
+  cycle().Finish();
   if (fills) {
     StatusMgr().UnsetShareStatus(share_, kBothBits);
     state_.rebuilt = false;
@@ -224,10 +231,12 @@ Worker::Outcome Worker::Judge(int code, const std::string& reason) {
       }
       return Outcome::kNoSpace;
     case Consequence::kRebuild:
-      if (!std::exchange(index_is_missing_, true)) {
+      index_is_missing_ = true;
+      if (wait_.count() == 0) {
+        wait_ = NextWait(wait_);  // For the next time, should a new one be no better.
         return Outcome::kAgain;
       }
-      break;  // Making it failed, too.
+      break;
     case Consequence::kGoOn:
     case Consequence::kRetry:
       break;

@@ -10,11 +10,12 @@
 #include <charconv>
 #include <ctime>
 #include <filesystem>
-#include <functional>
+#include <initializer_list>
 #include <map>
 #include <memory>
 #include <optional>
 #include <set>
+#include <string_view>
 #include <system_error>
 #include <utility>
 
@@ -74,6 +75,14 @@ constexpr int64_t kFuture = 3600;        // Seconds that a clock may be ahead.
 constexpr size_t kMostNamed = 3;
 
 constexpr int kIndexMissing = 2002;
+
+std::string Join(std::initializer_list<std::string_view> parts) {
+  std::string text;
+  for (const std::string_view part : parts) {
+    text += part;
+  }
+  return text;
+}
 
 std::string Quoted(const std::string& word) {
   std::string quoted = "'";
@@ -172,7 +181,7 @@ void Examination::LookAtConfig() {
   size_t count = 0;
   for (const auto& [file, place, what] : CheckConfig(count)) {
     const bool is_gone_share = what.starts_with("there is no share '");
-    Add(Severity::kError, file + ": " + (place.empty() ? "" : place + ": ") + what,
+    Add(Severity::kError, Join({file, place.empty() ? "" : ": ", place, ": ", what}),
         is_gone_share ? "fileindex folder prune" : "${EDITOR:-vi} " + Quoted(file));
   }
   try {
@@ -289,7 +298,7 @@ void Examination::LookAtEngine() {
           "fileindex index create " + Quoted(share) + " && fileindex folder reindex " +
               Quoted("/" + share));
     } else {
-      Add(Severity::kError, "the index of '" + share + "' is " + state,
+      Add(Severity::kError, Join({"the index of '", share, "' is ", state}),
           "fileindex index delete " + Quoted(share) + " && fileindex folder reindex " +
               Quoted("/" + share));
     }
@@ -313,7 +322,7 @@ void Examination::LookAtIndexDaemon() {
     if (state == "failing" || state == "unavailable") {
       const std::string reason = worker["last_error"].asString();
       Add(Severity::kError,
-          "indexing of '" + share + "' is " + state + (reason.empty() ? "" : ": " + reason));
+          Join({"indexing of '", share, "' is ", state, reason.empty() ? "" : ": ", reason}));
     }
   }
   for (const std::string& share : without) {
@@ -362,7 +371,7 @@ void Examination::LookAtNotifyDaemon() {
     }
   }
   for (const auto& [app, reason] : kavo::local::ReadMonitorQueues().unreadable) {
-    Add(Severity::kError, "the registrations of '" + app + "' cannot be used: " + reason);
+    Add(Severity::kError, Join({"the registrations of '", app, "' cannot be used: ", reason}));
   }
   Add(Severity::kOk, "listens and answers; " + Counted(roots.size(), "folder") + " watched");
 }

@@ -136,13 +136,13 @@ class AuditRun {
   }
   void Summarize() const;
 
-  const AuditScope& ScopeOf(const std::string& share) const { return scopes_.at(share); }
-
  private:
   void Report(const std::string& share, Difference difference, const std::string& path,
               bool is_left);
   void CompareShare(const std::string& share, bool is_left, std::vector<Repair>* repairs);
-  bool Await(const std::set<std::string>& shares);
+  using FailingSince = std::map<std::string, std::chrono::steady_clock::time_point>;
+  bool IsDone(const std::string& share, const Json::Value& workers, FailingSince& failing);
+  bool Await(std::set<std::string> shares);
 
   const Console& console_;
   const bool as_json_;
@@ -248,51 +248,53 @@ void AuditRun::Summarize() const {
   }
 }
 
+// Whether the share's changes are in the index. Throws Failure when there is no use in waiting.
+bool AuditRun::IsDone(const std::string& share, const Json::Value& workers, FailingSince& failing) {
+  const auto worker = std::find_if(workers.begin(), workers.end(),
+                                   [&](const Json::Value& one) { return one["share"] == share; });
+  if (worker == workers.end()) {
+    throw Failure("fileindexd has no worker for '" + share + "'");
+  }
+  const std::string state = (*worker)["state"].asString();
+  const std::string where = "indexing of '" + share + "' is " + state;
+  if (state == "paused") {
+    throw Failure(where + "; 'fileindex resume' goes on");
+  }
+  if (state == "unavailable") {
+    throw Failure(where);
+  }
+  if (state != "failing") {
+    failing.erase(share);
+  } else {
+    const auto now = std::chrono::steady_clock::now();
+    if (now - failing.try_emplace(share, now).first->second > kFailingPatience) {
+      throw Failure(where + ": " + (*worker)["last_error"].asString());
+    }
+  }
+  return state == "idle" && (*worker)["queue_bytes"].asUInt64() == 0 &&
+         !scopes_.at(share).HasWaitingChanges();
+}
+
 // False when there is no use in waiting; that is said.
-bool AuditRun::Await(const std::set<std::string>& shares) {
-  std::map<std::string, std::chrono::steady_clock::time_point> failing;
-  for (;;) {
-    const std::optional<Json::Value> stats = IndexDaemonStats();
-    if (!stats) {
-      console_.err << NoIndexDaemon() << "; what was queued waits for it\n";
-      return false;
-    }
-    std::set<std::string> left = shares;
-    for (const Json::Value& worker : (*stats)["shares"]) {
-      const std::string share = worker["share"].asString();
-      const std::string state = worker["state"].asString();
-      if (!left.contains(share)) {
-        continue;
+bool AuditRun::Await(std::set<std::string> shares) {
+  FailingSince failing;
+  try {
+    while (!shares.empty()) {
+      const std::optional<Json::Value> stats = IndexDaemonStats();
+      if (!stats) {
+        throw Failure(NoIndexDaemon());
       }
-      const auto now = std::chrono::steady_clock::now();
-      const auto since = state == "failing" ? failing.try_emplace(share, now).first->second : now;
-      failing.erase(state == "failing" ? "" : share);
-      if (state == "paused" || state == "unavailable" || now - since > kFailingPatience) {
-        console_.err << "indexing of '" << ForTerminal(share) << "' is " << state
-                     << (state == "paused" ? "; 'fileindex resume' goes on" : "")
-                     << (state == "failing" ? ": " + ForTerminal(worker["last_error"].asString())
-                                            : "")
-                     << "; what was queued waits\n";
-        return false;
-      }
-      if (state == "idle" && worker["queue_bytes"].asUInt64() == 0 &&
-          !scopes_.at(share).HasWaitingChanges()) {
-        left.erase(share);
+      std::erase_if(shares, [&](const std::string& share) {
+        return IsDone(share, (*stats)["shares"], failing);
+      });
+      if (!shares.empty()) {
+        std::this_thread::sleep_for(kAskAgain);
       }
     }
-    if (left.empty()) {
-      return true;
-    }
-    for (const std::string& share : left) {
-      const Json::Value& workers = (*stats)["shares"];
-      if (std::none_of(workers.begin(), workers.end(),
-                       [&](const Json::Value& worker) { return worker["share"] == share; })) {
-        console_.err << "fileindexd has no worker for '" << ForTerminal(share)
-                     << "'; what was queued waits\n";
-        return false;
-      }
-    }
-    std::this_thread::sleep_for(kAskAgain);
+    return true;
+  } catch (const Failure& failure) {
+    console_.err << ForTerminal(failure.what()) << "; what was queued waits\n";
+    return false;
   }
 }
 

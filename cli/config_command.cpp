@@ -21,7 +21,8 @@ ExitStatus Check(const Arguments& arguments, const Console& console) {
       console.out << JsonToString(line) << "\n";
     } else {
       // The place is what jq would be asked for: "FILE: .[2].owner: is no text, ...".
-      console.out << ForTerminal(file + ": " + (place.empty() ? "" : place + ": ") + what) << "\n";
+      console.out << ForTerminal(file) << ": " << ForTerminal(place) << (place.empty() ? "" : ": ")
+                  << ForTerminal(what) << "\n";
     }
   }
   console.err << Counted(folders, "folder") << " configured, "

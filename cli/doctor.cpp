@@ -10,11 +10,12 @@
 #include <charconv>
 #include <ctime>
 #include <filesystem>
-#include <functional>
+#include <initializer_list>
 #include <map>
 #include <memory>
 #include <optional>
 #include <set>
+#include <string_view>
 #include <system_error>
 #include <utility>
 
@@ -74,6 +75,14 @@ constexpr int64_t kFuture = 3600;        // Seconds that a clock may be ahead.
 constexpr size_t kMostNamed = 3;
 
 constexpr int kIndexMissing = 2002;
+
+std::string Join(std::initializer_list<std::string_view> parts) {
+  std::string text;
+  for (const std::string_view part : parts) {
+    text += part;
+  }
+  return text;
+}
 
 std::string Quoted(const std::string& word) {
   std::string quoted = "'";
@@ -172,7 +181,7 @@ void Examination::LookAtConfig() {
   size_t count = 0;
   for (const auto& [file, place, what] : CheckConfig(count)) {
     const bool is_gone_share = what.starts_with("there is no share '");
-    Add(Severity::kError, file + ": " + (place.empty() ? "" : place + ": ") + what,
+    Add(Severity::kError, Join({file, place.empty() ? "" : ": ", place, ": ", what}),
         is_gone_share ? "fileindex folder prune" : "${EDITOR:-vi} " + Quoted(file));
   }
   try {
@@ -192,6 +201,7 @@ void Examination::LookAtConfig() {
 
 void Examination::LookAtPermissions() {
   size_t well = 0;
+  std::vector<std::string> foreign;
   for (const FixedPath& fixed : kStateFolders) {
     const std::string path = fixed.Get();
     const bool is_needed = path == fileindex::GetFileIndexRoot() + "/tmp";
@@ -207,12 +217,23 @@ void Examination::LookAtPermissions() {
       Add(Severity::kError, "'" + path + "' is no folder",
           "mv " + Quoted(path) + " " + Quoted(path + ".old"));
     } else if (error != 0 || access(path.c_str(), R_OK | W_OK | X_OK) != 0) {
-      Add(Severity::kError,
-          "'" + path + "' cannot be written: " + std::generic_category().message(errno),
-          "sudo chown " + std::to_string(geteuid()) + " " + Quoted(path));
+      const int reason = error != 0 ? error : errno;
+      if (reason == EACCES && (error != 0 || info.st_uid != geteuid())) {
+        foreign.push_back(Quoted(path));
+      } else {
+        Add(Severity::kError,
+            Join({"'", path, "' cannot be written: ", std::generic_category().message(reason)}),
+            reason == EACCES ? "chmod u+rwx " + Quoted(path) : "");
+      }
     } else {
       ++well;
     }
+  }
+  if (!foreign.empty()) {
+    Add(Severity::kError,
+        Counted(foreign.size(), "folder") + " of other users cannot be written, " + foreign[0] +
+            (foreign.size() > 1 ? " among them" : "") + ": the service is theirs",
+        "sudo fileindex doctor");
   }
   for (const FixedPath& fixed : kLockFiles) {
     const std::string path = fixed.Get();
@@ -221,10 +242,11 @@ void Examination::LookAtPermissions() {
       continue;
     }
     if (!S_ISREG(info.st_mode) || access(path.c_str(), R_OK) != 0) {
+      // One that somebody may hold is never removed: another could take the lock beside it then.
       Add(Severity::kError,
-          "the lock file '" + path + "' of user " + std::to_string(info.st_uid) +
-              " cannot be opened",
-          "sudo rm " + Quoted(path));
+          Join({"the lock file '", path, "' of user ", std::to_string(info.st_uid),
+                " cannot be opened"}),
+          (S_ISREG(info.st_mode) ? "sudo chmod a+r " : "sudo rm ") + Quoted(path));
     } else {
       ++well;
     }
@@ -252,6 +274,14 @@ void Examination::LookAtPermissions() {
 std::optional<Json::Value> Examination::AskOne(const std::string& socket,
                                                const std::string& request, Severity severity,
                                                const std::string& effect) {
+  struct stat info {};
+  if (stat(socket.c_str(), &info) == 0 && access(socket.c_str(), W_OK) != 0) {
+    Add(Severity::kError,
+        "its socket belongs to user " + std::to_string(info.st_uid) +
+            " and is closed to this one, so nothing can be told of it",
+        "sudo fileindex doctor");
+    return std::nullopt;
+  }
   std::string reason;
   std::optional<Json::Value> reply = AskDaemon(socket, request, &reason);
   if (!reply) {
@@ -289,7 +319,7 @@ void Examination::LookAtEngine() {
           "fileindex index create " + Quoted(share) + " && fileindex folder reindex " +
               Quoted("/" + share));
     } else {
-      Add(Severity::kError, "the index of '" + share + "' is " + state,
+      Add(Severity::kError, Join({"the index of '", share, "' is ", state}),
           "fileindex index delete " + Quoted(share) + " && fileindex folder reindex " +
               Quoted("/" + share));
     }
@@ -313,7 +343,7 @@ void Examination::LookAtIndexDaemon() {
     if (state == "failing" || state == "unavailable") {
       const std::string reason = worker["last_error"].asString();
       Add(Severity::kError,
-          "indexing of '" + share + "' is " + state + (reason.empty() ? "" : ": " + reason));
+          Join({"indexing of '", share, "' is ", state, reason.empty() ? "" : ": ", reason}));
     }
   }
   for (const std::string& share : without) {
@@ -362,7 +392,7 @@ void Examination::LookAtNotifyDaemon() {
     }
   }
   for (const auto& [app, reason] : kavo::local::ReadMonitorQueues().unreadable) {
-    Add(Severity::kError, "the registrations of '" + app + "' cannot be used: " + reason);
+    Add(Severity::kError, Join({"the registrations of '", app, "' cannot be used: ", reason}));
   }
   Add(Severity::kOk, "listens and answers; " + Counted(roots.size(), "folder") + " watched");
 }

@@ -157,9 +157,18 @@ class MemoryWatch:
 class Stack:
     """The four daemons of a build in a root of their own. Everything ends with close()."""
 
-    FOLDERS = ("etc/kavo", "tmp", "var/run", "var/lib/kavo/fileindex/queue",
-               "var/lib/kavo/fileindex/db", "var/lib/kavo/evnotify", "var/lib/kavo/extract",
-               "var/packages/Vexlo/etc", "var/packages/Vexlo/var", "var/packages/Vexlo/target")
+    FOLDERS = (
+        "etc/kavo",
+        "tmp",
+        "var/run",
+        "var/lib/kavo/fileindex/queue",
+        "var/lib/kavo/fileindex/db",
+        "var/lib/kavo/evnotify",
+        "var/lib/kavo/extract",
+        "var/packages/Vexlo/etc",
+        "var/packages/Vexlo/var",
+        "var/packages/Vexlo/target",
+    )
 
     def __init__(self, programs, folder=None):
         self.programs = pathlib.Path(programs).resolve()
@@ -175,8 +184,10 @@ class Stack:
         # A build without a root would work on the system's own files.
         if str(self.root) not in self._run("share", "list").stderr:
             self.close()
-            raise Failure(f"the programs in {self.programs} take no root from the environment: "
-                          "configure a build with -DFILEINDEX_ROOT=FOLDER")
+            raise Failure(
+                f"the programs in {self.programs} take no root from the environment: "
+                "configure a build with -DFILEINDEX_ROOT=FOLDER"
+            )
 
     def __enter__(self):
         return self
@@ -196,8 +207,12 @@ class Stack:
             (self.root / f"var/run/{name}.sock").unlink(missing_ok=True)
             with open(self.base / f"{name}.log", "ab") as log:
                 self._processes[name] = subprocess.Popen(
-                    [self.programs / name], stdin=subprocess.DEVNULL, stdout=log, stderr=log,
-                    env=self._environment)
+                    [self.programs / name],
+                    stdin=subprocess.DEVNULL,
+                    stdout=log,
+                    stderr=log,
+                    env=self._environment,
+                )
         for name in DAEMONS:
             await_true((self.root / f"var/run/{name}.sock").exists, f"{name} answers", 30, 0.005)
 
@@ -213,8 +228,14 @@ class Stack:
         self._processes.clear()
 
     def _run(self, *arguments):
-        return subprocess.run([self.programs / "fileindex", *arguments], env=self._environment,
-                              capture_output=True, text=True, errors="replace", check=False)
+        return subprocess.run(
+            [self.programs / "fileindex", *arguments],
+            env=self._environment,
+            capture_output=True,
+            text=True,
+            errors="replace",
+            check=False,
+        )
 
     def tool(self, *arguments):
         """The output of the program fileindex, which may find nothing but must not fail."""
@@ -257,9 +278,12 @@ class Stack:
         """Whether all that was queued is done, and the kernel reports whatever comes."""
         queues = self.ask("evnotifyd", {"command": "stats"})["queues"]
         shares = self.ask("fileindexd", {"type": "stats", "data": None})["shares"]
-        return (len(shares) > 0 and len(queues) > 0
-                and all(queue["state"] == "live" for queue in queues)
-                and all(share["state"] == "idle" and share["queue_bytes"] == 0 for share in shares))
+        return (
+            len(shares) > 0
+            and len(queues) > 0
+            and all(queue["state"] == "live" for queue in queues)
+            and all(share["state"] == "idle" and share["queue_bytes"] == 0 for share in shares)
+        )
 
     def operations(self):
         """How many have been carried out since the start."""
@@ -268,11 +292,13 @@ class Stack:
 
     def await_rest(self):
         """Rest that lasts for longer than a queue takes to be seen."""
+
         def rests():
             if not self.is_at_rest():
                 return False
             time.sleep(0.2)
             return self.is_at_rest()
+
         await_true(rests, "the daemons come to rest")
 
     def cpu(self):
@@ -286,9 +312,11 @@ class Stack:
 # The corpus
 
 BLOCKS = ("north", "east", "south", "west")  # A quarter of the folders each.
-_SYLLABLES = ("ba be bi bo bu da de di do du fa fe fi ga ge gi go ha he hi ka ke ki ko la le li lo "
-              "ma me mi mo mu na ne ni no pa pe pi po ra re ri ro ru sa se si so ta te ti to tu va "
-              "ve vi vo wa we wi za zo").split()
+_SYLLABLES = (
+    "ba be bi bo bu da de di do du fa fe fi ga ge gi go ha he hi ka ke ki ko la le li lo "
+    "ma me mi mo mu na ne ni no pa pe pi po ra re ri ro ru sa se si so ta te ti to tu va "
+    "ve vi vo wa we wi za zo"
+).split()
 
 
 def word_list(count=20000, seed=1):
@@ -315,8 +343,8 @@ def make_corpus(top, files=20000, folders=400, seed=1):
     for i in range(files):
         size = source.randint(1000, 4000)
         chosen = source.choices(words, weights, k=size // 5)
-        lines = [" ".join(chosen[at:at + 12]) for at in range(0, len(chosen), 12)]
-        text = "\n".join(lines)[:size - 1] + "\n"
+        lines = [" ".join(chosen[at : at + 12]) for at in range(0, len(chosen), 12)]
+        text = "\n".join(lines)[: size - 1] + "\n"
         path = names[i % folders] / f"{chosen[0]}-{chosen[1]}-{i}.txt"
         path.write_text(text, encoding="ascii")
         paths.append(path)

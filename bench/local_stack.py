@@ -285,6 +285,26 @@ class Stack:
             and all(share["state"] == "idle" and share["queue_bytes"] == 0 for share in shares)
         )
 
+    def files_sent(self):
+        """How many documents the engine has been given since the start."""
+        shares = self.ask("fileindexd", {"type": "stats", "data": None})["shares"]
+        return sum(share["files"] for share in shares)
+
+    def await_files(self, folder, count, before):
+        """Until a search finds that many text files below the folder, with `before` sent when it
+        was empty. A search that finds so many costs the engine more than it costs to ask the daemon
+        that fills it, so that one is asked until it has come so far."""
+        await_true(
+            lambda: self.files_sent() >= before + count,
+            "all files are sent to the engine",
+            pause=0.05,
+        )
+        await_true(
+            lambda: self.count(below=str(folder), types=["txt"]) == count,
+            "all files are found",
+            pause=0.05,
+        )
+
     def operations(self):
         """How many have been carried out since the start."""
         shares = self.ask("fileindexd", {"type": "stats", "data": None})["shares"]

@@ -1,6 +1,7 @@
 """What the measurements of the whole stack share: the daemons in a root of their own, processes and
 what they cost, and a corpus that is the same wherever it is made."""
 
+import ctypes
 import json
 import os
 import pathlib
@@ -65,6 +66,13 @@ def take_session():
     os.setsid()
 
 
+def adopt_orphans():
+    """What a program started and left to itself becomes a child of this process, not of init."""
+    set_child_subreaper = 36
+    if ctypes.CDLL(None, use_errno=True).prctl(set_child_subreaper, 1, 0, 0, 0) != 0:
+        raise Failure(os.strerror(ctypes.get_errno()))
+
+
 def _fields(pid):
     """The fields of /proc/PID/stat from the third on; the name before them may hold anything."""
     with open(f"/proc/{pid}/stat", encoding="latin-1") as file:
@@ -120,7 +128,8 @@ def io_counters(pid):
 
 
 class MemoryWatch:
-    """Samples the memory of process trees, and of all of them together, until it is left."""
+    """Samples the memory of process trees, and of all of them together, until it is left. Each is
+    given by its root, or by a function that lists its processes."""
 
     def __init__(self, trees, interval=0.1):
         self._trees = dict(trees)
@@ -142,7 +151,7 @@ class MemoryWatch:
         while True:
             total = 0
             for name, pid in self._trees.items():
-                sizes = [memory(each) for each in descendants([pid])]
+                sizes = [memory(each) for each in (pid() if callable(pid) else descendants([pid]))]
                 pss, rss = (sum(size[i] for size in sizes) for i in (0, 1))
                 self.peaks[name] = (max(self.peaks[name][0], pss), max(self.peaks[name][1], rss))
                 total += pss

@@ -524,6 +524,21 @@ TEST_F(Fileindexd, RestsWhilePausedAndWhileTheShareIsAway) {
   EXPECT_EQ(All(), (Paths{".", "a"}));
 }
 
+TEST_F(Fileindexd, TakesWhatWaitsBehindASnapshotThatWasLeft) {
+  StartAll();
+  EndIndexer(SIGKILL);
+  Write("a", "alpha");
+  Write("b", "beta");
+  vexlo::AppendLines(queue_.string() + ".tmp", Line(EV_CLOSE_WRITE, In("a")) + "\n");
+  Append({Line(EV_CLOSE_WRITE, In("b"))});
+  StartIndexer();
+  const auto until =
+      std::chrono::steady_clock::now() + std::chrono::milliseconds(kPatienceMilliseconds);
+  while (!All().contains("b") && std::chrono::steady_clock::now() < until) {
+  }
+  EXPECT_EQ(All(), (Paths{".", "a", "b"}));
+}
+
 TEST_F(Fileindexd, TakesCareOfTheStatusBits) {
   Write("a", "alpha");
   StartAll();

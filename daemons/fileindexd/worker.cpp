@@ -166,6 +166,8 @@ Worker::Outcome Worker::RunCycle() {
   stats_.SetState(WorkerState::kProcessing);
   const bool fills = MakeIndexIfAsked();
   fileindex::QueueMgr queue(queue_path);
+  // Until the cycle's end tells.
+  const bool may_have_unread = std::exchange(has_unread_, true);
   const bool was_left = IsFileExist(queue_path + ".tmp");
   queue.PrepareTmpQueue();
   Cycle cycle(share_, share.GetPath(), SnapshotName(queue_path + ".tmp"), state_, stats_,
@@ -177,7 +179,7 @@ Worker::Outcome Worker::RunCycle() {
   } else {
     cycle.ReconcileNewFolders();
   }
-  const bool all_is_read = !has_unread_ || cycle.IndexUnread();
+  const bool all_is_read = !may_have_unread || cycle.IndexUnread();
   cycle.Finish();
   has_unread_ = cycle.TakeHasUnread() || !all_is_read;
   unread_wait_ = has_unread_ ? NextWait(unread_wait_) : std::chrono::seconds(0);

@@ -476,6 +476,7 @@ TEST_F(Fileindexd, FollowsTheSettings) {
       Command(R"({"type":"worker_delete","data":{"share_name":"docs"}})")["success"].asBool());
   while (!Command(R"({"type":"stats"})")["shares"].empty()) {
   }
+  fs::remove(b);
   Append({Line(EV_DELETE, b)});
   const Coming gone(queue_.parent_path(), IN_DELETE);
   EXPECT_TRUE(

@@ -303,6 +303,27 @@ void Cycle::ReconcileNewFolders() {
   }
 }
 
+bool Cycle::IndexUnread() {
+  constexpr unsigned kPage = 500;
+  Settle();
+  std::vector<std::string> page;
+  std::string after;
+  do {
+    page = ListUnread(id_, after, kPage);
+    if (!page.empty() && after.empty() && !CanReadContents()) {
+      return false;
+    }
+    for (const std::string& path : page) {
+      Check();
+      if (IsWanted(path)) {
+        Submit(path);
+      }
+      after = path;
+    }
+  } while (page.size() == kPage);
+  return true;
+}
+
 void Cycle::Reconcile(const std::string& root, const Json::Value& types, const char* cause) {
   Settle();
   scope_.CheckShare();

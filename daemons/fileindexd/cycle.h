@@ -40,6 +40,13 @@ class Cycle {
   // Those that were never crawled, and those that were and are not configured any more.
   void ReconcileNewFolders();
 
+  // Takes what is in the index without what stands in it, as nobody was there to read it. False
+  // when there is such a thing, and still nobody.
+  bool IndexUnread();
+
+  // Whether something was taken that nobody was there to read. To be asked after Finish().
+  bool TakeHasUnread() { return indexer_.TakeHasUnread(); }
+
   // Returns when everything is in the index, and on disk. Then the state is saved.
   void Finish();
 

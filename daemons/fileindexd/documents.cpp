@@ -14,6 +14,8 @@
 #include "fileindex/elastic_control/schema.h"
 #include "fileindex/paths.h"
 #include "kavo/content_extract.h"
+#include "kavo/local/content.h"
+#include "kavo/sock_connection.h"
 
 namespace vexlo::fileindexd {
 namespace {
@@ -121,6 +123,31 @@ Json::Value MakePut(const std::string& id, const std::string& path, bool content
 }
 
 bool IsDelete(const Json::Value& item) { return item["command"] == kDelete; }
+
+bool IsUnread(const Json::Value& item) {
+  const Json::Value& error = item["data"]["data"][kavo::local::kContentErrorField];
+  return error.isString() &&
+         error.asString().starts_with(kavo::local::content_reason::kUnavailable);
+}
+
+std::vector<std::string> ListUnread(const std::string& id, const std::string& after,
+                                    unsigned count) {
+  Json::Value query;
+  query["qsl"]["term"][kavo::local::kContentErrorField] = kavo::local::content_reason::kUnavailable;
+  query["size"] = count;
+  if (!after.empty()) {
+    query["after"] = after;
+  }
+  std::vector<std::string> paths;
+  for (IndexedPath& found : Query(id, std::move(query))) {
+    paths.push_back(std::move(found.path));
+  }
+  return paths;
+}
+
+bool CanReadContents() {
+  return kavodaemon::DomainSockConnection(kavo::local::ContentSocket()).Connect(1);
+}
 
 Json::Value MakeAttributes(const std::string& id, const std::string& path, const Stamp& stamp) {
   Json::Value fields;

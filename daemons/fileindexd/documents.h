@@ -37,6 +37,16 @@ Json::Value MakePut(const std::string& id, const std::string& path, bool content
 // Whether MakePut() found nothing there.
 bool IsDelete(const Json::Value& item);
 
+// Whether it lacks what stands in the file because nobody was there to read it.
+bool IsUnread(const Json::Value& item);
+
+// Paths of documents that were put so, up to `count` of those behind the path `after`.
+std::vector<std::string> ListUnread(const std::string& id, const std::string& after,
+                                    unsigned count);
+
+// Whether somebody is there to read contents.
+bool CanReadContents();
+
 // The request that updates what can be told without reading the content; `stamp` goes with it.
 Json::Value MakeAttributes(const std::string& id, const std::string& path, const Stamp& stamp);
 

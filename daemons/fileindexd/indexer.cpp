@@ -102,6 +102,11 @@ std::vector<std::string> Indexer::TakeGone() {
   return std::exchange(gone_, {});
 }
 
+bool Indexer::TakeHasUnread() {
+  const std::lock_guard lock(mutex_);
+  return std::exchange(has_unread_, false);
+}
+
 bool Indexer::TakeWasUsed() {
   const std::lock_guard lock(mutex_);
   return std::exchange(was_used_, false);
@@ -174,6 +179,9 @@ void Indexer::Extract(const Job& job, Batch* batch) {
     if (IsDelete(item)) {
       const std::lock_guard lock(mutex_);
       gone_.push_back(job.path);
+    } else if (IsUnread(item)) {
+      const std::lock_guard lock(mutex_);
+      has_unread_ = true;
     }
     batch->bytes += TextBytes(item);
     batch->requests.append(std::move(item));

@@ -51,6 +51,9 @@ class Indexer {
   // Paths that were gone when their turn came, since the last call.
   std::vector<std::string> TakeGone();
 
+  // Whether something could not be read, as nobody was there to do it, since the last call.
+  bool TakeHasUnread();
+
   // Whether anything was taken since the last call.
   bool TakeWasUsed();
 
@@ -81,6 +84,7 @@ class Indexer {
   std::unordered_set<std::string> in_work_;  // Taken and not answered, those that wait among them.
   std::exception_ptr failure_;
   std::vector<std::string> gone_;
+  bool has_unread_ = false;
   bool was_used_ = false;
   bool ending_ = false;
 

@@ -166,6 +166,8 @@ Worker::Outcome Worker::RunCycle() {
   stats_.SetState(WorkerState::kProcessing);
   const bool fills = MakeIndexIfAsked();
   fileindex::QueueMgr queue(queue_path);
+  // Until the cycle's end tells.
+  const bool may_have_unread = std::exchange(has_unread_, true);
   const bool was_left = IsFileExist(queue_path + ".tmp");
   // Made when the snapshot has been taken: settings that were changed before a line was queued go
   // for it.
@@ -184,7 +186,10 @@ Worker::Outcome Worker::RunCycle() {
   } else {
     cycle().ReconcileNewFolders();
   }
+  const bool all_is_read = !may_have_unread || cycle().IndexUnread();
   cycle().Finish();
+  has_unread_ = cycle().TakeHasUnread() || !all_is_read;
+  unread_wait_ = has_unread_ ? NextWait(unread_wait_) : std::chrono::seconds(0);
   if (fills) {
     StatusMgr().UnsetShareStatus(share_, kBothBits);
     state_.rebuilt = false;
@@ -258,8 +263,10 @@ void Worker::WaitAfter(Outcome outcome) {
       // A line in the queue of a share that was away tells that it is back.
       const bool is_idle = outcome == Outcome::kDone;
       stats_.SetState(is_idle ? WorkerState::kIdle : WorkerState::kUnavailable);
-      while (!is_called()) {
-        if (watch_.Wait(std::nullopt, /*for_queue=*/true)) {
+      // Whoever reads contents says nothing when he is back.
+      const auto until = is_idle && has_unread_ ? in(unread_wait_) : std::nullopt;
+      while (!is_called() && (!until || Clock::now() < *until)) {
+        if (watch_.Wait(until, /*for_queue=*/true)) {
           watch_.Wait(in(coalescing_), /*for_queue=*/false);
           return;
         }

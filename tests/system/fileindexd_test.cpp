@@ -476,6 +476,7 @@ TEST_F(Fileindexd, FollowsTheSettings) {
       Command(R"({"type":"worker_delete","data":{"share_name":"docs"}})")["success"].asBool());
   while (!Command(R"({"type":"stats"})")["shares"].empty()) {
   }
+  fs::remove(b);
   Append({Line(EV_DELETE, b)});
   const Coming gone(queue_.parent_path(), IN_DELETE);
   EXPECT_TRUE(
@@ -522,6 +523,21 @@ TEST_F(Fileindexd, RestsWhilePausedAndWhileTheShareIsAway) {
   Append({Line(EV_QUEUE_CRASHED, docs_)});
   ASSERT_TRUE(AwaitState("unavailable"));
   EXPECT_EQ(All(), (Paths{".", "a"}));
+}
+
+TEST_F(Fileindexd, TakesWhatWaitsBehindASnapshotThatWasLeft) {
+  StartAll();
+  EndIndexer(SIGKILL);
+  Write("a", "alpha");
+  Write("b", "beta");
+  vexlo::AppendLines(queue_.string() + ".tmp", Line(EV_CLOSE_WRITE, In("a")) + "\n");
+  Append({Line(EV_CLOSE_WRITE, In("b"))});
+  StartIndexer();
+  const auto until =
+      std::chrono::steady_clock::now() + std::chrono::milliseconds(kPatienceMilliseconds);
+  while (!All().contains("b") && std::chrono::steady_clock::now() < until) {
+  }
+  EXPECT_EQ(All(), (Paths{".", "a", "b"}));
 }
 
 TEST_F(Fileindexd, TakesCareOfTheStatusBits) {

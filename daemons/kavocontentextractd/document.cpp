@@ -16,6 +16,9 @@ namespace {
 namespace field = fileindex::elastic::field;
 
 constexpr size_t kMaxFieldBytes = size_t{64} << 10;
+// Of a list.
+constexpr size_t kMaxElementBytes = 1024;
+constexpr Json::ArrayIndex kMaxElements = 256;
 // The two that the library's list of fields does not have.
 constexpr char kLatitude[] = "KAVOMDLatitude";
 constexpr char kLongitude[] = "KAVOMDLongitude";
@@ -152,9 +155,9 @@ void Text::EndWord() {
 }
 
 void Document::SetText(const char* field, std::string_view value) {
-  std::string cleaned = Cleaned(value, kMaxFieldBytes);
+  const std::string cleaned = Cleaned(value, kMaxFieldBytes);
   if (!cleaned.empty()) {
-    fields_[field] = std::move(cleaned);
+    fields_[field] = cleaned;
   }
 }
 
@@ -183,15 +186,17 @@ void Document::SetPlace(double latitude, double longitude) {
 }
 
 void Document::AddText(const char* field, std::string_view value) {
-  const std::string cleaned = Cleaned(value, kMaxFieldBytes);
+  const std::string cleaned = Cleaned(value, kMaxElementBytes);
+  if (cleaned.empty()) {
+    return;
+  }
   Json::Value& list = fields_[field];
-  constexpr Json::ArrayIndex kMost = 1000;
-  if (!cleaned.empty() && list.size() < kMost &&
+  if (!list.isArray()) {
+    list = Json::Value(Json::arrayValue);
+  }
+  if (list.size() < kMaxElements &&
       std::find(list.begin(), list.end(), Json::Value(cleaned)) == list.end()) {
     list.append(cleaned);
-  }
-  if (list.empty()) {
-    fields_.removeMember(field);
   }
 }
 

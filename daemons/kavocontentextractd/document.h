@@ -47,7 +47,7 @@ class Document {
   void SetDate(const char* field, std::string_view iso_8601);
   // Degrees, north and east being positive.
   void SetPlace(double latitude, double longitude);
-  // Adds to a list of different texts.
+  // Adds to a list of different texts: the first 256, and of each 1 KiB.
   void AddText(const char* field, std::string_view value);
 
   // The fields with the text among them. `fault`, "REASON: what happened", says that something is

@@ -103,7 +103,7 @@ void SetTag(const Tag& tag, const Datum& datum, const std::string& shown, Docume
       document.SetText(tag.field, shown);
       break;
     case Kind::kList:
-      for (long i = 0; i < std::min(datum.count(), 1000L); ++i) {
+      for (long i = 0; i < std::min(datum.count(), 256L); ++i) {
         document.AddText(
             tag.field, datum.typeId() == Exiv2::asciiString ? datum.toString() : datum.toString(i));
         if (datum.typeId() == Exiv2::asciiString || datum.typeId() == Exiv2::string) {

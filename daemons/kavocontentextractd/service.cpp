@@ -163,8 +163,8 @@ daemon::DaemonOptions ExtractdOptions(Settings* settings) {
       kavo::local::ContentSocket() +
       ".\n\n"
       "  --deadline SECONDS  for one file, 1 to 3600; 10 without it\n"
-      "  --memory MIB        address space of a process that reads; 512 without it, 0 for no "
-      "limit\n"
+      "  --memory MIB        address space of a process that reads, at least 128; 512 without it,\n"
+      "                      0 for no limit\n"
       "  --workers N         how many of them there are at most, 1 to 16";
   options.arguments = [settings](const std::vector<std::string>& words) {
     for (size_t i = 0; i + 1 < words.size(); i += 2) {

@@ -64,7 +64,8 @@ TEST(Frames, CarryAFile) {
     const std::string long_body(1 << 20, 'x');
     std::string body;
     int received = -1;
-    std::thread sender([&] { EXPECT_TRUE(SendFrame(there.fd, long_body, file.fd, In(30000))); });
+    std::thread sender(
+        [&, to = there.fd] { EXPECT_TRUE(SendFrame(to, long_body, file.fd, In(30000))); });
     EXPECT_TRUE(ReceiveFrame(here.fd, 1 << 20, body, &received, In(30000)));
     sender.join();
     EXPECT_TRUE(body == long_body);

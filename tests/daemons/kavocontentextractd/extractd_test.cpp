@@ -34,7 +34,7 @@ std::string LinkOf(const std::filesystem::path& link) {
 
 class ExtractdTest : public testing::Test {
  protected:
-  ~ExtractdTest() override {
+  void TearDown() override {
     if (daemon_) {
       daemon_->End(SIGKILL);
     }
@@ -285,9 +285,9 @@ TEST_F(ExtractdTest, ReplacesAWorkerThatHangs) {
   EXPECT_EQ(Stats()["quarantined"], 0);
 
   // One that ends between two files is no fault of the next.
+  const std::string socket = "/proc/" + std::to_string(Workers()[0]) + "/fd/3";
   kill(Workers()[0], SIGKILL);
-  while (Workers() == std::vector<pid_t>{} ||
-         LinkOf("/proc/" + std::to_string(Workers()[0]) + "/fd/3") != "") {
+  while (!LinkOf(socket).empty()) {  // Until the signal has arrived.
     std::this_thread::yield();
   }
   EXPECT_EQ(Parse(path)["KAVOMDTitle"], "Plan");

@@ -22,6 +22,7 @@ inline std::string Zip(const Parts& parts) {
   const std::string path = folder / "zip";
   struct archive* const archive = archive_write_new();
   archive_write_set_format_zip(archive);
+  archive_write_set_format_option(archive, "zip", "compression-level", "1");
   EXPECT_EQ(archive_write_open_filename(archive, path.c_str()), ARCHIVE_OK);
   for (const auto& [name, content] : parts) {
     &name == &parts.front().first ? archive_write_zip_set_compression_store(archive)
@@ -60,14 +61,17 @@ inline std::string Odt(const std::string& body, const std::string& manifest = "<
 
 inline std::string Pdf() {
   const std::string text = "BT /F1 24 Tf 20 100 Td (The harbour plan) Tj ET";
-  const std::string objects[] = {
-      "<</Type/Catalog/Pages 2 0 R>>",
-      "<</Type/Pages/Kids[3 0 R]/Count 1>>",
+  const std::string page =
       "<</Type/Page/Parent 2 0 R/MediaBox[0 0 300 200]/Contents 4 0 R"
-      "/Resources<</Font<</F1 5 0 R>>>>>>",
-      "<</Length " + std::to_string(text.size()) + ">>\nstream\n" + text + "\nendstream",
-      "<</Type/Font/Subtype/Type1/BaseFont/Helvetica>>",
-      "<</Title(Plan)/Author(Ana)/CreationDate(D:20240531120000Z)>>"};
+      "/Resources<</Font<</F1 5 0 R>>>>>>";
+  const std::string stream =
+      "<</Length " + std::to_string(text.size()) + ">>\nstream\n" + text + "\nendstream";
+  const std::string objects[] = {"<</Type/Catalog/Pages 2 0 R>>",
+                                 "<</Type/Pages/Kids[3 0 R]/Count 1>>",
+                                 page,
+                                 stream,
+                                 "<</Type/Font/Subtype/Type1/BaseFont/Helvetica>>",
+                                 "<</Title(Plan)/Author(Ana)/CreationDate(D:20240531120000Z)>>"};
   std::string pdf = "%PDF-1.4\n";
   std::string table = "xref\n0 7\n0000000000 65535 f \n";
   int number = 0;

@@ -1,5 +1,4 @@
-// What was already read of queue files, for those who ask one question of them again and again. Not
-// installed.
+// What was already read of queue files, for those who ask the same again and again. Not installed.
 #ifndef FILEINDEX_OPTREE_REINDEX_NOTES_H_
 #define FILEINDEX_OPTREE_REINDEX_NOTES_H_
 

@@ -4,6 +4,7 @@
 #include <sys/fanotify.h>
 #include <sys/vfs.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstddef>
@@ -16,14 +17,12 @@ constexpr uint64_t kChanges = FAN_CREATE | FAN_DELETE | FAN_MOVED_FROM | FAN_MOV
                               FAN_CLOSE_WRITE | FAN_ATTRIB | FAN_ONDIR;
 constexpr size_t kEventBytes = size_t{1} << 14;
 
-// The handle as events have it, without its length, which the bytes show.
-std::string HandleBytes(const void* file_system, const file_handle& handle) {
-  std::string bytes(static_cast<const char*>(file_system), sizeof(fsid_t));
-  bytes.append(reinterpret_cast<const char*>(&handle.handle_type), sizeof(handle.handle_type));
-  return bytes.append(reinterpret_cast<const char*>(handle.f_handle), handle.handle_bytes);
-}
+// Where an event's information has the file system's id, and right behind it the handle.
+constexpr size_t kIdAt = offsetof(fanotify_event_info_fid, fsid);
+constexpr size_t kHandleAt = offsetof(fanotify_event_info_fid, handle);
+static_assert(kHandleAt == kIdAt + sizeof(fsid_t));
 
-// Empty where the file system has none.
+// As an event has it, id and handle. Empty where the file system gives out none.
 std::string HandleOf(int fd) {
   alignas(file_handle) std::array<char, sizeof(file_handle) + MAX_HANDLE_SZ> buffer = {};
   auto* const handle = reinterpret_cast<file_handle*>(buffer.data());
@@ -34,7 +33,8 @@ std::string HandleOf(int fd) {
       fstatfs(fd, &file_system) != 0) {
     return "";
   }
-  return HandleBytes(&file_system.f_fsid, *handle);
+  std::string bytes(reinterpret_cast<const char*>(&file_system.f_fsid), sizeof(fsid_t));
+  return bytes.append(buffer.data(), sizeof(file_handle) + handle->handle_bytes);
 }
 
 }  // namespace
@@ -70,29 +70,31 @@ std::vector<FolderId> FolderHints::Take() {
   for (;;) {
     const ssize_t length = read(fd_.Get(), events.data(), events.size());
     if (length > 0) {
-      TakeEvents(events.data(), static_cast<size_t>(length), &changed);
+      TakeEvents({events.data(), static_cast<size_t>(length)}, &changed);
     } else if (length == 0 || errno != EINTR) {
       return changed;
     }
   }
 }
 
-void FolderHints::TakeEvents(const char* events, size_t length,
-                             std::vector<FolderId>* changed) const {
-  for (size_t at = 0; at + sizeof(fanotify_event_metadata) <= length;) {
-    const auto* event = reinterpret_cast<const fanotify_event_metadata*>(events + at);
-    if (event->event_len >=
-        event->metadata_len + sizeof(fanotify_event_info_fid) + sizeof(file_handle)) {
-      const auto* info =
-          reinterpret_cast<const fanotify_event_info_fid*>(events + at + event->metadata_len);
-      const auto* handle = reinterpret_cast<const file_handle*>(
-          reinterpret_cast<const char*>(info) + offsetof(fanotify_event_info_fid, handle));
-      const auto folder = folders_.find(HandleBytes(&info->fsid, *handle));
+// Nothing in the buffer but the first event is aligned.
+void FolderHints::TakeEvents(std::string_view events, std::vector<FolderId>* changed) const {
+  fanotify_event_metadata event = {};
+  while (events.size() >= sizeof(event)) {
+    memcpy(&event, events.data(), sizeof(event));
+    const std::string_view info =
+        events.substr(0, event.event_len)
+            .substr(std::min<size_t>(event.metadata_len, event.event_len));
+    file_handle header = {};
+    if (info.size() >= kHandleAt + sizeof(header)) {
+      memcpy(&header, info.data() + kHandleAt, sizeof(header));
+      const auto folder = folders_.find(
+          std::string(info.substr(kIdAt, sizeof(fsid_t) + sizeof(header) + header.handle_bytes)));
       if (folder != folders_.end()) {
         changed->push_back(folder->second);
       }
     }
-    at += event->event_len;
+    events.remove_prefix(std::clamp<size_t>(event.event_len, sizeof(event), events.size()));
   }
 }
 

@@ -3,6 +3,7 @@
 #define WATCH_FOLDER_HINTS_H_
 
 #include <string>
+#include <string_view>
 #include <unordered_map>
 #include <vector>
 
@@ -35,7 +36,7 @@ class FolderHints {
   size_t size() const { return handles_.size(); }
 
  private:
-  void TakeEvents(const char* events, size_t length, std::vector<FolderId>* changed) const;
+  void TakeEvents(std::string_view events, std::vector<FolderId>* changed) const;
 
   const Fd fd_;
   // A handle is the file system's id and what name_to_handle_at() gives, as bytes.

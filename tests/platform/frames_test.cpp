@@ -29,17 +29,17 @@ TEST(Frames, ComeWholeOrWithTheReason) {
   const struct {
     const char* name;
     std::string bytes;
-    bool is_closed;
     std::string body;
     int error;
+    bool is_closed;
   } rows[] = {
-      {"Message", Frame("abc"), false, "abc", 0},
-      {"Empty", Frame(""), false, "", 0},
-      {"AtTheLimit", Frame(std::string(100, 'x')), true, std::string(100, 'x'), 0},
-      {"OverTheLimit", Frame(std::string(101, 'x')), false, "", EMSGSIZE},
-      {"ClosedAtOnce", "", true, "", ECONNRESET},
-      {"ClosedInTheMiddle", Frame("abc").substr(0, 10), true, "", ECONNRESET},
-      {"SilentInTheMiddle", Frame("abc").substr(0, 10), false, "", ETIMEDOUT},
+      {"Message", Frame("abc"), "abc", 0, false},
+      {"Empty", Frame(""), "", 0, false},
+      {"AtTheLimit", Frame(std::string(100, 'x')), std::string(100, 'x'), 0, true},
+      {"OverTheLimit", Frame(std::string(101, 'x')), "", EMSGSIZE, false},
+      {"ClosedAtOnce", "", "", ECONNRESET, true},
+      {"ClosedInTheMiddle", Frame("abc").substr(0, 10), "", ECONNRESET, true},
+      {"SilentInTheMiddle", Frame("abc").substr(0, 10), "", ETIMEDOUT, false},
   };
   for (const auto& row : rows) {
     SCOPED_TRACE(row.name);

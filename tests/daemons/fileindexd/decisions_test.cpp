@@ -96,18 +96,18 @@ TEST(Decisions, AStampTellsWhetherAFileHasChanged) {
   const struct {
     const char* name;
     std::function<void(struct stat&)> change;
-    bool content;
     int64_t indexed_after_ns;  // The change of the attributes.
+    bool content;
     bool is_current;
   } cases[] = {
-      {"Same", [](struct stat&) {}, true, kSecond, true},
-      {"Size", [](struct stat& s) { ++s.st_size; }, true, kSecond, false},
-      {"Modified", [](struct stat& s) { ++s.st_mtim.tv_nsec; }, true, kSecond, false},
-      {"CopiedWithItsDates", [](struct stat& s) { ++s.st_ctim.tv_nsec; }, true, kSecond, false},
-      {"InodeAlone", [](struct stat& s) { ++s.st_ino; }, true, kSecond, true},
-      {"ContentIsWantedNow", [](struct stat&) {}, false, kSecond, false},
-      {"IndexedInTheTickOfTheChange", [](struct stat&) {}, true, kSecond / 100, false},
-      {"IndexedAfterTheTick", [](struct stat&) {}, true, kSecond / 10, true},
+      {"Same", [](struct stat&) {}, kSecond, true, true},
+      {"Size", [](struct stat& s) { ++s.st_size; }, kSecond, true, false},
+      {"Modified", [](struct stat& s) { ++s.st_mtim.tv_nsec; }, kSecond, true, false},
+      {"CopiedWithItsDates", [](struct stat& s) { ++s.st_ctim.tv_nsec; }, kSecond, true, false},
+      {"InodeAlone", [](struct stat& s) { ++s.st_ino; }, kSecond, true, true},
+      {"ContentIsWantedNow", [](struct stat&) {}, kSecond, false, false},
+      {"IndexedInTheTickOfTheChange", [](struct stat&) {}, kSecond / 100, true, false},
+      {"IndexedAfterTheTick", [](struct stat&) {}, kSecond / 10, true, true},
   };
   for (const auto& c : cases) {
     const int64_t now = 2000 * kSecond + 7 + c.indexed_after_ns;

@@ -11,6 +11,7 @@
 #include <ctime>
 #include <filesystem>
 #include <initializer_list>
+#include <iterator>
 #include <map>
 #include <memory>
 #include <optional>
@@ -43,12 +44,13 @@ namespace {
 using fileindex::FixedPath;
 
 constexpr FixedPath kRunFolder("/var/run");
+constexpr FixedPath kLockFolder("/tmp");
 constexpr FixedPath kNotifySocket("/var/run/evnotifyd.sock");
 
 // Where the daemons and this tool keep what they know.
 constexpr FixedPath kStateFolders[] = {
-    FixedPath("/var/run"),
-    FixedPath("/tmp"),
+    kRunFolder,
+    kLockFolder,
     FixedPath("/etc/kavo"),
     FixedPath("/var/packages/Vexlo/etc"),
     FixedPath("/var/lib/kavo/elastic"),
@@ -154,6 +156,7 @@ class Examination {
 
   void LookAtConfig();
   void LookAtPermissions();
+  void LookAtSockets();
   void LookAtEngine();
   void LookAtIndexDaemon();
   void LookAtNotifyDaemon();
@@ -166,6 +169,8 @@ class Examination {
 
   std::optional<Json::Value> AskOne(const std::string& socket, const std::string& request,
                                     Severity severity, const std::string& effect);
+  bool CanUseFolder(const std::string& path, std::vector<std::string>& foreign);
+  bool CanUseLock(const std::string& path);
   void LookAtVolume(const std::string& path, const std::string& of);
 
   const char* subject_ = "";
@@ -199,58 +204,70 @@ void Examination::LookAtConfig() {
                          (count == 1 ? " is" : " are") + " configured");
 }
 
-void Examination::LookAtPermissions() {
-  size_t well = 0;
-  std::vector<std::string> foreign;
-  for (const FixedPath& fixed : kStateFolders) {
-    const std::string path = fixed.Get();
-    const bool is_needed = path == fileindex::GetFileIndexRoot() + "/tmp";
-    struct stat info {};
-    const int error = stat(path.c_str(), &info) == 0 ? 0 : errno;
-    if (error == ENOENT) {
-      // The others are made by whoever needs them.
-      if (is_needed) {
-        Add(Severity::kError, "'" + path + "' is missing, and holds the locks",
-            "mkdir -p " + Quoted(path));
-      }
-    } else if (error == 0 && !S_ISDIR(info.st_mode)) {
-      Add(Severity::kError, "'" + path + "' is no folder",
-          "mv " + Quoted(path) + " " + Quoted(path + ".old"));
-    } else if (error != 0 || access(path.c_str(), R_OK | W_OK | X_OK) != 0) {
-      const int reason = error != 0 ? error : errno;
-      if (reason == EACCES && (error != 0 || info.st_uid != geteuid())) {
-        foreign.push_back(Quoted(path));
-      } else {
-        Add(Severity::kError,
-            Join({"'", path, "' cannot be written: ", std::generic_category().message(reason)}),
-            reason == EACCES ? "chmod u+rwx " + Quoted(path) : "");
-      }
-    } else {
-      ++well;
-    }
+// Whether the folder can be used, or its owner is to be asked: that one's is put with `foreign`.
+bool Examination::CanUseFolder(const std::string& path, std::vector<std::string>& foreign) {
+  struct stat info {};
+  const bool is_there = stat(path.c_str(), &info) == 0;
+  if (is_there && !S_ISDIR(info.st_mode)) {
+    Add(Severity::kError, "'" + path + "' is no folder",
+        "mv " + Quoted(path) + " " + Quoted(path + ".old"));
+    return false;
   }
+  if (is_there && access(path.c_str(), R_OK | W_OK | X_OK) == 0) {
+    return true;
+  }
+  const int error = errno;
+  if (error == ENOENT) {
+    // The others are made by whoever needs them.
+    if (path == kLockFolder.Get()) {
+      Add(Severity::kError, "'" + path + "' is missing, and holds the locks",
+          "mkdir -p " + Quoted(path));
+    }
+  } else if (error == EACCES && (!is_there || info.st_uid != geteuid())) {
+    foreign.push_back(Quoted(path));
+  } else {
+    Add(Severity::kError,
+        Join({"'", path, "' cannot be written: ", std::generic_category().message(error)}),
+        error == EACCES ? "chmod u+rwx " + Quoted(path) : "");
+  }
+  return false;
+}
+
+bool Examination::CanUseLock(const std::string& path) {
+  struct stat info {};
+  if (lstat(path.c_str(), &info) != 0) {
+    return false;
+  }
+  const bool is_file = S_ISREG(info.st_mode);
+  if (is_file && access(path.c_str(), R_OK) == 0) {
+    return true;
+  }
+  // One that somebody may hold is never removed: another could take the lock beside it then.
+  Add(Severity::kError,
+      Join({"the lock file '", path, "' of user ", std::to_string(info.st_uid),
+            " cannot be opened"}),
+      (is_file ? "sudo chmod a+r " : "sudo rm ") + Quoted(path));
+  return false;
+}
+
+void Examination::LookAtPermissions() {
+  std::vector<std::string> foreign;
+  const auto folders =
+      std::count_if(std::begin(kStateFolders), std::end(kStateFolders),
+                    [&](const FixedPath& path) { return CanUseFolder(path.Get(), foreign); });
   if (!foreign.empty()) {
     Add(Severity::kError,
         Counted(foreign.size(), "folder") + " of other users cannot be written, " + foreign[0] +
             (foreign.size() > 1 ? " among them" : "") + ": the service is theirs",
         "sudo fileindex doctor");
   }
-  for (const FixedPath& fixed : kLockFiles) {
-    const std::string path = fixed.Get();
-    struct stat info {};
-    if (lstat(path.c_str(), &info) != 0) {
-      continue;
-    }
-    if (!S_ISREG(info.st_mode) || access(path.c_str(), R_OK) != 0) {
-      // One that somebody may hold is never removed: another could take the lock beside it then.
-      Add(Severity::kError,
-          Join({"the lock file '", path, "' of user ", std::to_string(info.st_uid),
-                " cannot be opened"}),
-          (S_ISREG(info.st_mode) ? "sudo chmod a+r " : "sudo rm ") + Quoted(path));
-    } else {
-      ++well;
-    }
-  }
+  const auto locks = std::count_if(std::begin(kLockFiles), std::end(kLockFiles),
+                                   [&](const FixedPath& path) { return CanUseLock(path.Get()); });
+  LookAtSockets();
+  Add(Severity::kOk, std::to_string(folders + locks) + " folders and locks can be used");
+}
+
+void Examination::LookAtSockets() {
   std::map<uid_t, std::string> owners;
   for (const char* const name :
        {"kavoelasticd", "fileindexd", "evnotifyd", "kavocontentextractd"}) {
@@ -258,16 +275,17 @@ void Examination::LookAtPermissions() {
     const std::string path = kRunFolder.Get() + "/" + name + ".sock";
     if (lstat(path.c_str(), &info) == 0) {
       std::string& names = owners[info.st_uid];
-      names += (names.empty() ? "" : ", ") + std::string(name);
+      names.append(names.empty() ? "" : ", ").append(name);
     }
+  }
+  if (owners.size() < 2) {
+    return;
   }
   for (const auto& [owner, names] : owners) {
-    if (owners.size() > 1) {
-      Add(Severity::kWarning, "the daemons run as different users, and may not reach each other: " +
-                                  names + " as user " + std::to_string(owner));
-    }
+    Add(Severity::kWarning,
+        Join({"the daemons run as different users, and may not reach each other: ", names,
+              " as user ", std::to_string(owner)}));
   }
-  Add(Severity::kOk, Grouped(well) + " folders and locks can be used");
 }
 
 // Says what does not work without the daemon when it does not answer.

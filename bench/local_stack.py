@@ -51,18 +51,25 @@ def load():
 
 
 def take_session():
-    """Goes on in a session of its own: where the kernel schedules by sessions, a lower priority then
-    counts among the processes that are measured, not beside whatever else runs."""
-    if os.getpid() == os.getpgrp():
+    """Goes on in a session of its own: where the kernel schedules by sessions, a lower priority
+    then counts among the processes that are measured, not beside whatever else runs. From now on
+    a signal that is to end the program raises SystemExit."""
+
+    def end(number, _):
+        raise SystemExit(128 + number)
+
+    # Daemons and folders are cleared away then, also in a shell's background, where SIGINT is off.
+    for number in (signal.SIGINT, signal.SIGTERM, signal.SIGHUP):
+        signal.signal(number, end)
+    if os.getpid() == os.getpgrp():  # Which the kernel gives no session of its own.
         child = os.fork()
-        if child != 0:
+        while child != 0:
             try:
                 _, status = os.waitpid(child, 0)
-            except KeyboardInterrupt:
-                os.kill(child, signal.SIGINT)
-                _, status = os.waitpid(child, 0)
-            code = os.waitstatus_to_exitcode(status)
-            os._exit(code if code >= 0 else 1)
+                code = os.waitstatus_to_exitcode(status)
+                os._exit(code if code >= 0 else 128 - code)
+            except SystemExit:
+                os.kill(child, signal.SIGTERM)
     os.setsid()
 
 

@@ -96,6 +96,8 @@ class Fileindexd : public testing::Test {
     EndIndexer(SIGKILL);
     EndEngine(SIGKILL);
   }
+  Fileindexd(const Fileindexd&) = delete;
+  Fileindexd& operator=(const Fileindexd&) = delete;
 
   static std::string FolderText(const std::string& path, bool document = true) {
     return R"({"path":")" + path + R"(","name":"x","document":)" + (document ? "true" : "false") +
@@ -779,6 +781,7 @@ TEST_F(Fileindexd, NothingIsLostToKillsAtAnyMoment) {
     std::mt19937 random(seed);
     for (int round = 0; round < 4; ++round) {
       std::vector<std::string> lines;
+      lines.reserve(40);
       for (int i = 0; i < 40; ++i) {
         lines.push_back(disk.Change());
       }

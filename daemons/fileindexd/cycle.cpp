@@ -228,8 +228,11 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
       if (is_mixed || !scope_.HaveSameSettings(path, path_old)) {
         ReconcileMixed(path);
       }
-    } else if (has_missed) {
-      NoteMissed(path);  // It was renamed on.
+    } else {
+      moved_to_nothing_.insert(path);
+      if (has_missed) {
+        NoteMissed(path);  // It was renamed on.
+      }
     }
   } else if (step == RenameStep::kReconcile) {
     ReconcileMixed(path);
@@ -308,6 +311,7 @@ bool Cycle::IndexUnread() {
   Settle();
   std::vector<std::string> page;
   std::string after;
+  bool all_are_there = true;
   do {
     page = ListUnread(id_, after, kPage);
     if (!page.empty() && after.empty() && !CanReadContents()) {
@@ -317,11 +321,13 @@ bool Cycle::IndexUnread() {
       Check();
       if (IsWanted(path)) {
         Submit(path);
+      } else {
+        all_are_there = false;  // Renamed, say, and its document will be in a later cycle.
       }
       after = path;
     }
   } while (page.size() == kPage);
-  return true;
+  return all_are_there;
 }
 
 void Cycle::Reconcile(const std::string& root, const Json::Value& types, const char* cause) {
@@ -516,7 +522,21 @@ void Cycle::Commit() {
   }
 }
 
+// Where a renamed path was gone already, a later operation has taken its documents on or away,
+// unless that one was folded into an operation before the rename (a folder that is made, filled by
+// the rename, and deleted is one reindex, at the place of its making). Whoever is told of them
+// later compares.
+void Cycle::RemoveGhosts() {
+  for (const std::string& path : std::exchange(moved_to_nothing_, {})) {
+    if (IsGone(path)) {
+      NoteMissed(path);
+      Delete(path);
+    }
+  }
+}
+
 void Cycle::Finish() {
+  RemoveGhosts();
   Commit();
   for (const std::string& path : indexer_.TakeGone()) {
     NoteMissed(path);

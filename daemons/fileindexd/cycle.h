@@ -41,7 +41,7 @@ class Cycle {
   void ReconcileNewFolders();
 
   // Takes what is in the index without what stands in it, as nobody was there to read it. False
-  // when there is such a thing, and still nobody.
+  // when there is such a thing left: still nobody is there, or nothing is at its path (any more).
   bool IndexUnread();
 
   // Whether something was taken that nobody was there to read. To be asked after Finish().
@@ -81,6 +81,7 @@ class Cycle {
   void FlushDeletes();
   // Sends them as one; what fails alone is counted.
   void SendCounted(Json::Value requests);
+  void RemoveGhosts();
   // Returns when the engine has everything that was taken.
   void Settle();
   void Commit();
@@ -108,6 +109,8 @@ class Cycle {
   std::set<std::string> touched_;
   bool touched_too_much_ = false;
   bool inodes_count_ = false;  // In this crawl a document of another inode is another file's.
+  std::set<std::string>
+      moved_to_nothing_;  // Paths that documents were moved to, and nothing stood.
   std::map<int, unsigned> failures_;
 };
 

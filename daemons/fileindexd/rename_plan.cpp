@@ -7,7 +7,7 @@ RenameStep PlanRename(const RenameFacts& facts) {
     return RenameStep::kForget;
   }
   if (!facts.new_inode) {
-    // Renamed on, or deleted: an operation behind this one takes the documents from the new path.
+    // Renamed on, or deleted: whoever moves documents there sees to it that they do not stay.
     const bool is_of_the_moved =
         !facts.old_inode || (facts.document_inode && *facts.document_inode != *facts.old_inode);
     return facts.has_document && is_of_the_moved ? RenameStep::kMove : RenameStep::kForget;

@@ -2,6 +2,7 @@
 
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <ctime>
 #include <exception>
 #include <utility>
@@ -25,6 +26,8 @@ using fileindex::StatusMgr;
 using Clock = std::chrono::steady_clock;
 
 constexpr std::chrono::seconds kSpaceWait{60};
+constexpr std::chrono::seconds kShortestUnreadWait{1};
+constexpr std::chrono::seconds kLongestUnreadWait{60};
 constexpr uint64_t kUsualLineBytes = 100;
 constexpr int kBothBits = fileindex::SS_NEED_REINDEX | fileindex::SS_NEED_REBUILD;
 
@@ -189,7 +192,8 @@ Worker::Outcome Worker::RunCycle() {
   const bool all_is_read = !may_have_unread || cycle().IndexUnread();
   cycle().Finish();
   has_unread_ = cycle().TakeHasUnread() || !all_is_read;
-  unread_wait_ = has_unread_ ? NextWait(unread_wait_) : std::chrono::seconds(0);
+  unread_since_ =
+      has_unread_ ? unread_since_.value_or(Clock::now()) : std::optional<Clock::time_point>();
   if (fills) {
     StatusMgr().UnsetShareStatus(share_, kBothBits);
     state_.rebuilt = false;
@@ -263,8 +267,13 @@ void Worker::WaitAfter(Outcome outcome) {
       // A line in the queue of a share that was away tells that it is back.
       const bool is_idle = outcome == Outcome::kDone;
       stats_.SetState(is_idle ? WorkerState::kIdle : WorkerState::kUnavailable);
-      // Whoever reads contents says nothing when he is back.
-      const auto until = is_idle && has_unread_ ? in(unread_wait_) : std::nullopt;
+      // Whoever reads contents says nothing when he is back. As long again as it has lasted so far,
+      // however many cycles there were meanwhile.
+      const auto until =
+          is_idle && unread_since_
+              ? in(std::clamp<Clock::duration>(Clock::now() - *unread_since_, kShortestUnreadWait,
+                                               kLongestUnreadWait))
+              : std::nullopt;
       while (!is_called() && (!until || Clock::now() < *until)) {
         if (watch_.Wait(until, /*for_queue=*/true)) {
           watch_.Wait(in(coalescing_), /*for_queue=*/false);

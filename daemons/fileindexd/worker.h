@@ -88,7 +88,8 @@ class Worker {
   // The thread's own:
   ShareState state_;
   std::chrono::seconds wait_{0};
-  std::chrono::seconds unread_wait_{0};
+  // Since when some documents lack their text because nobody was there to read it.
+  std::optional<std::chrono::steady_clock::time_point> unread_since_;
   bool has_unread_ = true;  // Perhaps: nobody has looked yet.
   bool space_is_told_ = false;
   bool index_is_missing_ = false;

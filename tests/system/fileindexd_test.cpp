@@ -406,6 +406,15 @@ TEST_F(Fileindexd, CarriesOutEachOperation) {
        {".", "away", "away/b.txt", "away/late", "away/missed.txt", "new.txt", "after", "sane"},
        "elusive",
        {"away/missed.txt"}},
+      // The fold makes the folder's deletion part of its making, which is before the rename.
+      {"RenamedIntoAFolderThatIsGone",
+       [&] { fs::remove_all(In("away")); },
+       {Line(EV_CREATE, In("brief"), "", true), Line(EV_RENAME, In("brief/away"), In("away"), true),
+        Line(EV_DELETE, In("brief/away/b.txt")), Line(EV_DELETE, In("brief/away"), "", true),
+        Line(EV_DELETE, In("brief"), "", true)},
+       {".", "new.txt", "after", "sane"},
+       "elusive",
+       {}},
   };
   for (const auto& step : steps) {
     SCOPED_TRACE(step.name);

@@ -100,7 +100,7 @@ std::string ShareFor(const std::string& folder, const Console& console) {
   if (path == "/") {
     throw Failure("the root folder has no name, so it cannot be a share");
   }
-  const std::string share_path = SharePathOf(path);
+  std::string share_path = SharePathOf(path);
   if (!share_path.empty()) {
     return share_path;
   }

@@ -23,8 +23,8 @@ std::string SharePathOf(const std::string& full_path) {
 }
 
 std::string ToSharePath(const std::string& named) {
-  const std::string path = AbsolutePath(named);
-  const std::string share_path = SharePathOf(path);
+  std::string path = AbsolutePath(named);
+  std::string share_path = SharePathOf(path);
   if (!share_path.empty()) {
     return share_path;
   }

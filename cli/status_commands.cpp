@@ -2,6 +2,7 @@
 #include <json/value.h>
 
 #include <chrono>
+#include <cmath>
 #include <map>
 #include <thread>
 
@@ -99,13 +100,13 @@ std::string TableOf(const Json::Value& all, const std::map<std::string, double>&
   for (const Json::Value& share : all["shares"]) {
     const std::string name = share["share"].asString();
     const auto rate = rates.find(name);
-    shares.push_back({ForTerminal(name), share["state"].asString(),
-                      Counted(share["queue_lines"].asUInt64(), "line"),
-                      Counted(share["operations"].asUInt64(), "change") + ", " +
-                          Counted(share["files"].asUInt64(), "file"),
-                      rate == rates.end() ? "" : Grouped(static_cast<uint64_t>(rate->second + 0.5)),
-                      ForTerminal(WatchText(share["watch"])),
-                      ForTerminal(share["last_error"].asString())});
+    shares.push_back(
+        {ForTerminal(name), share["state"].asString(),
+         Counted(share["queue_lines"].asUInt64(), "line"),
+         Counted(share["operations"].asUInt64(), "change") + ", " +
+             Counted(share["files"].asUInt64(), "file"),
+         rate == rates.end() ? "" : Grouped(static_cast<uint64_t>(std::llround(rate->second))),
+         ForTerminal(WatchText(share["watch"])), ForTerminal(share["last_error"].asString())});
   }
   return "indexing is " + all["status"].asString() + "\n\n" + Table(daemons) +
          (shares.size() > 1 ? "\n" + Table(shares) : "\nno share is indexed\n");

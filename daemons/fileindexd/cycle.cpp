@@ -406,6 +406,11 @@ void Cycle::Remove(const std::vector<GoneList::Gone>& gone) {
       Delete(path);
     } else if (is_gone || !IsWanted(path)) {
       deletes_.append(DeleteItem(id_, path));
+    } else if (with_all_below) {
+      // Something stands there again, perhaps a file. What was below it was met as gone; what is
+      // there by now is told of later.
+      ForgetTaken(path);
+      deletes_.append(DeleteBelowItem(id_, path));
     }
     if (deletes_.size() >= kMostDeletes) {
       FlushDeletes();

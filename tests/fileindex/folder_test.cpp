@@ -366,7 +366,8 @@ TEST(Folder, TellsHowItsIndexingStands) {
            {"['status',1]", "120 1"},
            {"['size']", "120 Unknown additioal: size"},
        }) {
-    const std::string error = Caught([&] { folder->GetDataWithAdditional(Parsed(additional)); });
+    const Json::Value request = Parsed(additional);
+    const std::string error = Caught([&] { folder->GetDataWithAdditional(request); });
     EXPECT_EQ(error.substr(0, want.size()), want);
   }
 }

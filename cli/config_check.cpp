@@ -127,7 +127,7 @@ void CheckFolders(Findings& findings, size_t& count) {
 std::optional<std::set<std::string>> CheckShares(Findings& findings) {
   try {
     CheckSharesFile();
-    return sdk::SDKShare::Enum();
+    return ShareNames();
   } catch (const Failure& failure) {
     findings.Add(kavo::local::SharesFile(), "", failure.what());
     return std::nullopt;

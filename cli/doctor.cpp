@@ -23,6 +23,7 @@
 #include "cli/config_check.h"
 #include "cli/daemon_stats.h"
 #include "cli/quarantine_list.h"
+#include "cli/shares.h"
 #include "cli/text.h"
 #include "common/error.h"
 #include "common/file.h"
@@ -191,7 +192,7 @@ void Examination::LookAtConfig() {
   }
   try {
     folders_ = std::make_unique<fileindex::FolderMgr>();
-    const std::set<std::string> known = sdk::SDKShare::Enum();
+    const std::set<std::string> known = ShareNames();
     for (const std::string& share : folders_->GetIndexedShares()) {
       if (known.contains(share)) {
         shares_.insert(share);

@@ -290,7 +290,7 @@ ExitStatus Prune(const Arguments& /*arguments*/, const Console& console) {
   WithFolders([&] {
     const LockFile lock(fileindex::kFileIndexFoldersLockPath.Get(), /*exclusive=*/true);
     FolderMgr folders;
-    const std::set<std::string> shares = sdk::SDKShare::Enum();
+    const std::set<std::string> shares = ShareNames();
     for (const auto& folder : folders.GetFolders()) {
       if (!shares.contains(folder->GetShare())) {
         gone[folder->GetShare()].push_back(folder->GetPath());

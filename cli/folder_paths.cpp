@@ -29,9 +29,8 @@ std::string ToSharePath(const std::string& named) {
     return share_path;
   }
   // A folder may be of a share that is gone.
-  if (named.starts_with('/') &&
-      (sdk::SDKShare::Enum().contains(fileindex::GetShareNameByPath(path)) ||
-       fileindex::FolderMgr().HasFolder(path))) {
+  if (named.starts_with('/') && (ShareNames().contains(fileindex::GetShareNameByPath(path)) ||
+                                 fileindex::FolderMgr().HasFolder(path))) {
     return path;
   }
   throw Failure("'" + ForTerminal(named) + "' lies in no share; 'fileindex share list' lists them");

@@ -131,6 +131,14 @@ void CheckSharesFile() {
   OnSharesFile([](const std::string& file) { kavo::local::ReadShares(file); });
 }
 
+std::set<std::string> ShareNames() {
+  std::set<std::string> names;
+  for (const Share& share : OnSharesFile(kavo::local::ReadShares)) {
+    names.insert(share.name);
+  }
+  return names;
+}
+
 std::vector<Command> ShareCommands() {
   return {
       {"share list",

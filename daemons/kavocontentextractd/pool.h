@@ -25,10 +25,17 @@ inline constexpr int kOutOfMemory = 3;
 // A worker's reply is refused when it is longer.
 inline constexpr size_t kMaxReplyBytes = size_t{8} << 20;
 
+// What a sanitizer takes of the address space is no fault of the files.
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+inline constexpr size_t kUsualMemory = 0;
+#else
+inline constexpr size_t kUsualMemory = 512;
+#endif
+
 struct PoolOptions {
   std::string program;                           // Started as "PROGRAM --worker MIB".
   size_t workers = 2;                            // At most; started when they are needed.
-  size_t memory = 512;                           // Address space of each in MiB; 0 for no limit.
+  size_t memory = kUsualMemory;                  // Address space of each in MiB; 0 for no limit.
   std::chrono::milliseconds deadline{10000};     // For one file.
   std::chrono::milliseconds start_limit{10000};  // Until a new worker is ready.
   std::chrono::milliseconds wait_limit{4000};    // For one to come free.

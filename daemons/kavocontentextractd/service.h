@@ -42,9 +42,9 @@ class Service {
 
 // What the command line may set.
 struct Settings {
-  unsigned deadline = 10;  // Seconds for a file.
-  size_t memory = 512;     // MiB of address space for a worker; 0 for no limit.
-  size_t workers = 0;      // 0 for as many as there are processors, 2 to 8.
+  unsigned deadline = 10;        // Seconds for a file.
+  size_t memory = kUsualMemory;  // MiB of address space for a worker; 0 for no limit.
+  size_t workers = 0;            // 0 for as many as there are processors, 2 to 8.
 };
 
 // The daemon's name, pid file and command line, which goes into `settings`.

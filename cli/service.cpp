@@ -4,26 +4,20 @@
 #include <sys/un.h>
 #include <unistd.h>
 
-#include <chrono>
-
-#include "common/json.h"
+#include "cli/daemon_stats.h"
 #include "fileindex/paths.h"
 #include "kavo/local/content.h"
-#include "kavo/local/frames.h"
 #include "kavo/local/shares.h"
 
 namespace vexlo::cli {
-namespace {
-
-constexpr auto kPatience = std::chrono::seconds(2);
-constexpr size_t kMostReplyBytes = size_t{16} << 20;
-
-}  // namespace
 
 bool IsListening(const std::string& path) {
   sockaddr_un address{AF_UNIX, {}};
+  if (path.size() >= sizeof(address.sun_path)) {
+    return false;
+  }
   const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-  if (fd < 0 || path.size() >= sizeof(address.sun_path)) {
+  if (fd < 0) {
     return false;
   }
   path.copy(address.sun_path, sizeof(address.sun_path) - 1);
@@ -42,20 +36,8 @@ std::vector<DaemonPlace> LocalDaemons() {
 
 Json::Value AskStats(const std::string& socket) {
   // The daemons name what they are asked differently; each passes over what it does not know.
-  constexpr char kRequest[] = R"({"command":"stats","type":"stats","data":null})";
-  const kavo::local::Deadline deadline = std::chrono::steady_clock::now() + kPatience;
-  const int fd = kavo::local::ConnectWithin(socket, deadline);
-  std::string reply;
-  Json::Value stats;
-  if (fd >= 0) {
-    if (!kavo::local::SendFrame(fd, kRequest, /*file=*/-1, deadline) ||
-        !kavo::local::ReceiveFrame(fd, kMostReplyBytes, reply, /*file=*/nullptr, deadline) ||
-        !JsonFromString(stats, reply)) {
-      stats = Json::Value();
-    }
-    close(fd);
-  }
-  return stats.isObject() ? stats : Json::Value();
+  return AskDaemon(socket, R"({"command":"stats","type":"stats","data":null})")
+      .value_or(Json::Value());
 }
 
 Json::Value AskShares() {

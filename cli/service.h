@@ -20,7 +20,7 @@ struct DaemonPlace {
 };
 std::vector<DaemonPlace> LocalDaemons();
 
-// What the daemon behind a socket answers to "stats", null when it does not within two seconds.
+// What the daemon behind a socket answers to "stats", null when it does not (see AskDaemon).
 Json::Value AskStats(const std::string& socket);
 
 // The index daemon's "shares", an array.

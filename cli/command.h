@@ -73,6 +73,7 @@ std::vector<Command> ExtractCommands();
 std::vector<Command> FailedCommands();
 std::vector<Command> FolderCommands();
 std::vector<Command> IndexCommands();
+std::vector<Command> MetricsCommands();
 std::vector<Command> PauseCommands();
 std::vector<Command> QueueCommands();
 std::vector<Command> SearchCommands();

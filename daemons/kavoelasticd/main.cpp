@@ -6,6 +6,7 @@
 #include <thread>
 
 #include "daemons/kavoelasticd/engine.h"
+#include "daemons/kavoelasticd/request_stats.h"
 #include "daemons/kavoelasticd/server.h"
 #include "kavo/local/shares.h"
 
@@ -30,7 +31,10 @@ int main(int argc, char** argv) {
       vexlo::elasticd::ElasticdOptions(), argc, argv, [](vexlo::daemon::Daemon& daemon) {
         vexlo::elasticd::Engine engine(kavo::local::Root() + "/var/lib/kavo/elastic/indexes.json");
         const std::jthread committer(CommitIdle, std::ref(engine));
-        vexlo::elasticd::Serve(
-            daemon, [&engine](const Json::Value& request) { return engine.Handle(request); });
+        vexlo::elasticd::RequestStats stats;
+        vexlo::elasticd::Serve(daemon, [&](const Json::Value& request) {
+          return stats.Answer(request,
+                              [&](const Json::Value& asked) { return engine.Handle(asked); });
+        });
       });
 }

@@ -30,7 +30,7 @@ endforeach()
 
 find_program(FILEINDEX_LOWDOWN lowdown)
 if(FILEINDEX_LOWDOWN)
-  foreach(page engine.5 queue.5 shares.5 state.5 extract.7 indexing.7 notify.7 policy.7
+  foreach(page engine.5 queue.5 shares.5 state.5 extract.7 indexing.7 notify.7 operations.7 policy.7
                troubleshooting.7)
     string(REGEX MATCH "^[a-z]+" name ${page})
     string(REGEX MATCH "[0-9]$" section ${page})

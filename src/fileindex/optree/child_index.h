@@ -6,9 +6,10 @@
 #include <bit>
 #include <cstddef>
 #include <cstdint>
-#include <functional>
 #include <string_view>
 #include <vector>
+
+#include "fileindex/optree/name_hash.h"
 
 namespace vexlo::fileindex {
 
@@ -21,13 +22,14 @@ class ChildIndex {
   // Below this many children a linear search is as fast, and most folders need no index.
   static constexpr size_t kFewestChildren = 8;
 
-  // The position of the first child of that name, or `count`, the number of children.
+  // The position of the first child of that name, whose NameHash() is `hash`, or `count`, the
+  // number of children.
   template <typename NameAt>
-  size_t Find(size_t count, NameAt name_at, std::string_view name) {
+  size_t Find(size_t count, NameAt name_at, std::string_view name, uint64_t hash) {
     if (indexed_ != count) {
       Follow(count, name_at);
     }
-    const Slot& slot = Probe(name_at, name, Hash(name));
+    const Slot& slot = Probe(name_at, name, hash);
     return slot.position_plus_one == 0 ? count : slot.position_plus_one - 1;
   }
 
@@ -35,7 +37,6 @@ class ChildIndex {
   // prefetch the hash's slot; take the position that stands there, or kNone; see for themselves
   // whether it is the right one. A child that is not found so may be there all the same.
   static constexpr size_t kNone = SIZE_MAX;
-  static uint64_t Hash(std::string_view name) { return std::hash<std::string_view>()(name); }
   void Prefetch(uint64_t hash) const {
     if (!slots_.empty()) {
       __builtin_prefetch(&slots_[hash & (slots_.size() - 1)]);
@@ -86,9 +87,10 @@ class ChildIndex {
     }
     for (; indexed_ < count; ++indexed_) {
       const std::string_view name = name_at(indexed_);
-      Slot& slot = Probe(name_at, name, Hash(name));
+      const uint64_t hash = NameHash(name);
+      Slot& slot = Probe(name_at, name, hash);
       if (slot.position_plus_one == 0) {  // Of equal names the first wins.
-        slot = {Tag(Hash(name)), static_cast<uint32_t>(indexed_ + 1)};
+        slot = {Tag(hash), static_cast<uint32_t>(indexed_ + 1)};
       }
     }
   }

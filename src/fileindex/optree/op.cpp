@@ -6,6 +6,7 @@
 
 #include "common/json.h"
 #include "fileindex/optree/child_index.h"
+#include "fileindex/optree/name_hash.h"
 
 namespace vexlo::fileindex {
 namespace {
@@ -67,10 +68,10 @@ std::string OPNode::GetPath() const {
 }
 
 std::shared_ptr<OPNode> OPNode::GetChild(const std::string& child_name) {
-  return FindOrAddChild(child_name).shared_from_this();
+  return FindOrAddChild(child_name, NameHash(child_name)).shared_from_this();
 }
 
-OPNode* OPNode::FindChild(std::string_view child_name) {
+OPNode* OPNode::FindChild(std::string_view child_name, uint64_t hash) {
   if (index_ == nullptr) {
     for (const std::shared_ptr<OPNode>& child : children) {
       if (child->name == child_name) {
@@ -80,12 +81,12 @@ OPNode* OPNode::FindChild(std::string_view child_name) {
     return nullptr;
   }
   const auto name_at = [this](size_t i) { return std::string_view(children[i]->name); };
-  const size_t found = index_->Find(children.size(), name_at, child_name);
+  const size_t found = index_->Find(children.size(), name_at, child_name, hash);
   return found < children.size() ? children[found].get() : nullptr;
 }
 
-OPNode& OPNode::FindOrAddChild(std::string_view child_name) {
-  if (OPNode* const found = FindChild(child_name); found != nullptr) {
+OPNode& OPNode::FindOrAddChild(std::string_view child_name, uint64_t hash) {
+  if (OPNode* const found = FindChild(child_name, hash); found != nullptr) {
     return *found;
   }
   auto child = std::make_shared<OPNode>(shared_from_this(), std::string(child_name));

@@ -78,8 +78,9 @@ class VEXLO_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
  private:
   friend class OPTree;
 
-  OPNode* FindChild(std::string_view child_name);  // Null when there is none.
-  OPNode& FindOrAddChild(std::string_view child_name);
+  // `hash` is the name's NameHash(). Null when there is none.
+  OPNode* FindChild(std::string_view child_name, uint64_t hash);
+  OPNode& FindOrAddChild(std::string_view child_name, uint64_t hash);
 
   std::unique_ptr<ChildIndex> index_;  // Of a node with many children; null otherwise.
   uint32_t position_ = 0;              // In the parent's `children`, as GetChild() put it there.

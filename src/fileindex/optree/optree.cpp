@@ -9,9 +9,11 @@
 #include "common/check.h"
 #include "common/string.h"
 #include "fileindex/optree/child_index.h"
+#include "fileindex/optree/folder_cache.h"
 #include "fileindex/optree/line_parser.h"
 #include "fileindex/optree/line_reader.h"
 #include "fileindex/optree/malformed_line.h"
+#include "fileindex/optree/name_hash.h"
 
 namespace vexlo::fileindex {
 namespace {
@@ -98,6 +100,7 @@ OPTree::OPTree(const std::string& queue_path_in, std::function<void(const Progre
 
 void OPTree::BuildTree() {
   literal_ = !ops.empty() || !root->children.empty();
+  folders_ = literal_ ? nullptr : std::make_shared<FolderCache>();
   ReadQueue();
   if (must_start_over_) {
     must_start_over_ = false;
@@ -107,12 +110,12 @@ void OPTree::BuildTree() {
     crashed = false;
     ops.clear();
     root = std::make_shared<OPNode>(nullptr, "");
-    last_folder_ = nullptr;
+    folders_ = nullptr;
     literal_ = true;
     ReadQueue();
   }
   literal_ = true;  // Whatever comes after the file.
-  last_folder_ = nullptr;
+  folders_ = nullptr;
   reported_lines_ = 0;
   unparsable_lines_.clear();
 }
@@ -122,9 +125,11 @@ struct OPTree::AheadLine {
   QueueLine line;
   bool ordinary = false;  // `event` holds what the line says.
   EventView event;
+  std::string_view folder_path;
+  uint64_t folder_hash = 0;
   OPNode* folder = nullptr;  // Of the path; null when it is not there or was not looked for.
-  std::string_view name;     // In the folder.
-  uint64_t hash = 0;
+  std::string_view name;     // In the folder; empty when the folder is not to be looked for.
+  uint64_t hash = 0;         // Of the name.
   size_t guess = ChildIndex::kNone;
   OPNode* node = nullptr;  // Of the path; null when it was not found.
 };
@@ -184,13 +189,20 @@ void OPTree::Resolve(std::vector<AheadLine>& lines) {
   }
   for (AheadLine& line : lines) {
     const size_t slash = line.event.path.rfind('/');
-    if (!line.ordinary || slash == std::string_view::npos || slash + 1 == line.event.path.size()) {
+    if (line.ordinary && slash != std::string_view::npos && slash + 1 < line.event.path.size()) {
+      line.name = line.event.path.substr(slash + 1);
+      line.folder_path = line.event.path.substr(0, slash);
+      line.folder_hash = NameHash(line.folder_path);
+      folders_->Prefetch(line.folder_hash);
+    }
+  }
+  for (AheadLine& line : lines) {
+    if (line.name.empty()) {
       continue;
     }
-    line.name = line.event.path.substr(slash + 1);
-    line.folder = FindFolder(line.event.path.substr(0, slash));
+    line.folder = FindFolder(line.folder_path, line.folder_hash);
+    line.hash = NameHash(line.name);
     if (line.folder != nullptr && line.folder->index_ != nullptr) {
-      line.hash = ChildIndex::Hash(line.name);
       line.folder->index_->Prefetch(line.hash);
     }
   }
@@ -225,22 +237,20 @@ void OPTree::Resolve(std::vector<AheadLine>& lines) {
 }
 
 // The node of a folder that is there already, by a path that is checked on the way; else null.
-OPNode* OPTree::FindFolder(std::string_view path) {
-  if (last_folder_ != nullptr && path == last_folder_path_) {
-    return last_folder_;
+OPNode* OPTree::FindFolder(std::string_view path, uint64_t hash) {
+  if (OPNode* const known = folders_->Find(path, hash); known != nullptr) {
+    return known;
   }
   OPNode* node = root.get();
   for (size_t begin = 0; begin < path.size() && node != nullptr;) {
     const size_t end = std::min(path.find('/', begin + 1), path.size());
     // Every component follows one "/": an empty one names no child.
-    node = path[begin] == '/' && end > begin + 1
-               ? node->FindChild(path.substr(begin + 1, end - begin - 1))
-               : nullptr;
+    const std::string_view name = path.substr(begin + 1, end - begin - 1);
+    node = path[begin] == '/' && !name.empty() ? node->FindChild(name, NameHash(name)) : nullptr;
     begin = end;
   }
   if (node != nullptr) {
-    last_folder_path_ = path;
-    last_folder_ = node;
+    folders_->Put(path, hash, node);
   }
   return node;
 }
@@ -254,7 +264,7 @@ void OPTree::InsertLine(LineParser& parser, const AheadLine& line, bool reported
     const EventView& event = line.ordinary ? line.event : parser.ParseUnusual(line.line);
     parsed = true;
     Insert(event, line.node != nullptr     ? *line.node
-                  : line.folder != nullptr ? line.folder->FindOrAddChild(line.name)
+                  : line.folder != nullptr ? line.folder->FindOrAddChild(line.name, line.hash)
                                            : FindNode(event.path));
   } catch (const Error& error) {
     ++skipped_count_;
@@ -466,7 +476,6 @@ void OPTree::Rename(OPNode& node, std::string_view new_path, const std::shared_p
                     bool may_trade) {
   const std::string old_path = op->path_old;
   OPNode& source = FindNode(old_path);
-  last_folder_ = nullptr;
   const bool overlapping = IsSameOrBelow(new_path, old_path) || IsSameOrBelow(old_path, new_path);
   if (overlapping && !literal_) {
     must_start_over_ = true;
@@ -538,6 +547,7 @@ bool OPTree::TradePlaces(OPNode& source, OPNode& target) {
   target.settled_ops_ = 0;
 
   source_slot.swap(target_slot);
+  folders_->Forget();
   source.name.swap(target.name);
   source.parent.swap(target.parent);
   std::swap(source.position_, target.position_);
@@ -560,7 +570,7 @@ void OPTree::MoveMarkedBelow(OPNode& from, OPNode& to, Mark mark, Which which) {
     const auto [node, node_to] = marked.back();
     marked.pop_back();
     TakeMarkedChildren(*node, mark, [&, target = node_to](OPNode& child) {
-      OPNode& child_to = target->FindOrAddChild(child.name);
+      OPNode& child_to = target->FindOrAddChild(child.name, NameHash(child.name));
       MoveOps(child, child_to, which);
       marked.emplace_back(&child, &child_to);
     });
@@ -684,13 +694,21 @@ std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
 }
 
 OPNode& OPTree::FindNode(std::string_view path) {
+  if (folders_ != nullptr && !path.empty() && path.back() != '/') {
+    const std::string_view folder_path = path.substr(0, std::min(path.rfind('/'), path.size()));
+    if (OPNode* const folder = folders_->Find(folder_path, NameHash(folder_path))) {
+      const std::string_view name = path.substr(folder_path.size() + 1);
+      return folder->FindOrAddChild(name, NameHash(name));
+    }
+  }
   OPNode* node = root.get();
   // Going back up from the node gives the path again just when every component followed one "/".
   bool normalised = path.empty() || path.front() == '/';
   for (size_t begin = 0; begin < path.size();) {
     const size_t end = std::min(path.find('/', begin), path.size());
     if (end > begin) {
-      node = &node->FindOrAddChild(path.substr(begin, end - begin));
+      const std::string_view name = path.substr(begin, end - begin);
+      node = &node->FindOrAddChild(name, NameHash(name));
     } else if (begin > 0) {
       normalised = false;
     }

@@ -7,6 +7,7 @@
 #include "common/json.h"
 #include "fileindex/optree/child_index.h"
 #include "fileindex/optree/name_hash.h"
+#include "fileindex/optree/slab.h"
 
 namespace vexlo::fileindex {
 namespace {
@@ -18,6 +19,8 @@ constexpr const char* kCategories[] = {"document", "audio", "video", "photo", "b
 OP::OP(std::shared_ptr<OPNode> node_in, FileIndexOP op_in, const std::string& path_old_in,
        const Json::Value& data_in)
     : node(node_in), op(op_in), path_old(path_old_in), data(data_in) {}
+
+OP::OP(std::weak_ptr<OPNode> node_in, FileIndexOP op_in) : node(std::move(node_in)), op(op_in) {}
 
 void OP::MergeData(const Json::Value& incoming) {
   Json::Value merged = data.isObject() ? data : Json::Value(Json::objectValue);
@@ -32,6 +35,9 @@ void OP::MergeData(const Json::Value& incoming) {
 
 OPNode::OPNode(std::shared_ptr<OPNode> parent_in, const std::string& name_in)
     : name(name_in), parent(parent_in) {}
+
+OPNode::OPNode(std::weak_ptr<OPNode> parent_in, std::string_view name_in)
+    : name(name_in), parent(std::move(parent_in)) {}
 
 OPNode::~OPNode() {
   // Children are taken apart from a list of their own: a destructor that runs its children's would
@@ -89,7 +95,7 @@ OPNode& OPNode::FindOrAddChild(std::string_view child_name, uint64_t hash) {
   if (OPNode* const found = FindChild(child_name, hash); found != nullptr) {
     return *found;
   }
-  auto child = std::make_shared<OPNode>(shared_from_this(), std::string(child_name));
+  auto child = std::allocate_shared<OPNode>(SlabAllocator<OPNode>(), weak_from_this(), child_name);
   child->position_ = static_cast<uint32_t>(children.size());
   children.push_back(std::move(child));
   if (index_ == nullptr && children.size() >= ChildIndex::kFewestChildren) {

@@ -36,6 +36,8 @@ enum FileIndexOP : int32_t {
 struct VEXLO_EXPORT OP {
   OP(std::shared_ptr<OPNode> node, FileIndexOP op, const std::string& path_old,
      const Json::Value& data);
+  // Without a path and a payload.
+  OP(std::weak_ptr<OPNode> node, FileIndexOP op);
 
   // Sets each of "document", "audio", "video", "photo" and "basic" of `data` to whether it is true
   // here (a JSON true; anything else is false) or in `data` (anything that converts to true). Other
@@ -55,6 +57,7 @@ struct VEXLO_EXPORT OP {
 class VEXLO_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
  public:
   OPNode(std::shared_ptr<OPNode> parent, const std::string& name);
+  OPNode(std::weak_ptr<OPNode> parent, std::string_view name);
   ~OPNode();
   OPNode(const OPNode&) = delete;
   OPNode& operator=(const OPNode&) = delete;

@@ -14,6 +14,7 @@
 #include "fileindex/optree/line_reader.h"
 #include "fileindex/optree/malformed_line.h"
 #include "fileindex/optree/name_hash.h"
+#include "fileindex/optree/slab.h"
 
 namespace vexlo::fileindex {
 namespace {
@@ -32,6 +33,10 @@ bool MovesWithItsFolder(const OP& op) { return op.op >= OP_UPSERT; }
 const Json::Value& NullData() {
   static const Json::Value null;
   return null;
+}
+
+std::shared_ptr<OP> NewOP(OPNode& node, FileIndexOP op) {
+  return std::allocate_shared<OP>(SlabAllocator<OP>(), node.weak_from_this(), op);
 }
 
 }  // namespace
@@ -323,18 +328,18 @@ void OPTree::InsertOneStep(uint32_t step, const EventView& event, OPNode& node) 
     case EV_UPDATE_DIRECTORY:
       return HandleNew(Handler::kUpdateDirectory, node,
                        event.data == nullptr ? NullData() : *event.data);
-    default:
-      return Rename(node, event.path,
-                    std::make_shared<OP>(node.shared_from_this(), OP_NONE,
-                                         std::string(event.path_old), NullData()),
-                    /*may_trade=*/!literal_);
+    default: {
+      const std::shared_ptr<OP> op = NewOP(node, OP_NONE);
+      op->path_old = event.path_old;
+      return Rename(node, event.path, op, /*may_trade=*/!literal_);
+    }
   }
 }
 
 // The steps of one line share one operation: a later step finds what an earlier one added among the
 // pending ones, and its rule applies to it like to any other.
 void OPTree::InsertSteps(uint32_t steps, const EventView& event, OPNode& node) {
-  const auto op = std::make_shared<OP>(node.shared_from_this(), OP_NONE, "", NullData());
+  const std::shared_ptr<OP> op = NewOP(node, OP_NONE);
   const auto has = [steps](EventMask step) { return (steps & step) != 0; };
   if (has(EV_CREATE)) {
     Handle(event.is_dir ? Handler::kReindex : Handler::kCreate, node, op);
@@ -414,17 +419,26 @@ void OPTree::HandleNew(Handler handler, OPNode& node, const Json::Value& data) {
     CancelBelow(node);
   }
   if (survives) {
-    Add(std::make_shared<OP>(node.shared_from_this(), kKindOf[static_cast<size_t>(handler)],
-                             std::string(), data));
+    const std::shared_ptr<OP> op = NewOP(node, kKindOf[static_cast<size_t>(handler)]);
+    if (!data.isNull()) {
+      op->data = data;
+    }
+    AddTo(node, op);
   }
 }
 
 void OPTree::Add(const std::shared_ptr<OP>& op) {
-  ops.push_back(op);
   if (const std::shared_ptr<OPNode> node = op->node.lock(); node != nullptr) {
-    node->ops.push_back(op);
-    SetMarks(*node, MarksOf(op->op));
+    AddTo(*node, op);
+  } else {
+    ops.push_back(op);
   }
+}
+
+void OPTree::AddTo(OPNode& node, const std::shared_ptr<OP>& op) {
+  ops.push_back(op);
+  node.ops.push_back(op);
+  SetMarks(node, MarksOf(op->op));
 }
 
 bool OPTree::ApplyRules(Handler handler, OPNode& node, const Json::Value& data, OP* added) {
@@ -474,7 +488,7 @@ void OPTree::CancelBelow(OPNode& node) {
 
 void OPTree::Rename(OPNode& node, std::string_view new_path, const std::shared_ptr<OP>& op,
                     bool may_trade) {
-  const std::string old_path = op->path_old;
+  const std::string_view old_path = op->path_old;
   OPNode& source = FindNode(old_path);
   const bool overlapping = IsSameOrBelow(new_path, old_path) || IsSameOrBelow(old_path, new_path);
   if (overlapping && !literal_) {
@@ -516,7 +530,7 @@ void OPTree::Rename(OPNode& node, std::string_view new_path, const std::shared_p
   }
   Add(op);  // To its node, which the moves may have changed.
   if (carried != OP_NONE) {
-    Add(std::make_shared<OP>(moved->shared_from_this(), carried, std::string(), NullData()));
+    AddTo(*moved, NewOP(*moved, carried));
   }
 }
 

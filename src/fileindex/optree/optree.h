@@ -111,7 +111,8 @@ class VEXLO_EXPORT OPTree {
   void InsertSteps(uint32_t steps, const EventView& event, OPNode& node);
   void Handle(Handler handler, OPNode& node, const std::shared_ptr<OP>& op);
   void HandleNew(Handler handler, OPNode& node, const Json::Value& data);
-  void Add(const std::shared_ptr<OP>& op);
+  void Add(const std::shared_ptr<OP>& op);  // To its own node.
+  void AddTo(OPNode& node, const std::shared_ptr<OP>& op);
 
   // Applies the handler's rules to all that is pending; true when none of it absorbs the new one,
   // which `added` points to if it exists already. `data` may be its own.

@@ -2,21 +2,55 @@
 #ifndef FILEINDEX_OPTREE_CHILD_INDEX_H_
 #define FILEINDEX_OPTREE_CHILD_INDEX_H_
 
+#include <algorithm>
 #include <array>
 #include <bit>
 #include <cstddef>
 #include <cstdint>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "fileindex/optree/name_hash.h"
 
 namespace vexlo::fileindex {
 
-// Names of children to their positions: open addressing over 8-byte slots that hold a position and
-// half a hash. The names stay with the children; `name_at(position)` gives them. The list of
-// children is public, so the index follows it: what was appended behind its back is taken in at the
-// next look-up, and when something was removed it starts over.
+// The children of a node that carry one mark, by position: a bit for each. Some may not carry it
+// any more. A walk finds a few marked ones among a million without looking at each child.
+class MarkedChildren {
+ public:
+  void Add(size_t position) {
+    const size_t word = position / 64;
+    if (word >= words_.size()) {
+      words_.resize(std::max(word + 1, words_.size() + words_.size() / 2));
+    }
+    words_[word] |= uint64_t{1} << position % 64;
+    first_ = std::min(first_, word);
+    behind_ = std::max(behind_, word + 1);
+  }
+
+  // Takes all out and calls `visit(position)` on each, in order. `visit` adds none to this list.
+  template <typename Visit>
+  void TakeAll(Visit visit) {
+    const size_t behind = std::exchange(behind_, 0);
+    for (size_t word = std::exchange(first_, SIZE_MAX); word < behind; ++word) {
+      for (uint64_t bits = std::exchange(words_[word], 0); bits != 0; bits &= bits - 1) {
+        visit(word * 64 + static_cast<size_t>(std::countr_zero(bits)));
+      }
+    }
+  }
+
+ private:
+  std::vector<uint64_t> words_;
+  size_t first_ = SIZE_MAX;  // All others outside [first_, behind_) are zero.
+  size_t behind_ = 0;
+};
+
+// Names of children to their positions: open addressing over 4-byte slots that hold a position and,
+// in the bits that are left, a piece of the hash. The names stay with the children;
+// `name_at(position)` gives them. The list of children is public, so the index follows it: what was
+// appended behind its back is taken in at the next look-up, and when something was removed it
+// starts over.
 class ChildIndex {
  public:
   // Below this many children a linear search is as fast, and most folders need no index.
@@ -29,8 +63,8 @@ class ChildIndex {
     if (indexed_ != count) {
       Follow(count, name_at);
     }
-    const Slot& slot = Probe(name_at, name, hash);
-    return slot.position_plus_one == 0 ? count : slot.position_plus_one - 1;
+    const uint32_t slot = Probe(name_at, name, hash);
+    return slot == 0 ? count : Position(slot);
   }
 
   // A look-up in steps, for those who make several at once and would wait for memory at each:
@@ -44,35 +78,28 @@ class ChildIndex {
   }
   size_t Guess(uint64_t hash) const {
     const size_t mask = slots_.size() - 1;
-    for (size_t at = hash & mask; !slots_.empty() && slots_[at].position_plus_one != 0;
-         at = (at + 1) & mask) {
-      if (slots_[at].tag == Tag(hash)) {
-        return slots_[at].position_plus_one - 1;
+    for (size_t at = hash & mask; !slots_.empty() && slots_[at] != 0; at = (at + 1) & mask) {
+      if (slots_[at] >> tag_shift_ == Tag(hash)) {
+        return Position(slots_[at]);
       }
     }
     return kNone;
   }
 
-  // For each mark that a node may carry, the positions of the children that carry it (some may not
-  // any more), so that a walk finds a few marked ones among a million without looking at each.
-  std::array<std::vector<uint32_t>, 3> marked;
+  std::array<MarkedChildren, 3> marked;  // For each mark that a node may carry.
 
  private:
-  struct Slot {
-    uint32_t tag;
-    uint32_t position_plus_one;  // 0: empty.
-  };
-
-  static uint32_t Tag(uint64_t hash) { return static_cast<uint32_t>(hash >> 32); }
+  // Of the hash the bits that do not choose the slot, as many as there is room for.
+  uint32_t Tag(uint64_t hash) const { return static_cast<uint32_t>(hash >> 32) >> tag_shift_; }
+  size_t Position(uint32_t slot) const { return (slot & ((uint32_t{1} << tag_shift_) - 1)) - 1; }
 
   // The slot of that name, or the empty one where it belongs.
   template <typename NameAt>
-  Slot& Probe(NameAt name_at, std::string_view name, uint64_t hash) {
+  uint32_t& Probe(NameAt name_at, std::string_view name, uint64_t hash) {
     const size_t mask = slots_.size() - 1;
     for (size_t at = hash & mask;; at = (at + 1) & mask) {
-      Slot& slot = slots_[at];
-      if (slot.position_plus_one == 0 ||
-          (slot.tag == Tag(hash) && name_at(slot.position_plus_one - 1) == name)) {
+      uint32_t& slot = slots_[at];
+      if (slot == 0 || (slot >> tag_shift_ == Tag(hash) && name_at(Position(slot)) == name)) {
         return slot;
       }
     }
@@ -82,21 +109,25 @@ class ChildIndex {
   void Follow(size_t count, NameAt name_at) {
     const size_t wanted_slots = std::bit_ceil(count * 4 / 3 + 1);
     if (count < indexed_ || wanted_slots > slots_.size()) {
-      slots_.assign(wanted_slots, Slot{});
+      slots_.assign(wanted_slots, 0);
+      tag_shift_ = static_cast<unsigned>(std::countr_zero(wanted_slots));
       indexed_ = 0;
     }
     for (; indexed_ < count; ++indexed_) {
       const std::string_view name = name_at(indexed_);
       const uint64_t hash = NameHash(name);
-      Slot& slot = Probe(name_at, name, hash);
-      if (slot.position_plus_one == 0) {  // Of equal names the first wins.
-        slot = {Tag(hash), static_cast<uint32_t>(indexed_ + 1)};
+      uint32_t& slot = Probe(name_at, name, hash);
+      if (slot == 0) {  // Of equal names the first wins.
+        slot = Tag(hash) << tag_shift_ | static_cast<uint32_t>(indexed_ + 1);
       }
     }
   }
 
-  std::vector<Slot> slots_;  // A power of two, at most three quarters full.
-  size_t indexed_ = 0;       // So many children from the first one on are in.
+  // A power of two, at most three quarters full; so a position and one fits the low bits, as many
+  // as it takes to number the slots, and 0 is an empty slot.
+  std::vector<uint32_t> slots_;
+  unsigned tag_shift_ = 0;  // So many bits.
+  size_t indexed_ = 0;      // So many children from the first one on are in.
 };
 
 }  // namespace vexlo::fileindex

@@ -12,6 +12,10 @@
 namespace vexlo::fileindex {
 namespace {
 
+// From so many children on their list grows by a quarter at a time: by then it is moved rarely, and
+// doubled it would be half empty on average.
+constexpr size_t kCloseGrowth = 16;
+
 constexpr const char* kCategories[] = {"document", "audio", "video", "photo", "basic"};
 
 }  // namespace
@@ -95,15 +99,18 @@ OPNode& OPNode::FindOrAddChild(std::string_view child_name, uint64_t hash) {
   if (OPNode* const found = FindChild(child_name, hash); found != nullptr) {
     return *found;
   }
+  if (children.size() == children.capacity() && children.size() >= kCloseGrowth) {
+    children.reserve(children.size() + children.size() / 4);
+  }
   auto child = std::allocate_shared<OPNode>(SlabAllocator<OPNode>(), weak_from_this(), child_name);
-  child->position_ = static_cast<uint32_t>(children.size());
+  child->position_ = static_cast<uint32_t>(children.size()) & kPositionBits;
   children.push_back(std::move(child));
   if (index_ == nullptr && children.size() >= ChildIndex::kFewestChildren) {
     index_ = std::make_unique<ChildIndex>();
     for (uint32_t i = 0; i < children.size(); ++i) {
       for (size_t bit = 0; bit < index_->marked.size(); ++bit) {
         if ((children[i]->marks_ >> bit & 1) != 0) {
-          index_->marked[bit].push_back(i);
+          index_->marked[bit].Add(i);
         }
       }
     }

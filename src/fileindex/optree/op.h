@@ -81,14 +81,18 @@ class VEXLO_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
  private:
   friend class OPTree;
 
+  static constexpr uint32_t kPositionBits = (uint32_t{1} << 29) - 1;
+
   // `hash` is the name's NameHash(). Null when there is none.
   OPNode* FindChild(std::string_view child_name, uint64_t hash);
   OPNode& FindOrAddChild(std::string_view child_name, uint64_t hash);
 
   std::unique_ptr<ChildIndex> index_;  // Of a node with many children; null otherwise.
-  uint32_t position_ = 0;              // In the parent's `children`, as GetChild() put it there.
-  uint32_t settled_ops_ = 0;           // That many at the front of `ops` concern no rule any more.
-  uint8_t marks_ = 0;                  // Bits of OPTree::Mark.
+  // In the parent's `children`, as GetChild() put it there. One that does not fit is a wrong one,
+  // which callers reckon with.
+  uint32_t position_ : 29 = 0;
+  uint32_t marks_ : 3 = 0;    // Bits of OPTree::Mark.
+  uint32_t settled_ops_ = 0;  // That many at the front of `ops` concern no rule any more.
 };
 
 // "[02] /volume1/s/a", "[05] OLD -> NEW" for a rename, with ", data=JSON" for a folder update.

@@ -120,6 +120,7 @@ void OPTree::BuildTree() {
     ReadQueue();
   }
   literal_ = true;  // Whatever comes after the file.
+  ops.shrink_to_fit();
   folders_ = nullptr;
   reported_lines_ = 0;
   unparsable_lines_.clear();
@@ -564,7 +565,9 @@ bool OPTree::TradePlaces(OPNode& source, OPNode& target) {
   folders_->Forget();
   source.name.swap(target.name);
   source.parent.swap(target.parent);
-  std::swap(source.position_, target.position_);
+  const uint32_t position = source.position_;
+  source.position_ = target.position_;
+  target.position_ = position;
   const auto marks = static_cast<uint8_t>(source.marks_ | target.marks_);
   source.marks_ = 0;
   target.marks_ = 0;
@@ -656,7 +659,7 @@ void OPTree::SetMarks(OPNode& node, uint8_t marks) {
     if (marks == 0) {
       return;
     }
-    at->marks_ |= marks;
+    at->marks_ = static_cast<uint8_t>(at->marks_ | marks);
     std::shared_ptr<OPNode> above = at->parent.lock();
     if (above == nullptr) {
       return;
@@ -672,7 +675,7 @@ void OPTree::SetMarks(OPNode& node, uint8_t marks) {
       }
       for (size_t bit = 0; bit < above->index_->marked.size(); ++bit) {
         if ((marks >> bit & 1) != 0) {
-          above->index_->marked[bit].push_back(static_cast<uint32_t>(position));
+          above->index_->marked[bit].Add(position);
         }
       }
     }
@@ -685,7 +688,7 @@ template <typename Visit>
 void OPTree::TakeMarkedChildren(OPNode& node, Mark mark, Visit visit) {
   const auto take = [&](OPNode& child) {
     if ((child.marks_ & mark) != 0) {
-      child.marks_ &= static_cast<uint8_t>(~mark);
+      child.marks_ = static_cast<uint8_t>(child.marks_ & ~mark);
       visit(child);
     }
   };
@@ -696,11 +699,11 @@ void OPTree::TakeMarkedChildren(OPNode& node, Mark mark, Visit visit) {
     return;
   }
   const auto bit = static_cast<size_t>(std::countr_zero(static_cast<unsigned>(mark)));
-  for (const uint32_t position : std::exchange(node.index_->marked[bit], {})) {
+  node.index_->marked[bit].TakeAll([&](size_t position) {
     if (position < node.children.size()) {
       take(*node.children[position]);
     }
-  }
+  });
 }
 
 std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {

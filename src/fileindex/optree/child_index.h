@@ -7,11 +7,13 @@
 #include <bit>
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <string_view>
 #include <utility>
 #include <vector>
 
 #include "fileindex/optree/name_hash.h"
+#include "fileindex/optree/op.h"
 
 namespace vexlo::fileindex {
 
@@ -47,24 +49,37 @@ class MarkedChildren {
 };
 
 // Names of children to their positions: open addressing over 4-byte slots that hold a position and,
-// in the bits that are left, a piece of the hash. The names stay with the children;
-// `name_at(position)` gives them. The list of children is public, so the index follows it: what was
-// appended behind its back is taken in at the next look-up, and when something was removed it
-// starts over.
+// in the bits that are left, a piece of the hash. The names stay with the children.
+// Their list is public, so the index follows it: what was appended behind its back is taken in at
+// the next look-up, and when something was removed it starts over.
 class ChildIndex {
  public:
   // Below this many children a linear search is as fast, and most folders need no index.
   static constexpr size_t kFewestChildren = 8;
 
-  // The position of the first child of that name, whose NameHash() is `hash`, or `count`, the
-  // number of children.
-  template <typename NameAt>
-  size_t Find(size_t count, NameAt name_at, std::string_view name, uint64_t hash) {
-    if (indexed_ != count) {
-      Follow(count, name_at);
+  using Children = std::vector<std::shared_ptr<OPNode>>;
+
+  // The first child of that name, whose NameHash() is `hash`, or null.
+  OPNode* Find(const Children& children, std::string_view name, uint64_t hash) {
+    if (indexed_ != children.size()) {
+      Follow(children);
     }
-    const uint32_t slot = Probe(name_at, name, hash);
-    return slot == 0 ? count : Position(slot);
+    const uint32_t slot = Probe(children, name, hash);
+    return slot == 0 ? nullptr : children[Position(slot)].get();
+  }
+
+  // Takes in the child behind the `count` that there were, of which none has that name. Without
+  // this the next look-up does so, with a hash and a probe of its own.
+  void Append(size_t count, uint64_t hash) {
+    if (indexed_ == count && WantedSlots(count + 1) <= slots_.size()) {
+      const size_t mask = slots_.size() - 1;
+      size_t at = hash & mask;
+      while (slots_[at] != 0) {
+        at = (at + 1) & mask;
+      }
+      slots_[at] = Entry(hash, count);
+      indexed_ = count + 1;
+    }
   }
 
   // A look-up in steps, for those who make several at once and would wait for memory at each:
@@ -93,32 +108,40 @@ class ChildIndex {
   uint32_t Tag(uint64_t hash) const { return static_cast<uint32_t>(hash >> 32) >> tag_shift_; }
   size_t Position(uint32_t slot) const { return (slot & ((uint32_t{1} << tag_shift_) - 1)) - 1; }
 
+  uint32_t Entry(uint64_t hash, size_t position) const {
+    return Tag(hash) << tag_shift_ | static_cast<uint32_t>(position + 1);
+  }
+  static size_t WantedSlots(size_t count) { return std::bit_ceil(count * 4 / 3 + 1); }
+
   // The slot of that name, or the empty one where it belongs.
-  template <typename NameAt>
-  uint32_t& Probe(NameAt name_at, std::string_view name, uint64_t hash) {
+  uint32_t& Probe(const Children& children, std::string_view name, uint64_t hash) {
     const size_t mask = slots_.size() - 1;
     for (size_t at = hash & mask;; at = (at + 1) & mask) {
       uint32_t& slot = slots_[at];
-      if (slot == 0 || (slot >> tag_shift_ == Tag(hash) && name_at(Position(slot)) == name)) {
+      if (slot == 0 ||
+          (slot >> tag_shift_ == Tag(hash) && children[Position(slot)]->name == name)) {
         return slot;
       }
     }
   }
 
-  template <typename NameAt>
-  void Follow(size_t count, NameAt name_at) {
-    const size_t wanted_slots = std::bit_ceil(count * 4 / 3 + 1);
-    if (count < indexed_ || wanted_slots > slots_.size()) {
+  void Follow(const Children& children) {
+    constexpr size_t kAhead = 8;  // So many names are fetched before they are needed.
+    const size_t wanted_slots = WantedSlots(children.size());
+    if (children.size() < indexed_ || wanted_slots > slots_.size()) {
       slots_.assign(wanted_slots, 0);
       tag_shift_ = static_cast<unsigned>(std::countr_zero(wanted_slots));
       indexed_ = 0;
     }
-    for (; indexed_ < count; ++indexed_) {
-      const std::string_view name = name_at(indexed_);
+    for (; indexed_ < children.size(); ++indexed_) {
+      if (indexed_ + kAhead < children.size()) {
+        __builtin_prefetch(&children[indexed_ + kAhead]->name);
+      }
+      const std::string_view name = children[indexed_]->name;
       const uint64_t hash = NameHash(name);
-      uint32_t& slot = Probe(name_at, name, hash);
+      uint32_t& slot = Probe(children, name, hash);
       if (slot == 0) {  // Of equal names the first wins.
-        slot = Tag(hash) << tag_shift_ | static_cast<uint32_t>(indexed_ + 1);
+        slot = Entry(hash, indexed_);
       }
     }
   }

@@ -28,6 +28,9 @@ class VEXLO_EXPORT OPTree {
  public:
   // Reads the whole file; see BuildTree() for what it throws.
   explicit OPTree(const std::string& queue_path);
+  ~OPTree();
+  OPTree(const OPTree&) = default;
+  OPTree& operator=(const OPTree&) = default;
 
   // How far BuildTree() has come, in bytes of the file and in lines.
   struct Progress {

@@ -7,13 +7,11 @@
 #include <bit>
 #include <cstddef>
 #include <cstdint>
-#include <memory>
 #include <string_view>
 #include <utility>
 #include <vector>
 
 #include "fileindex/optree/name_hash.h"
-#include "fileindex/optree/op.h"
 
 namespace vexlo::fileindex {
 
@@ -57,15 +55,15 @@ class ChildIndex {
   // Below this many children a linear search is as fast, and most folders need no index.
   static constexpr size_t kFewestChildren = 8;
 
-  using Children = std::vector<std::shared_ptr<OPNode>>;
-
-  // The first child of that name, whose NameHash() is `hash`, or null.
-  OPNode* Find(const Children& children, std::string_view name, uint64_t hash) {
+  // The first child of that name, whose NameHash() is `hash`, or null. `children` is a list of
+  // pointers to what has a `name`.
+  template <typename Children>
+  auto* Find(const Children& children, std::string_view name, uint64_t hash) {
     if (indexed_ != children.size()) {
       Follow(children);
     }
     const uint32_t slot = Probe(children, name, hash);
-    return slot == 0 ? nullptr : children[Position(slot)].get();
+    return slot == 0 ? nullptr : &*children[Position(slot)];
   }
 
   // Takes in the child behind the `count` that there were, of which none has that name. Without
@@ -114,6 +112,7 @@ class ChildIndex {
   static size_t WantedSlots(size_t count) { return std::bit_ceil(count * 4 / 3 + 1); }
 
   // The slot of that name, or the empty one where it belongs.
+  template <typename Children>
   uint32_t& Probe(const Children& children, std::string_view name, uint64_t hash) {
     const size_t mask = slots_.size() - 1;
     for (size_t at = hash & mask;; at = (at + 1) & mask) {
@@ -125,6 +124,7 @@ class ChildIndex {
     }
   }
 
+  template <typename Children>
   void Follow(const Children& children) {
     constexpr size_t kAhead = 8;  // So many names are fetched before they are needed.
     const size_t wanted_slots = WantedSlots(children.size());

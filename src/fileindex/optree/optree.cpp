@@ -436,7 +436,7 @@ void OPTree::HandleNew(Handler handler, OPNode& node, const Json::Value& data) {
   }
   if (survives) {
     const std::shared_ptr<OP> op = NewOP(node, kKindOf[static_cast<size_t>(handler)]);
-    if (!data.isNull()) {
+    if (handler == Handler::kUpdateDirectory) {  // No other carries a payload.
       op->data = data;
     }
     AddTo(node, op);

@@ -8,8 +8,9 @@ namespace vexlo::fileindex {
 namespace {
 
 // Slabs are aligned to this, so that an object's address tells its slab. Somewhat smaller, so that
-// the heap's own words fit between two of them.
-constexpr size_t kAlignment = size_t{64} * 1024;
+// the heap's own words fit between two of them. Small enough that the heap does not map each on its
+// own, with as much again for the alignment.
+constexpr size_t kAlignment = size_t{32} * 1024;
 constexpr size_t kSlabBytes = kAlignment - 64;
 // Stands for the thread that fills the slab, which so need not count what it takes one by one.
 constexpr uint32_t kOpen = uint32_t{1} << 31;

@@ -13,7 +13,7 @@ namespace vexlo::fileindex {
 void* TakeFromSlab(size_t bytes);
 
 // Gives it back, on any thread. A slab goes back to the heap as a whole, when nothing in it is used
-// any more: so one object that outlives its tree keeps 64 KiB.
+// any more: so one object that outlives its tree keeps 32 KiB.
 void GiveToSlab(void* memory) noexcept;
 
 // The allocator over these, for std::allocate_shared.

@@ -74,8 +74,8 @@ TEST(Slab, GivesEachPieceItsOwnMemoryAndAllOfItBack) {
   std::thread half([&] { give(0, kPieces / 2); });
   give(kPieces / 2, kPieces);
   half.join();
-  pieces = {};
-  order = {};
+  pieces = std::vector<Piece>();
+  order = std::vector<size_t>();
   EXPECT_LT(HeapInUse(), before + 64 * 1024);
 }
 

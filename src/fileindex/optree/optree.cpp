@@ -227,6 +227,11 @@ void OPTree::Resolve(std::vector<AheadLine>& lines) {
       line.folder->index_->Prefetch(line.hash);
     }
   }
+  ResolveChildren(lines);
+}
+
+// The steps behind the folders.
+void OPTree::ResolveChildren(std::vector<AheadLine>& lines) {
   for (AheadLine& line : lines) {
     if (line.folder != nullptr && line.folder->index_ != nullptr) {
       line.guess = line.folder->index_->Guess(line.hash);

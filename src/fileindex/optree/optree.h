@@ -107,6 +107,7 @@ class VEXLO_EXPORT OPTree {
   void ReadQueue();
   void ReadAhead(LineReader& reader, std::vector<AheadLine>& lines);
   void Resolve(std::vector<AheadLine>& lines);
+  static void ResolveChildren(std::vector<AheadLine>& lines);
   OPNode* FindFolder(std::string_view path, uint64_t hash);
   void InsertLine(LineParser& parser, const AheadLine& line, bool reported);
   void Insert(const EventView& event, OPNode& node);

@@ -22,7 +22,7 @@ struct SlabAllocator {
   using value_type = T;
 
   SlabAllocator() = default;
-  // NOLINTNEXTLINE(google-explicit-constructor): as allocators convert.
+  // NOLINTBEGIN(google-explicit-constructor,readability-identifier-naming): as the library asks.
   template <typename Other>
   SlabAllocator(const SlabAllocator<Other>& /*other*/) {}
 
@@ -34,6 +34,7 @@ struct SlabAllocator {
     return static_cast<T*>(TakeFromSlab(sizeof(T)));
   }
   void deallocate(T* memory, size_t /*count*/) noexcept { GiveToSlab(memory); }
+  // NOLINTEND(google-explicit-constructor,readability-identifier-naming)
 
   template <typename Other>
   bool operator==(const SlabAllocator<Other>& /*other*/) const {

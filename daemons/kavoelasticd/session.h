@@ -33,6 +33,9 @@ std::string LanguageOf(const Json::Value& settings);
 // when it was learnt, so an index of another version is made anew.
 std::string FormatVersion();
 
+// The number of a text of its own: of the document, then the field, which is below kBodyFields.
+int64_t BodyId(int64_t document, uint32_t field);
+
 struct StoredDocument {
   int64_t id = 0;
   std::string path;

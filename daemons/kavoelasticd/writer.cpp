@@ -9,6 +9,7 @@
 #include "daemons/kavoelasticd/failure.h"
 #include "daemons/kavoelasticd/fields.h"
 #include "daemons/kavoelasticd/fold.h"
+#include "daemons/kavoelasticd/pack.h"
 
 namespace vexlo::elasticd {
 namespace {
@@ -388,17 +389,16 @@ void Writer::WriteBodies(Change& change) {
   };
   for (const Item& item : change.before.record.Items()) {
     if (is_body(&item) && !is_body(change.after.record.Find(item.field))) {
-      Sql(session_.db, "DELETE FROM bodies WHERE id = ? AND field = ?")
-          .Int(change.after.id)
-          .Int(item.field)
+      Sql(session_.db, "DELETE FROM bodies WHERE id = ?")
+          .Int(BodyId(change.after.id, item.field))
           .Run();
     }
   }
   for (const uint32_t field : change.new_bodies) {
-    Sql(session_.db, "INSERT OR REPLACE INTO bodies VALUES(?,?,?)")
-        .Int(change.after.id)
-        .Int(field)
-        .Blob(change.after.record.Find(field)->bytes)
+    const std::string packed = Pack(change.after.record.Find(field)->bytes);
+    Sql(session_.db, "INSERT OR REPLACE INTO bodies VALUES(?,?)")
+        .Int(BodyId(change.after.id, field))
+        .Blob(packed)
         .Run();
   }
 }

@@ -179,17 +179,17 @@ TEST(Crash, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   // Stands for whatever one statement may be refused for.
   sqlite3* db = nullptr;
   ASSERT_EQ(sqlite3_open((engine.Folder() / "i/index.db").c_str(), &db), SQLITE_OK);
-  ASSERT_EQ(sqlite3_exec(db,
-                         "CREATE TRIGGER refuse BEFORE INSERT ON bodies WHEN instr(new.text, 'bad')"
-                         " BEGIN SELECT RAISE(ABORT, 'refused'); END",
-                         nullptr, nullptr, nullptr),
-            SQLITE_OK);
+  ASSERT_EQ(
+      sqlite3_exec(db,
+                   "CREATE TRIGGER refuse BEFORE INSERT ON records WHEN instr(new.record, 'bad')"
+                   " BEGIN SELECT RAISE(ABORT, 'refused'); END",
+                   nullptr, nullptr, nullptr),
+      SQLITE_OK);
   sqlite3_close(db);
   engine.Do("index_resume");
   const auto document = [](const std::string& path, const std::string& text) {
-    return WriteRequest(
-        "document_upsert_by_id", path,
-        MakeDocument(path, R"({"KAVOMDTextContent":")" + text + std::string(500, 'x') + "\"}"));
+    return WriteRequest("document_upsert_by_id", path,
+                        MakeDocument(path, R"({"KAVOMDTextContent":")" + text + "\"}"));
   };
   // In a compound it fails alone, and leaves no part of it behind.
   Json::Value request;

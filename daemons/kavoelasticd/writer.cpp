@@ -16,6 +16,9 @@ namespace {
 
 constexpr size_t kDeleteSlice = 10'000;
 
+// Texts that wait for their indexes; as much again is in the indexes' own memory.
+constexpr size_t kBatchBytes = size_t{4} << 20;
+
 enum Table : unsigned {
   kTexts = 1,
   kWordTable = 2,
@@ -24,7 +27,6 @@ enum Table : unsigned {
   kDocsTable = 16,  // Its columns beside the path.
 };
 
-using Row = std::vector<std::string>;
 using ExactRows = std::vector<std::pair<uint32_t, std::string>>;  // In order, each once.
 
 unsigned TablesOf(const Field& field) {
@@ -58,8 +60,8 @@ void Append(std::string* column, std::string text) {
 }
 
 // What the three text tables hold of a document; bodies must be known.
-Row RowOf(Session& session, const StoredDocument& document, unsigned table, size_t columns) {
-  Row row(columns);
+TextRow RowOf(Session& session, const StoredDocument& document, unsigned table, size_t columns) {
+  TextRow row(columns);
   for (const Item& item : document.record.Items()) {
     const Field& field = session.FieldOf(item.field);
     if ((TablesOf(field) & table) == 0) {
@@ -132,21 +134,16 @@ void Bind(Sql& sql, const std::optional<T>& value) {
   }
 }
 
-std::string TextSql(const std::string& table, const std::string& columns, size_t count,
-                    bool forget) {
-  std::string names;
-  std::string marks;
-  for (size_t i = 0; i < count; ++i) {
-    names += columns.size() == 1 ? "," + columns + std::to_string(i) : "";
-    marks += ",?";
-  }
-  names = columns.size() == 1 ? names : "," + columns;
-  return forget ? "INSERT INTO " + table + "(" + table + ",rowid" + names + ") VALUES('delete',?" +
-                      marks + ")"
-                : "INSERT INTO " + table + "(rowid" + names + ") VALUES(?" + marks + ")";
-}
-
 }  // namespace
+
+// A text index, and what of TablesOf() a field is in it by.
+struct Writer::TextTable {
+  TextBatch::TextTable index;
+  unsigned fields;
+};
+
+constexpr Writer::TextTable Writer::kTextTables[] = {
+    {TextBatch::kTexts, kTexts}, {TextBatch::kWords, kWordTable}, {TextBatch::kGrams, kGramTable}};
 
 // `before` and `after` are the same document; a record without a path is none.
 struct Writer::Change {
@@ -155,18 +152,11 @@ struct Writer::Change {
   std::vector<uint32_t> new_bodies = {};
 };
 
-Writer::Writer(Session& session)
-    : session_(session), text_tables_([&session] {
-        const auto table = [](unsigned which, const char* name, const char* columns, size_t count) {
-          return TextTable{which, count, TextSql(name, columns, count, /*forget=*/false),
-                           TextSql(name, columns, count, /*forget=*/true)};
-        };
-        const size_t texts = std::max<size_t>(1, session.schema.TextColumns().size());
-        const size_t grams = std::max<size_t>(1, session.schema.GramColumns().size());
-        return std::array<TextTable, 3>{table(kTexts, "texts", "t", texts),
-                                        table(kWordTable, "words", "name,rest,other", 3),
-                                        table(kGramTable, "grams", "g", grams)};
-      }()) {}
+Writer::Writer(Session& session) : session_(session), texts_(session) {
+  session_.SetBeforeTexts([this] { WriteTexts(); });
+}
+
+Writer::~Writer() { session_.SetBeforeTexts({}); }
 
 void Writer::Begin() {
   if (!session_.db.InTransaction()) {
@@ -177,6 +167,8 @@ void Writer::Begin() {
 void Writer::Lose(const std::string& reason) {
   lost_ = reason;
   changes_ = 0;
+  in_list_ = false;
+  texts_.Clear();
   session_.ForgetFields();
   if (session_.db.InTransaction()) {
     session_.db.Run("ROLLBACK");
@@ -185,9 +177,21 @@ void Writer::Lose(const std::string& reason) {
 
 void Writer::CommitChanges() {
   if (session_.db.InTransaction()) {
+    WriteTexts();
     session_.db.Run("COMMIT");
   }
+  texts_.Clear();
   changes_ = 0;
+}
+
+// A part of what waits cannot be taken back alone.
+void Writer::WriteTexts() {
+  try {
+    texts_.Write();
+  } catch (const std::exception& error) {
+    Lose(error.what());
+    throw;
+  }
 }
 
 void Writer::Commit() {
@@ -368,19 +372,19 @@ void Writer::FillBodies(int64_t id, StoredDocument* document, unsigned table) {
   }
 }
 
-void Writer::Reindex(Change& change, StoredDocument& document, const TextTable& table,
-                     bool before) {
-  FillBodies(change.after.id, &document, table.table);
-  const Row row = RowOf(session_, document, table.table, table.columns);
-  if (std::all_of(row.begin(), row.end(), [](const std::string& text) { return text.empty(); })) {
-    return;
+void Writer::Reindex(Change& change, const TextTable& table) {
+  const auto row_of = [&](StoredDocument& document) {
+    FillBodies(change.after.id, &document, table.fields);
+    TextRow row = RowOf(session_, document, table.fields, texts_.ColumnsOf(table.index));
+    const bool empty =
+        std::all_of(row.begin(), row.end(), [](const std::string& text) { return text.empty(); });
+    return empty ? TextRow() : row;
+  };
+  TextRow before;
+  if (!texts_.Holds(table.index, change.after.id)) {
+    before = row_of(change.before);
   }
-  Sql sql(session_.db, before ? table.remove : table.insert);
-  sql.Int(change.after.id);
-  for (const std::string& text : row) {
-    sql.Text(text);
-  }
-  sql.Run();
+  texts_.Put(table.index, change.after.id, std::move(before), row_of(change.after));
 }
 
 void Writer::WriteBodies(Change& change) {
@@ -489,10 +493,9 @@ void Writer::Apply(Change& change) {
   if (!exists) {
     WriteRows(change, filters_differ);
   }
-  for (const TextTable& table : text_tables_) {
-    if ((tables & table.table) != 0) {
-      Reindex(change, change.before, table, /*before=*/true);
-      Reindex(change, change.after, table, /*before=*/false);
+  for (const TextTable& table : kTextTables) {
+    if ((tables & table.fields) != 0) {
+      Reindex(change, table);
     }
   }
   if ((tables & kExactTable) != 0) {
@@ -503,45 +506,60 @@ void Writer::Apply(Change& change) {
   }
   WriteBodies(change);
   ++changes_;
+  if (!in_list_ && texts_.Bytes() >= kBatchBytes) {
+    WriteTexts();
+  }
 }
 
 void Writer::List(size_t count, const std::function<void(size_t)>& item,
                   const std::function<void(size_t, const Failure&)>& refused) {
   Begin();
   const size_t changes = changes_;
-  session_.db.Run("SAVEPOINT list");
+  const size_t mark = SetSavepoint("list");
+  in_list_ = true;
   try {
     for (size_t i = 0; i < count; ++i) {
       item(i);
     }
   } catch (const SqlError& error) {
-    if (!error.OfStatement() || !session_.db.InTransaction()) {
-      throw;
-    }
-    session_.db.Run("ROLLBACK TO list");
-    session_.ForgetFields();
+    UndoTo("list", mark, error);
     changes_ = changes;
     ListOneByOne(count, item, refused);
   }
   session_.db.Run("RELEASE list");
+  in_list_ = false;
+  texts_.DropMarks();
+  if (texts_.Bytes() >= kBatchBytes) {
+    WriteTexts();
+  }
 }
 
 void Writer::ListOneByOne(size_t count, const std::function<void(size_t)>& item,
                           const std::function<void(size_t, const Failure&)>& refused) {
   for (size_t i = 0; i < count; ++i) {
-    session_.db.Run("SAVEPOINT item");
+    const size_t mark = SetSavepoint("item");
     try {
       item(i);
     } catch (const SqlError& error) {
-      if (!error.OfStatement() || !session_.db.InTransaction()) {
-        throw;
-      }
-      session_.db.Run("ROLLBACK TO item");
-      session_.ForgetFields();
+      UndoTo("item", mark, error);
       refused(i, error);
     }
     session_.db.Run("RELEASE item");
   }
+}
+
+size_t Writer::SetSavepoint(const std::string& name) {
+  session_.db.Run("SAVEPOINT " + name);
+  return texts_.SetMark();
+}
+
+// Throws the error on when it is not about one statement, or the list's texts are in the database.
+void Writer::UndoTo(const std::string& name, size_t mark, const SqlError& error) {
+  if (!error.OfStatement() || !session_.db.InTransaction() || !texts_.Undo(mark)) {
+    throw SqlError(error);
+  }
+  session_.db.Run("ROLLBACK TO " + name);
+  session_.ForgetFields();
 }
 
 }  // namespace vexlo::elasticd

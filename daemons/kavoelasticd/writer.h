@@ -4,7 +4,6 @@
 
 #include <json/value.h>
 
-#include <array>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
@@ -12,17 +11,22 @@
 
 #include "daemons/kavoelasticd/query.h"
 #include "daemons/kavoelasticd/session.h"
+#include "daemons/kavoelasticd/text_batch.h"
 
 namespace vexlo::elasticd {
 
 // - Changes gather in one transaction until Commit(). What was committed is on disk: the log is
 //   synced before Commit() returns. What was not is gone after a crash.
+// - The text indexes get their part late (TextBatch); whoever asks them gets it written before.
 // - A change that a rule refuses changes nothing. One that the database refuses (a full disk) rolls
 //   back everything since the last commit, and the next Commit() fails with kLost, once.
 class Writer {
  public:
   // The session may write. `session` outlives the writer.
   explicit Writer(Session& session);
+  ~Writer();
+  Writer(const Writer&) = delete;
+  Writer& operator=(const Writer&) = delete;
 
   // Each throws Failure: kBadDocument, kDocumentMissing, or what the database answers.
   void Upsert(const std::string& doc_id, const Json::Value& data);
@@ -56,14 +60,13 @@ class Writer {
                     const std::function<void(size_t, const Failure&)>& refused);
   void RemoveDocument(StoredDocument document);
   void Apply(Change& change);
-  struct TextTable {
-    unsigned table;
-    size_t columns;
-    std::string insert;
-    std::string remove;
-  };
+  struct TextTable;
+  static const TextTable kTextTables[TextBatch::kTables];
   void FillBodies(int64_t id, StoredDocument* document, unsigned table);
-  void Reindex(Change& change, StoredDocument& document, const TextTable& table, bool before);
+  void Reindex(Change& change, const TextTable& table);
+  void WriteTexts();
+  size_t SetSavepoint(const std::string& name);
+  void UndoTo(const std::string& name, size_t mark, const SqlError& error);
   unsigned ChangedTables(Change& change);
   bool Same(Change& change, const Item& before, const Item& after);
   void WriteBodies(Change& change);
@@ -73,7 +76,8 @@ class Writer {
   void CheckRequired(const Json::Value& data, bool whole) const;
 
   Session& session_;
-  const std::array<TextTable, 3> text_tables_;
+  TextBatch texts_;
+  bool in_list_ = false;
   size_t changes_ = 0;
   std::string lost_;  // Why changes were rolled back, until it is told.
 };

@@ -73,7 +73,14 @@ void Session::MakeTables(const IndexInfo& info) {
       // The default of 1 MB writes many small segments, which are then merged again and again.
       "INSERT INTO texts(texts, rank) VALUES('hashsize', 16777216);"
       "INSERT INTO words(words, rank) VALUES('hashsize', 8388608);"
-      "INSERT INTO grams(grams, rank) VALUES('hashsize', 8388608);");
+      "INSERT INTO grams(grams, rank) VALUES('hashsize', 8388608);"
+      // A page of an index fills a page of the file, and a commit merges less; Store::Rest() does.
+      "INSERT INTO texts(texts, rank) VALUES('pgsz', 8000);"
+      "INSERT INTO words(words, rank) VALUES('pgsz', 8000);"
+      "INSERT INTO grams(grams, rank) VALUES('pgsz', 8000);"
+      "INSERT INTO texts(texts, rank) VALUES('automerge', 8);"
+      "INSERT INTO words(words, rank) VALUES('automerge', 8);"
+      "INSERT INTO grams(grams, rank) VALUES('automerge', 8);");
   const std::pair<const char*, std::string> rows[] = {
       {"version", FormatVersion()},
       {"token", info.token},

@@ -16,6 +16,8 @@ namespace {
 
 constexpr size_t kCommitAfter = 20'000;
 constexpr size_t kIdleReaders = 8;
+// Of a text index, 8 KB each: some hundredths of a second.
+constexpr int64_t kMergedPages = 500;
 
 [[noreturn]] void Damaged(const std::string& what) { throw Failure(Code::kIndexDamaged, what); }
 
@@ -125,6 +127,7 @@ Store::~Store() {
 void Store::Write(const std::function<void(Writer&, Session&)>& change) {
   const std::lock_guard lock(write_mutex_);
   uncommitted_ = true;
+  at_rest_ = false;
   last_change_ = std::chrono::steady_clock::now();
   try {
     change(*writer_, *write_session_);
@@ -215,14 +218,45 @@ void Store::CommitQuietly() {
   }
 }
 
-void Store::CommitIdle(std::chrono::steady_clock::duration idle) {
-  if (!uncommitted_) {
-    return;
+bool Store::CommitIdle(std::chrono::steady_clock::duration idle) {
+  if (at_rest_) {
+    return false;
   }
   const std::unique_lock lock(write_mutex_, std::try_to_lock);
-  if (lock.owns_lock() && std::chrono::steady_clock::now() - last_change_ >= idle) {
+  if (!lock.owns_lock() || std::chrono::steady_clock::now() - last_change_ < idle) {
+    return true;
+  }
+  if (uncommitted_) {
     CommitQuietly();
   }
+  try {
+    at_rest_ = !Rest();
+  } catch (const SqlError& error) {
+    LogLine(VEXLO_SOURCE, __LINE__,
+            "tidying failed, index=" + folder_ + ", reason=" + error.what());
+    at_rest_ = true;
+  }
+  return !at_rest_;
+}
+
+// The write lock is held, and nothing is uncommitted. In steps, as whoever writes waits for one.
+// Whether there are more.
+bool Store::Rest() {
+  Connection& db = write_session_->db;
+  for (const char* const table : {"texts", "words", "grams"}) {
+    const int64_t before = db.TotalChanges();
+    const std::string name = table;
+    Sql(db, "INSERT INTO " + name + "(" + name + ", rank) VALUES('merge', ?)")
+        .Int(kMergedPages)
+        .Run();
+    // One is the command itself.
+    if (db.TotalChanges() - before > 1) {
+      return true;
+    }
+  }
+  // Readers may keep it from it; the next change brings another try.
+  Sql(db, "PRAGMA wal_checkpoint(TRUNCATE)").Run();
+  return false;
 }
 
 void Store::Close() {

@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <chrono>
+#include <filesystem>
 #include <string>
 #include <vector>
 
@@ -323,6 +325,35 @@ TEST(Engine, MovesToAnotherDisk) {
   engine.Restart();
   EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
   EXPECT_EQ(engine.Do("index_delete"), "ok");
+}
+
+TEST(Engine, AtRestTheLogIsEmptyAndNothingIsLeftToDo) {
+  using namespace std::chrono_literals;
+  EngineFixture engine;
+  const std::string log = engine.Folder() / "i/index.db-wal";
+  EXPECT_FALSE(engine.Engine().CommitIdle(0s));
+  // More segments than a text index keeps, each of a commit.
+  for (int i = 0; i < 30; ++i) {
+    engine.Add("/v/" + std::to_string(i),
+               R"({"KAVOMDTextContent":"word )" + std::to_string(i) + "\"}");
+    EXPECT_EQ(engine.Do("commit"), "ok");
+  }
+  engine.Add("/v/last");
+  // Not before it has been quiet for so long.
+  EXPECT_TRUE(engine.Engine().CommitIdle(1h));
+  EXPECT_GT(std::filesystem::file_size(log), 0U);
+  engine.Engine().AwaitChange({});
+  int steps = 1;
+  while (engine.Engine().CommitIdle(0s)) {
+    ++steps;
+    ASSERT_LT(steps, 100);
+  }
+  EXPECT_GT(steps, 1);
+  EXPECT_EQ(std::filesystem::file_size(log), 0U);
+  EXPECT_EQ(engine.Query(R"({"term":{"KAVOMDTextContent":"word"}})", R"({"size":0})"), "");
+  EXPECT_EQ(engine.Documents(R"({"term":{"KAVOMDTextContent":"word"}})", R"({"size":100})").size(),
+            30U);
+  EXPECT_EQ(engine.Search(R"({"name":"last"})"), "/v/last");
 }
 
 }  // namespace

@@ -389,14 +389,15 @@ class Same {
   void Insert(const Document& document) {
     using vexlo::elasticd::Sql;
     vexlo::elasticd::Connection& db = session_.db;
-    Sql(db, "INSERT INTO docs(path, ext, size, mtime) VALUES(?,?,?,?)")
+    Sql(db, "INSERT INTO records(record) VALUES(?)").Blob(document.record).Run();
+    const int64_t id = db.LastInsertId();
+    Sql(db, "INSERT INTO docs(id, path, ext, size, mtime) VALUES(?,?,?,?,?)")
+        .Int(id)
         .Blob(document.path)
         .Blob(*document.docs.extension)
         .Int(*document.docs.size)
         .Int(*document.docs.modified)
         .Run();
-    const int64_t id = db.LastInsertId();
-    Sql(db, "INSERT INTO records VALUES(?,?)").Int(id).Blob(document.record).Run();
     for (const auto& [field, value] : document.exact) {
       Sql(db, "INSERT INTO exact VALUES(?,?,?)").Int(field).Blob(value).Int(id).Run();
     }

@@ -60,6 +60,8 @@ void Session::MakeTables(const IndexInfo& info) {
       "CREATE TABLE fields(id INTEGER PRIMARY KEY, name BLOB NOT NULL UNIQUE);"
       "CREATE TABLE docs(id INTEGER PRIMARY KEY, path BLOB NOT NULL UNIQUE, ext BLOB,"
       " size INTEGER, mtime INTEGER);"
+      // Documents that the text indexes are still to forget, from records and bodies.
+      "CREATE TABLE gone(id INTEGER PRIMARY KEY, path BLOB NOT NULL);"
       "CREATE TABLE records(id INTEGER PRIMARY KEY, record BLOB NOT NULL);"
       // Under their own number, as a page of any other table is left half empty by texts.
       "CREATE TABLE bodies(id INTEGER PRIMARY KEY, text BLOB NOT NULL);"

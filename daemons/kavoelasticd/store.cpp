@@ -78,8 +78,8 @@ void Store::CheckDatabase(Connection& db, const std::string& token) {
   }
   Sql tables(db,
              "SELECT count(*) FROM sqlite_master WHERE name IN"
-             "('meta','fields','docs','records','bodies','exact','texts','words','grams')");
-  if (!tables.Row() || tables.IntAt(0) != 9) {
+             "('meta','fields','docs','gone','records','bodies','exact','texts','words','grams')");
+  if (!tables.Row() || tables.IntAt(0) != 10) {
     Damaged("the database in " + folder_ + " is not an index");
   }
   if (Meta(db, "version") != FormatVersion()) {
@@ -231,7 +231,7 @@ bool Store::CommitIdle(std::chrono::steady_clock::duration idle) {
   }
   try {
     at_rest_ = !Rest();
-  } catch (const SqlError& error) {
+  } catch (const std::exception& error) {
     LogLine(VEXLO_SOURCE, __LINE__,
             "tidying failed, index=" + folder_ + ", reason=" + error.what());
     at_rest_ = true;
@@ -243,6 +243,9 @@ bool Store::CommitIdle(std::chrono::steady_clock::duration idle) {
 // Whether there are more.
 bool Store::Rest() {
   Connection& db = write_session_->db;
+  if (writer_->ForgetGone()) {
+    return true;
+  }
   for (const char* const table : {"texts", "words", "grams"}) {
     const int64_t before = db.TotalChanges();
     const std::string name = table;

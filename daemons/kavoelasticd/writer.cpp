@@ -15,6 +15,10 @@ namespace {
 
 constexpr size_t kDeleteSlice = 10'000;
 
+// Removed documents that the text indexes may still know; more are forgotten at the next commit.
+constexpr int64_t kMostGone = 20'000;
+constexpr int64_t kForgottenAtOnce = 2'000;
+
 // Texts that wait for their indexes; as much again is in the indexes' own memory.
 constexpr size_t kBatchBytes = size_t{4} << 20;
 
@@ -63,6 +67,7 @@ void Writer::Lose(const std::string& reason) {
   lost_ = reason;
   changes_ = 0;
   in_list_ = false;
+  gone_.reset();
   texts_.Clear();
   session_.ForgetFields();
   if (session_.db.InTransaction()) {
@@ -72,6 +77,9 @@ void Writer::Lose(const std::string& reason) {
 
 void Writer::CommitChanges() {
   if (session_.db.InTransaction()) {
+    while (Gone() > kMostGone) {
+      ForgetSome();
+    }
     WriteTexts();
     session_.db.Run("COMMIT");
   }
@@ -188,7 +196,7 @@ size_t Writer::DeleteWhere(const Conditions& conditions) {
   for (;;) {
     // What is deleted is found no more, so every slice begins at the front.
     std::vector<int64_t> ids = Find(session_, conditions, {.after = "", .size = kDeleteSlice});
-    // FTS5 writes out what it has gathered whenever a lower number follows a higher one.
+    // In the order of their rows.
     std::sort(ids.begin(), ids.end());
     for (const int64_t id : ids) {
       if (auto found = session_.Load(id)) {
@@ -203,11 +211,84 @@ size_t Writer::DeleteWhere(const Conditions& conditions) {
   }
 }
 
+// What the text indexes have of it is forgotten later, by ForgetGone(): that takes as long as
+// adding it did.
 void Writer::RemoveDocument(StoredDocument document) {
   Change change;
   change.after.id = document.id;
   change.before = std::move(document);
-  Apply(change);
+  WriteExact(change);
+  Sql(session_.db, "INSERT INTO gone VALUES(?,?)")
+      .Int(change.after.id)
+      .Blob(change.before.path)
+      .Run();
+  Sql(session_.db, "DELETE FROM docs WHERE id = ?").Int(change.after.id).Run();
+  gone_ = gone_ ? std::optional(*gone_ + 1) : std::nullopt;
+  ++changes_;
+}
+
+bool Writer::ForgetGone() {
+  if (Gone() == 0) {
+    return false;
+  }
+  std::string lost = lost_;
+  try {
+    Begin();
+    ForgetSome();
+    session_.db.Run("COMMIT");
+    texts_.Clear();
+  } catch (...) {
+    // No client's change is lost with it.
+    lost_ = std::move(lost);
+    gone_.reset();
+    texts_.Clear();
+    if (session_.db.InTransaction()) {
+      session_.db.Run("ROLLBACK");
+    }
+    throw;
+  }
+  return Gone() > 0;
+}
+
+int64_t Writer::Gone() {
+  if (!gone_) {
+    Sql count(session_.db, "SELECT count(*) FROM gone");
+    count.Row();
+    gone_ = count.IntAt(0);
+  }
+  return *gone_;
+}
+
+void Writer::ForgetSome() {
+  std::vector<StoredDocument> documents;
+  {
+    Sql rows(session_.db,
+             "SELECT g.id, g.path, r.record FROM gone g CROSS JOIN records r ON r.id = g.id"
+             " ORDER BY g.id LIMIT ?");
+    rows.Int(kForgottenAtOnce);
+    while (rows.Row()) {
+      documents.push_back({rows.IntAt(0), rows.StringAt(1), Record::Decode(rows.StringAt(2))});
+    }
+  }
+  if (documents.empty()) {
+    throw Failure(Code::kIndexDamaged, "a removed document has no record");
+  }
+  for (StoredDocument& document : documents) {
+    Change change;
+    change.after.id = document.id;
+    change.before = std::move(document);
+    for (const TextTable& table : kTextTables) {
+      Reindex(change, table);
+    }
+    WriteBodies(change);
+    Sql(session_.db, "DELETE FROM records WHERE id = ?").Int(change.after.id).Run();
+    Sql(session_.db, "DELETE FROM gone WHERE id = ?").Int(change.after.id).Run();
+    if (texts_.Bytes() >= kBatchBytes) {
+      WriteTexts();
+    }
+  }
+  gone_.reset();
+  WriteTexts();
 }
 
 bool Writer::Same(Change& change, const Item& before, const Item& after) {
@@ -329,22 +410,18 @@ void Writer::MakeRoom(const std::string& path) {
 void Writer::WriteRows(Change& change, bool filters_differ) {
   Connection& db = session_.db;
   const bool exists = !change.before.path.empty();
-  if (change.after.path.empty()) {
-    Sql(db, "DELETE FROM docs WHERE id = ?").Int(change.after.id).Run();
-    Sql(db, "DELETE FROM records WHERE id = ?").Int(change.after.id).Run();
-    return;
-  }
   if (!exists) {
+    // Records give the number: they still have those that the text indexes have not forgotten.
+    const std::string record = change.after.record.Encode();
+    Sql(db, "INSERT INTO records(record) VALUES(?)").Blob(record).Run();
+    change.after.id = db.LastInsertId();
     const DocsRow row = DocsRowOf(session_, change.after);
-    Sql docs(db, "INSERT INTO docs(path, ext, size, mtime) VALUES(?,?,?,?)");
-    docs.Blob(change.after.path);
+    Sql docs(db, "INSERT INTO docs(id, path, ext, size, mtime) VALUES(?,?,?,?,?)");
+    docs.Int(change.after.id).Blob(change.after.path);
     Bind(docs, row.extension);
     Bind(docs, row.size);
     Bind(docs, row.modified);
     docs.Run();
-    change.after.id = db.LastInsertId();
-    const std::string record = change.after.record.Encode();
-    Sql(db, "INSERT INTO records VALUES(?,?)").Int(change.after.id).Blob(record).Run();
     return;
   }
   if (!change.after.record.SameStored(change.before.record)) {
@@ -455,6 +532,7 @@ void Writer::UndoTo(const std::string& name, size_t mark, const SqlError& error)
   }
   session_.db.Run("ROLLBACK TO " + name);
   session_.ForgetFields();
+  gone_.reset();
 }
 
 }  // namespace vexlo::elasticd

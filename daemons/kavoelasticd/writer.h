@@ -7,6 +7,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <functional>
+#include <optional>
 #include <string>
 
 #include "daemons/kavoelasticd/query.h"
@@ -47,6 +48,11 @@ class Writer {
   void List(size_t count, const std::function<void(size_t)>& item,
             const std::function<void(size_t, const Failure&)>& refused);
 
+  // Takes removed documents out of the text indexes, some thousand of them, and commits; nothing
+  // else is uncommitted. Whether more are left. Throws what the database answers, with nothing
+  // changed.
+  bool ForgetGone();
+
   // Changes since the last commit.
   size_t Uncommitted() const { return changes_; }
   // Rolls back what is not committed after the database failed; see the class.
@@ -59,6 +65,8 @@ class Writer {
   void ListOneByOne(size_t count, const std::function<void(size_t)>& item,
                     const std::function<void(size_t, const Failure&)>& refused);
   void RemoveDocument(StoredDocument document);
+  void ForgetSome();
+  int64_t Gone();
   void Apply(Change& change);
   struct TextTable;
   static const TextTable kTextTables[TextBatch::kTables];
@@ -78,6 +86,7 @@ class Writer {
   Session& session_;
   TextBatch texts_;
   bool in_list_ = false;
+  std::optional<int64_t> gone_;  // Rows of that table, once they are counted.
   size_t changes_ = 0;
   std::string lost_;  // Why changes were rolled back, until it is told.
 };

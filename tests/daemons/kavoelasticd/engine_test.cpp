@@ -356,4 +356,33 @@ TEST(Engine, AtRestTheLogIsEmptyAndNothingIsLeftToDo) {
   EXPECT_EQ(engine.Search(R"({"name":"last"})"), "/v/last");
 }
 
+TEST(Engine, WhatIsRemovedIsFoundNoMoreAndThenForgotten) {
+  using namespace std::chrono_literals;
+  EngineFixture engine;
+  const auto total = [&engine] {
+    return engine.Send("search", Parsed(R"({"words":"word"})"))["total"].asInt();
+  };
+  for (const char* path : {"/v/1", "/v/2", "/w/3"}) {
+    engine.Add(path, R"({"KAVOMDTextContent":"word )" + std::string(500, 'x') + "\"}");
+  }
+  EXPECT_EQ(engine.Do("commit"), "ok");
+  EXPECT_EQ(
+      engine.Do("document_del_by_query", R"({"query":{"qsl":{"prefix":{"KAVOMDPath":"/w/"}}}})"),
+      "ok");
+  EXPECT_EQ(engine.Do("commit"), "ok");
+  EXPECT_EQ(total(), 2);
+  EXPECT_EQ(engine.Search(R"({"words":"word"})"), "/v/1 /v/2");
+  EXPECT_EQ(engine.Query(R"({"term":{"KAVOMDTextContent":"word"}})"), "/v/1 /v/2");
+  // A document that comes before it is forgotten, or after, has nothing of it.
+  engine.Add("/w/4");
+  engine.Restart();
+  EXPECT_EQ(engine.Do("document_del_by_id", R"({"doc_id":"/w/4"})"), "ok");
+  while (engine.Engine().CommitIdle(0s)) {
+  }
+  engine.Add("/w/5");
+  EXPECT_EQ(engine.Search(R"({"words":"word"})"), "/v/1 /v/2");
+  EXPECT_EQ(engine.Search(R"({"name":"3"})") + engine.Search(R"({"name":"4"})"), "");
+  EXPECT_EQ(engine.Search(R"({"name":"5"})"), "/w/5");
+}
+
 }  // namespace

@@ -361,6 +361,9 @@ std::vector<Wanted> WantedOf(Session& session, const SearchRequest& request) {
 
 std::string SnippetOf(Session& session, StoredDocument* document,
                       const std::vector<Wanted>& wanted) {
+  if (wanted.empty()) {
+    return "";
+  }
   // Long texts first: a name is shown anyway.
   for (const bool long_ones : {true, false}) {
     const std::vector<Item> items = document->record.Items();

@@ -849,6 +849,7 @@ void Run(const Report& report, size_t count, size_t tree, const std::string& fol
 }  // namespace
 
 int main(int argc, char** argv) {
+  setlinebuf(stdout);  // Each line as it is known, also to a pipe.
   size_t documents = 100000;
   size_t tree = 100000;
   bool json = false;

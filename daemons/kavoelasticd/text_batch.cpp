@@ -39,7 +39,7 @@ size_t TextBatch::BytesOf(const Waiting& waiting) {
   size_t bytes = 200;  // About what the place in the map takes.
   for (const TextRow* row : {&waiting.before, &waiting.after}) {
     for (const std::string& text : *row) {
-      bytes += sizeof(text) + text.size();
+      bytes += sizeof(std::string) + text.size();
     }
   }
   return bytes;

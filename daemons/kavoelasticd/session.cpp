@@ -73,9 +73,9 @@ void Session::MakeTables(const IndexInfo& info) {
       ";CREATE VIRTUAL TABLE grams USING fts5(" + Columns('g', schema.GramColumns().size()) +
       "content='',columnsize=0,detail=none,tokenize='kavograms');"
       // The default of 1 MB writes many small segments, which are then merged again and again.
-      "INSERT INTO texts(texts, rank) VALUES('hashsize', 16777216);"
-      "INSERT INTO words(words, rank) VALUES('hashsize', 8388608);"
-      "INSERT INTO grams(grams, rank) VALUES('hashsize', 8388608);"
+      "INSERT INTO texts(texts, rank) VALUES('hashsize', 8388608);"
+      "INSERT INTO words(words, rank) VALUES('hashsize', 4194304);"
+      "INSERT INTO grams(grams, rank) VALUES('hashsize', 4194304);"
       // A page of an index fills a page of the file, and a commit merges less; Store::Rest() does.
       "INSERT INTO texts(texts, rank) VALUES('pgsz', 8000);"
       "INSERT INTO words(words, rank) VALUES('pgsz', 8000);"

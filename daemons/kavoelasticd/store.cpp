@@ -1,5 +1,6 @@
 #include "daemons/kavoelasticd/store.h"
 
+#include <malloc.h>
 #include <sys/stat.h>
 
 #include <cerrno>
@@ -18,6 +19,7 @@ constexpr size_t kCommitAfter = 20'000;
 constexpr size_t kIdleReaders = 8;
 // Of a text index, 8 KB each: some hundredths of a second.
 constexpr int64_t kMergedPages = 500;
+constexpr int kStepsAtOnce = 10;
 
 [[noreturn]] void Damaged(const std::string& what) { throw Failure(Code::kIndexDamaged, what); }
 
@@ -219,22 +221,22 @@ void Store::CommitQuietly() {
 }
 
 bool Store::CommitIdle(std::chrono::steady_clock::duration idle) {
-  if (at_rest_) {
-    return false;
-  }
-  const std::unique_lock lock(write_mutex_, std::try_to_lock);
-  if (!lock.owns_lock() || std::chrono::steady_clock::now() - last_change_ < idle) {
-    return true;
-  }
-  if (uncommitted_) {
-    CommitQuietly();
-  }
-  try {
-    at_rest_ = !Rest();
-  } catch (const std::exception& error) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            "tidying failed, index=" + folder_ + ", reason=" + error.what());
-    at_rest_ = true;
+  for (int step = 0; step < kStepsAtOnce && !at_rest_; ++step) {
+    // Given back after each step, and whoever writes meanwhile ends the loop.
+    const std::unique_lock lock(write_mutex_, std::try_to_lock);
+    if (!lock.owns_lock() || std::chrono::steady_clock::now() - last_change_ < idle) {
+      return true;
+    }
+    if (uncommitted_) {
+      CommitQuietly();
+    }
+    try {
+      at_rest_ = !Rest();
+    } catch (const std::exception& error) {
+      LogLine(VEXLO_SOURCE, __LINE__,
+              "tidying failed, index=" + folder_ + ", reason=" + error.what());
+      at_rest_ = true;
+    }
   }
   return !at_rest_;
 }
@@ -259,6 +261,8 @@ bool Store::Rest() {
   }
   // Readers may keep it from it; the next change brings another try.
   Sql(db, "PRAGMA wal_checkpoint(TRUNCATE)").Run();
+  db.Run("PRAGMA shrink_memory");
+  malloc_trim(0);
   return false;
 }
 

@@ -343,12 +343,9 @@ TEST(Engine, AtRestTheLogIsEmptyAndNothingIsLeftToDo) {
   EXPECT_TRUE(engine.Engine().CommitIdle(1h));
   EXPECT_GT(std::filesystem::file_size(log), 0U);
   engine.Engine().AwaitChange({});
-  int steps = 1;
-  while (engine.Engine().CommitIdle(0s)) {
-    ++steps;
-    ASSERT_LT(steps, 100);
+  for (int calls = 0; engine.Engine().CommitIdle(0s); ++calls) {
+    ASSERT_LT(calls, 100);
   }
-  EXPECT_GT(steps, 1);
   EXPECT_EQ(std::filesystem::file_size(log), 0U);
   EXPECT_EQ(engine.Query(R"({"term":{"KAVOMDTextContent":"word"}})", R"({"size":0})"), "");
   EXPECT_EQ(engine.Documents(R"({"term":{"KAVOMDTextContent":"word"}})", R"({"size":100})").size(),

@@ -248,12 +248,11 @@ bool Store::Rest() {
   if (writer_->ForgetGone()) {
     return true;
   }
-  for (const char* const table : {"texts", "words", "grams"}) {
+  for (const char* const merge : {"INSERT INTO texts(texts, rank) VALUES('merge', ?)",
+                                  "INSERT INTO words(words, rank) VALUES('merge', ?)",
+                                  "INSERT INTO grams(grams, rank) VALUES('merge', ?)"}) {
     const int64_t before = db.TotalChanges();
-    const std::string name = table;
-    Sql(db, "INSERT INTO " + name + "(" + name + ", rank) VALUES('merge', ?)")
-        .Int(kMergedPages)
-        .Run();
+    Sql(db, merge).Int(kMergedPages).Run();
     // One is the command itself.
     if (db.TotalChanges() - before > 1) {
       return true;

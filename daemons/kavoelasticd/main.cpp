@@ -14,13 +14,17 @@ namespace {
 
 using namespace std::chrono_literals;
 
-// Commits what clients write and forget to commit, until it is stopped.
+// Commits what clients write and forget to commit, and tidies up behind them, until it is stopped.
+// Waits for nothing but a change once that is done.
 void CommitIdle(const std::stop_token& stop, vexlo::elasticd::Engine& engine) {
   std::mutex mutex;
   std::condition_variable_any stopped;
   std::unique_lock lock(mutex);
-  while (!stopped.wait_for(lock, stop, 1s, [&stop] { return stop.stop_requested(); })) {
-    engine.CommitIdle(5s);
+  while (!stop.stop_requested()) {
+    engine.AwaitChange(stop);
+    do {
+      stopped.wait_for(lock, stop, 1s, [&stop] { return stop.stop_requested(); });
+    } while (!stop.stop_requested() && engine.CommitIdle(5s));
   }
 }
 

@@ -49,7 +49,7 @@ class WordCutter {
 
  private:
   bool Word(std::string_view text, size_t begin, size_t end, Cut cut, const TokenSink& sink);
-  std::string_view Stem(const std::string& word);
+  std::string_view Stem(std::string_view word);
 
   struct StemmerDelete {
     void operator()(sb_stemmer* stemmer) const;

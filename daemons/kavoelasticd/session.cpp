@@ -26,7 +26,7 @@ StoredDocument Stored(const Sql& row) {
 
 }  // namespace
 
-std::string FormatVersion() { return "1, Unicode " U_UNICODE_VERSION; }
+std::string FormatVersion() { return "2, Unicode " U_UNICODE_VERSION; }
 
 std::string LanguageOf(const Json::Value& settings) {
   if (!settings.isObject() || !settings.isMember("language")) {

@@ -13,7 +13,7 @@
 
 namespace fuzz {
 
-constexpr char kIndexFolder[] = "/work/i";
+constexpr char kIndexFolder[] = "/engine/i";
 constexpr char kMappings[] = R"({"property_id":"KAVOMDPath",
  "default":{"type":"string","analyzer":"kavostandard","required":false,"stored":true,"_all":true},
  "properties":{

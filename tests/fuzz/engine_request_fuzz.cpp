@@ -14,11 +14,11 @@ namespace {
 using vexlo::elasticd::Engine;
 namespace fs = std::filesystem;
 
-std::string Registry() { return fuzz::Folder() + "/work/registry.json"; }
+std::string Registry() { return fuzz::Folder() + "/engine/registry.json"; }
 
 // The folder of the engine as every input finds it.
 void Restore() {
-  const std::string work = fuzz::Folder() + "/work";
+  const std::string work = fuzz::Folder() + "/engine";
   const std::string kept = fuzz::Folder() + "/kept";
   if (!fs::exists(kept)) {
     fs::create_directories(work);
@@ -36,7 +36,7 @@ void Restore() {
 void Confine(Json::Value& path) {
   if (path.isString() && !path.asString().empty()) {
     constexpr size_t kFolders = 3;
-    path = fuzz::Folder() + "/work/" +
+    path = fuzz::Folder() + "/engine/" +
            std::string(
                1, static_cast<char>('i' + std::hash<std::string>()(path.asString()) % kFolders));
   }

@@ -17,8 +17,8 @@ using vexlo::elasticd::Engine;
 using Paths = std::set<std::string>;
 
 Engine& Index() {
-  static const bool is_made = std::filesystem::create_directories(fuzz::Folder() + "/work");
-  static Engine engine(fuzz::Folder() + "/work/registry.json");
+  static const bool is_made = std::filesystem::create_directories(fuzz::Folder() + "/engine");
+  static Engine engine(fuzz::Folder() + "/engine/registry.json");
   static const bool is_filled = (fuzz::FillIndex(engine), is_made);
   fuzz::Require(is_filled, "the index is there already");
   return engine;

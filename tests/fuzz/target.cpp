@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 
 namespace fuzz {
 namespace {
@@ -65,28 +66,34 @@ void WriteFile(const std::string& path, std::string_view content) {
   Require(file.good(), "a file of the target's own cannot be written");
 }
 
-// As RFC 3629 has it: no longer forms than need be, no halves of pairs, nothing over U+10FFFF.
+// As RFC 3629 has it: the leading byte alone says how many follow it, and where the second of them
+// begins and ends, so that there are no longer forms than need be, no halves of pairs, nothing over
+// U+10FFFF.
 bool IsUtf8(std::string_view text) {
+  struct Row {
+    unsigned first, last;  // Leading bytes.
+    unsigned from, to;     // Of the second byte.
+    size_t length;
+  };
+  constexpr Row kRows[] = {
+      {0x00, 0x7F, 0, 0, 1},       {0xC2, 0xDF, 0x80, 0xBF, 2}, {0xE0, 0xE0, 0xA0, 0xBF, 3},
+      {0xE1, 0xEC, 0x80, 0xBF, 3}, {0xED, 0xED, 0x80, 0x9F, 3}, {0xEE, 0xEF, 0x80, 0xBF, 3},
+      {0xF0, 0xF0, 0x90, 0xBF, 4}, {0xF1, 0xF3, 0x80, 0xBF, 4}, {0xF4, 0xF4, 0x80, 0x8F, 4}};
+  const auto byte_at = [text](size_t at) { return unsigned{static_cast<unsigned char>(text[at])}; };
   for (size_t i = 0; i < text.size();) {
-    const auto lead = static_cast<unsigned char>(text[i]);
-    const size_t length = lead < 0x80 ? 1 : lead < 0xC2 ? 0 : lead < 0xE0 ? 2 : lead < 0xF0 ? 3 : 4;
-    if (length == 0 || lead > 0xF4 || length > text.size() - i) {
+    const auto* const row = std::find_if(std::begin(kRows), std::end(kRows), [&](const Row& r) {
+      return byte_at(i) >= r.first && byte_at(i) <= r.last;
+    });
+    if (row == std::end(kRows) || row->length > text.size() - i ||
+        (row->length > 1 && (byte_at(i + 1) < row->from || byte_at(i + 1) > row->to))) {
       return false;
     }
-    uint32_t character = length == 1 ? lead : lead & (0x7FU >> length);
-    for (size_t j = 1; j < length; ++j) {
-      const auto byte = static_cast<unsigned char>(text[i + j]);
-      if ((byte & 0xC0) != 0x80) {
+    for (size_t j = 2; j < row->length; ++j) {
+      if ((byte_at(i + j) & 0xC0) != 0x80) {
         return false;
       }
-      character = character << 6 | (byte & 0x3FU);
     }
-    const bool is_short_form =
-        (length == 3 && character < 0x800) || (length == 4 && character < 0x10000);
-    if (is_short_form || (character >= 0xD800 && character < 0xE000) || character > 0x10FFFF) {
-      return false;
-    }
-    i += length;
+    i += row->length;
   }
   return true;
 }

@@ -85,7 +85,7 @@ void CheckReader(Reader reader, const char* type, std::string_view bytes) {
 // to be had either. All forms, as what one takes another gives back.
 namespace {
 
-constexpr size_t kMostAtOnce = size_t{512} << 20;
+constexpr size_t kMostAtOnce = size_t{128} << 20;
 
 void* Allocate(size_t bytes) noexcept { return bytes > kMostAtOnce ? nullptr : malloc(bytes); }
 

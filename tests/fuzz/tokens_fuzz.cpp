@@ -115,9 +115,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   static WordCutter english("english");
   static WordCutter plain("none");
   const std::string_view text = fuzz::TextOf(data, size);
-  const std::string folded = vexlo::elasticd::Fold(text);
-  fuzz::RequireEqual(vexlo::elasticd::Fold(folded), folded, "folding twice is another thing");
+  // Of other bytes, two may come together as a character where an accent was between them.
   if (fuzz::IsUtf8(text)) {
+    const std::string folded = vexlo::elasticd::Fold(text);
+    fuzz::RequireEqual(vexlo::elasticd::Fold(folded), folded, "folding twice is another thing");
     fuzz::Require(fuzz::IsUtf8(folded), "folding breaks characters");
   }
   CheckWords(english, text);

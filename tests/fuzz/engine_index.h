@@ -4,6 +4,7 @@
 
 #include <json/value.h>
 
+#include <filesystem>
 #include <map>
 #include <string>
 
@@ -84,6 +85,45 @@ inline void FillIndex(vexlo::elasticd::Engine& engine) {
     MustAnswer(engine, "document_upsert_by_id", data);
   }
   MustAnswer(engine, "commit", Json::objectValue);
+}
+
+inline std::string Registry() { return Folder() + "/engine/registry.json"; }
+
+// Makes the folder of the engine as every input finds it: with that index, closed.
+inline void RestoreIndex() {
+  namespace fs = std::filesystem;
+  const std::string work = Folder() + "/engine";
+  const std::string kept = Folder() + "/kept";
+  if (!fs::exists(kept)) {
+    fs::create_directories(work);
+    {
+      vexlo::elasticd::Engine engine(Registry());
+      FillIndex(engine);
+    }
+    fs::copy(work, kept, fs::copy_options::recursive);
+  }
+  fs::remove_all(work);
+  fs::copy(kept, work, fs::copy_options::recursive);
+}
+
+// The reply with every document of the index "i".
+inline Json::Value AllDocuments(vexlo::elasticd::Engine& engine) {
+  Json::Value query;
+  Require(
+      vexlo::JsonFromString(query, R"({"query":{"qsl":{"prefix":{"KAVOMDPath":""}},"size":1000}})"),
+      "the query is no JSON");
+  return engine.Handle(Request("document_get_by_query", query));
+}
+
+// Requires the form that clients expect of a reply; gives the code of a refusal, or 0.
+inline int CodeOf(const Json::Value& reply) {
+  Require(reply.isObject() && reply["success"].isBool(), "a reply does not say how it went");
+  if (reply["success"].asBool()) {
+    return 0;
+  }
+  Require(reply["error"]["msg"].isString() && !reply["error"]["msg"].asString().empty(),
+          "a refusal has no reason");
+  return reply["error"]["code"].asInt();
 }
 
 }  // namespace fuzz

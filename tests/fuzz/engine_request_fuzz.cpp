@@ -1,6 +1,5 @@
 // Requests to the engine, one a line, over an index with a few documents. Each is answered as
 // clients expect it, and what was committed is the same after a restart.
-#include <filesystem>
 #include <functional>
 #include <memory>
 
@@ -12,25 +11,6 @@
 namespace {
 
 using vexlo::elasticd::Engine;
-namespace fs = std::filesystem;
-
-std::string Registry() { return fuzz::Folder() + "/engine/registry.json"; }
-
-// The folder of the engine as every input finds it.
-void Restore() {
-  const std::string work = fuzz::Folder() + "/engine";
-  const std::string kept = fuzz::Folder() + "/kept";
-  if (!fs::exists(kept)) {
-    fs::create_directories(work);
-    {
-      Engine engine(Registry());
-      fuzz::FillIndex(engine);
-    }
-    fs::copy(work, kept, fs::copy_options::recursive);
-  }
-  fs::remove_all(work);
-  fs::copy(kept, work, fs::copy_options::recursive);
-}
 
 // Folders of indexes stand in the target's own folder, whatever the request says.
 void Confine(Json::Value& path) {
@@ -55,15 +35,9 @@ Json::Value Confined(Json::Value request) {
 }
 
 void CheckItem(const Json::Value& reply) {
-  fuzz::Require(reply.isObject() && reply["success"].isBool(), "a reply does not say how it went");
-  if (reply["success"].asBool()) {
-    return;
-  }
-  const int code = reply["error"]["code"].asInt();
-  fuzz::Require(reply["error"]["msg"].isString() && !reply["error"]["msg"].asString().empty(),
-                "a refusal has no reason");
+  const int code = fuzz::CodeOf(reply);
   // Neither of what is wrong with the index, nor with the engine.
-  fuzz::Require((code >= 2000 && code <= 2009 && code != 2005) || code == 120,
+  fuzz::Require(code == 0 || (code >= 2000 && code <= 2009 && code != 2005) || code == 120,
                 vexlo::JsonToString(reply).c_str());
 }
 
@@ -81,21 +55,17 @@ void CheckReply(const std::string& text) {
   }
 }
 
-// Every document, and what a search for all of them finds; "" for an index that is not there.
+// Every document; "" for an index that is not there.
 std::string Documents(Engine& engine) {
-  Json::Value query;
-  fuzz::Require(
-      vexlo::JsonFromString(query, R"({"query":{"qsl":{"prefix":{"KAVOMDPath":""}},"size":1000}})"),
-      "the query is no JSON");
-  const Json::Value reply = engine.Handle(fuzz::Request("document_get_by_query", query));
-  return reply["success"].asBool() ? vexlo::JsonToString(reply) : "";
+  const Json::Value reply = fuzz::AllDocuments(engine);
+  return fuzz::CodeOf(reply) == 0 ? vexlo::JsonToString(reply) : "";
 }
 
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  Restore();
-  auto engine = std::make_unique<Engine>(Registry());
+  fuzz::RestoreIndex();
+  auto engine = std::make_unique<Engine>(fuzz::Registry());
   const vexlo::elasticd::Handler handler = [&](const Json::Value& request) {
     return engine->Handle(Confined(request));
   };
@@ -107,7 +77,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   const std::string before = Documents(*engine);
   if (engine->Handle(fuzz::Request("commit", Json::objectValue))["success"].asBool()) {
     engine.reset();
-    engine = std::make_unique<Engine>(Registry());
+    engine = std::make_unique<Engine>(fuzz::Registry());
     fuzz::RequireEqual(Documents(*engine), before, "a restart changes what was committed");
   }
   return 0;

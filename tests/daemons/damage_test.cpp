@@ -29,7 +29,7 @@
 
 namespace {
 
-const PrivateRoot root;
+const PrivateRoot kRoot;
 namespace index = vexlo::fileindex;
 
 // What a file says, an element for each part that damage may touch by itself; none when it is
@@ -165,16 +165,16 @@ std::vector<Kind> Kinds() {
        ReadFolders, 2},
       {"status", index::kFileIndexStatusCfgPath.Get(),
        "{\"resume_time\":1700000000,\"share\":{\"photo\":3}}\n", ReadStatus, 2},
-      {"share state", root / "state.json",
+      {"share state", kRoot / "state.json",
        R"({"crawled":["/v/photo","/v/music"],"rebuilt":true,"missed":["/v/photo/a"],)"
        R"("crawl":{"root":"/v/photo","cause":"x","after":"/v/photo/b","pass":2,"saw_gone":true}})",
        ReadShareState, 4},
-      {"quarantine", root / "extract/quarantine.json",
+      {"quarantine", kRoot / "extract/quarantine.json",
        R"({"files":[{"device":1,"inode":7,"size":3,"modified":4,"changed":5,"reason":"crash",)"
        R"("msg":"m","path":"/v/a","time":6},{"device":1,"inode":8,"size":3,"modified":4,)"
        R"("changed":5,"reason":"memory","msg":"n","path":"/v/b","time":6}]})",
        ReadQuarantine, 2},
-      {"registry", root / "registry.json",
+      {"registry", kRoot / "registry.json",
        R"({"indexes":{"photo":{"path":"/v/i","token":"t","state":"active"},)"
        R"("music":{"path":"/v/j","token":"u","state":"paused"}}})",
        ReadRegistry, 2},
@@ -186,8 +186,8 @@ std::vector<Kind> Kinds() {
        R"({"shares": [{"name": "photo", "path": "/volume1/photo", "read_only": true},)"
        "\n{\"name\": \"music\", \"path\": \"/volume1/music\"}]}\n",
        ReadShares, 2},
-      {"queue", root / "live", lines, ReadQueue, 3, 2, true},
-      {"snapshot", root / "queue.tmp", lines, ReadSnapshot, 3, 2, true},
+      {"queue", kRoot / "live", lines, ReadQueue, 3, 2, true},
+      {"snapshot", kRoot / "queue.tmp", lines, ReadSnapshot, 3, 2, true},
   };
 }
 

@@ -115,8 +115,10 @@ bool Ideographs(const std::vector<Cluster>& run, Cut cut, const TokenSink& sink)
   if (run.empty() || (cut != Cut::kDocument && run.size() > 1)) {
     return true;
   }
+  // At the place of the pair that it ends: what follows a run follows its last pair, also in a
+  // query.
   const Cluster& last = run.back();
-  return sink({last.text, last.begin, last.end, /*same_place=*/false});
+  return sink({last.text, last.begin, last.end, /*same_place=*/run.size() > 1});
 }
 
 std::vector<std::string_view> Characters(std::string_view text) {

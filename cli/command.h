@@ -77,6 +77,7 @@ std::vector<Command> ShareCommands();
 std::vector<Command> StatusCommands();
 std::vector<Command> UpCommands();
 std::vector<Command> WatchCommands();
+std::vector<Command> WebCommands();
 
 // Finds the command, reads its arguments and runs it. `words` are the program's arguments without
 // its own name. Errors go to `console.err` as one sentence.

@@ -14,7 +14,8 @@ int main(int argc, char** argv) {
         vexlo::cli::ShareCommands, vexlo::cli::IndexCommands, vexlo::cli::SearchCommands,
         vexlo::cli::PauseCommands, vexlo::cli::ConfigCommands, vexlo::cli::FolderCommands,
         vexlo::cli::StatusCommands, vexlo::cli::ExtractCommands, vexlo::cli::AuditCommands,
-        vexlo::cli::DoctorCommands, vexlo::cli::FailedCommands, vexlo::cli::UpCommands}) {
+        vexlo::cli::DoctorCommands, vexlo::cli::FailedCommands, vexlo::cli::UpCommands,
+        vexlo::cli::WebCommands}) {
     const std::vector<Command> more = family();
     commands.insert(commands.end(), more.begin(), more.end());
   }

@@ -15,6 +15,7 @@
 #include "cli/web/pages.h"
 #include "common/error.h"
 #include "common/json.h"
+#include "fileindex/folder.h"
 #include "fileindex/index_mgr/folder_ops.h"
 
 namespace vexlo::cli {
@@ -101,6 +102,13 @@ Json::Value Folders(const HttpRequest& request) {
     fileindex::FolderList(result, from, limit, "path", "ASC", /*group=*/"", /*keyword=*/"",
                           additional);
   });
+  for (Json::Value& folder : result["folder"]) {
+    try {
+      folder["full_path"] = fileindex::Folder(folder).GetFullPath();
+    } catch (const Error&) {
+      // Its share is gone, which its status says; its place is not known then.
+    }
+  }
   return result;
 }
 

@@ -17,7 +17,8 @@ std::vector<HttpServer::Lane> WebLanes();
 //                      options of "fileindex search" without their dashes (share, below, name,
 //                      type, larger, smaller, newer, older, sort, limit up to 100), and "from", the
 //                      number of hits to leave out.
-//   GET  /api/folders  FolderList() with the status of each. Arguments "from" and "limit" (100).
+//   GET  /api/folders  FolderList() with the status of each, and "full_path" where its share is
+//                      known. Arguments "from" and "limit" (100, up to 1000).
 //   GET  /api/status   AskWholeStack()
 //   POST /api/pause    pauses indexing for "hours", or until it is resumed; AskWholeStack() then
 //   POST /api/resume   the same for going on

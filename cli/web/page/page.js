@@ -36,7 +36,7 @@ const escaped = (bytes) => bytes.replace(/[^A-Za-z0-9]/g,
 // The other way round.
 const unescaped = (text) => text.replace(/%([0-9A-Fa-f]{2})/g, (_, digits) => String.fromCharCode(parseInt(digits, 16)));
 
-const kNotText = /[\u0000-\u001f\u007f-\u009f\u202a-\u202e\u2066-\u2069]/u;
+const kNotText = /[\u0000-\u001f\u007f-\u009f\u061c\u200e\u200f\u2028-\u202e\u2066-\u2069\ufeff]/u;
 const octal = (byte) => '\\' + byte.toString(8).padStart(3, '0');
 
 // Cuts a byte string into what can be shown as it is and what cannot: bytes that are no UTF-8, and
@@ -119,6 +119,13 @@ function makeButton(label, className, onClick) {
   button.addEventListener('click', onClick);
   return button;
 }
+
+// A button that is `disabled` would lose the keyboard's focus.
+function setUsable(button, usable) {
+  button.setAttribute('aria-disabled', String(!usable));
+}
+
+const isUsable = (button) => button.getAttribute('aria-disabled') !== 'true';
 
 const grouped = (number) => Number(number || 0).toLocaleString('en-US');
 const counted = (number, noun) => `${grouped(number)} ${noun}${number === 1 ? '' : 's'}`;
@@ -361,12 +368,15 @@ async function search() {
   byId('summary').textContent = summary;
   const total = Number(reply.total || 0);
   byId('pages').hidden = total <= kPageSize;
-  byId('previous').disabled = from === 0;
-  byId('next').disabled = from + reply.data.length >= total;
+  setUsable(byId('previous'), from > 0);
+  setUsable(byId('next'), from + reply.data.length < total);
   byId('page-text').textContent = `Page ${grouped(Math.floor(from / kPageSize) + 1)} of ${grouped(Math.ceil(total / kPageSize))}`;
 }
 
-function turnPage(pages) {
+function turnPage(button, pages) {
+  if (!isUsable(button)) {
+    return;
+  }
   const from = Math.max(0, (Number(place.from) || 0) + pages * kPageSize);
   go({...place, from: from || ''});
   byId('words').scrollIntoView();
@@ -527,7 +537,10 @@ function showStatus(status) {
 }
 
 async function changePause() {
-  byId('pause').disabled = true;
+  if (!isUsable(byId('pause'))) {
+    return;
+  }
+  setUsable(byId('pause'), false);
   try {
     showStatus(isPaused ? await ask('POST', '/api/resume') :
         await ask('POST', '/api/pause', {hours: byId('hours').value}));
@@ -536,7 +549,7 @@ async function changePause() {
   } catch (error) {
     setProblem('pause', error);
   }
-  byId('pause').disabled = false;
+  setUsable(byId('pause'), true);
 }
 
 async function follow() {
@@ -599,6 +612,8 @@ function show() {
   byId(here).setAttribute('aria-current', 'page');
   byId(away).removeAttribute('aria-current');
   if (wantsFolders) {
+    searches += 1;  // What is still looked for is not wanted any more.
+    setProblem('search', null);
     loadFolders().then(() => setProblem('status', null), (error) => setProblem('status', error));
   } else {
     byId('to-search').hash = hashOf(place);  // The way back from the folders.
@@ -621,8 +636,8 @@ byId('search').addEventListener('submit', (event) => {
 byId('filters').addEventListener('change', () => countFilters(readForm()));
 byId('filters').addEventListener('toggle', suggestFolders);
 byId('clear').addEventListener('click', () => go({view: 'search', words: readForm().words}));
-byId('previous').addEventListener('click', () => turnPage(-1));
-byId('next').addEventListener('click', () => turnPage(1));
+byId('previous').addEventListener('click', (event) => turnPage(event.currentTarget, -1));
+byId('next').addEventListener('click', (event) => turnPage(event.currentTarget, 1));
 byId('pausing').addEventListener('submit', (event) => {
   event.preventDefault();
   changePause();

@@ -20,7 +20,7 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr unsigned int kMostConnections = 64;
+constexpr unsigned int kMostConnections = 96;
 constexpr size_t kMostWaiting = 48;
 constexpr auto kPatience = std::chrono::seconds(20);
 constexpr unsigned int kIdleSeconds = 15;

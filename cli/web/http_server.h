@@ -35,7 +35,7 @@ struct HttpResponse {
 // One thread reads requests and writes responses for all connections; what takes time is answered
 // by threads of its own. So a client that stalls costs a connection and nobody waits for it:
 //
-// - There are up to 64 connections. When 48 of them wait for their clients, the one that waits
+// - There are up to 96 connections. When 48 of them wait for their clients, the one that waits
 //   longest is closed for the next. A request must have come, and its response have been taken,
 //   within 20 seconds each; no drop by drop makes that longer.
 // - A request line with its headers has up to 32 KiB; a body is announced to the handler and not

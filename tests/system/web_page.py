@@ -124,8 +124,8 @@ def await_text(browser, expression, wanted):
 SUMMARY = "document.getElementById('summary')?.textContent"
 NAMES = "[...document.querySelectorAll('#results h3')].map((name) => name.textContent)"
 FOCUS = "document.activeElement?.id"
-PROBLEM = "document.getElementById('problem').textContent"
-STATE = "document.getElementById('state').textContent"
+PROBLEM = "document.getElementById('problem')?.textContent"
+STATE = "document.getElementById('state')?.textContent"
 
 
 def look_for(browser, words):

@@ -307,6 +307,14 @@ function makeHit(hit) {
   if (hit.modified) {
     facts.append(make('span', '', timeText(hit.modified)));
   }
+  const path = shown(hit.path);
+  if (toBytes(path) === hit.path) {  // The clipboard takes text only.
+    const copy = makeButton('Copy path', 'link', async () => {
+      await navigator.clipboard.writeText(path);
+      copy.textContent = 'Copied';
+    });
+    facts.append(copy);
+  }
   item.append(facts);
   item.tabIndex = -1;
   return item;

@@ -213,7 +213,11 @@ struct HttpServer::State {
   static MHD_Result Handle(void* closure, MHD_Connection* connection, const char* path,
                            const char* method, const char* /*version*/, const char* /*upload*/,
                            size_t* /*upload_size*/, void** exchange) noexcept {
-    return static_cast<State*>(closure)->Go(connection, path, method, exchange);
+    try {
+      return static_cast<State*>(closure)->Go(connection, path, method, exchange);
+    } catch (...) {
+      return MHD_NO;  // Out of memory; the library closes the connection.
+    }
   }
   static void Complete(void* closure, MHD_Connection* connection, void** exchange,
                        MHD_RequestTerminationCode /*why*/) noexcept {

@@ -462,7 +462,7 @@ function makeFolder(folder) {
   const status = folder.additional?.status || {};
   const types = kFolderTypes.filter((type) => folder[type]);
   const item = make('li', '', make('h3', '', makeName('name', folder.name || folder.path), makeState(status.text || '')),
-      make('p', '', makeName('path', folder.path)),
+      make('p', '', makeName('path', folder.full_path || folder.path)),
       make('p', 'facts', make('span', '', types.length ? `contents of: ${types.join(', ')}` : 'names only')));
   if (folder.group) {
     item.lastElementChild.append(make('span', '', 'group ', makeName('name', folder.group)));
@@ -639,6 +639,9 @@ byId('token-form').addEventListener('submit', (event) => {
 });
 byId('search').addEventListener('submit', (event) => {
   event.preventDefault();
+  if (matchMedia('(max-width: 34rem)').matches) {
+    byId('filters').open = false;  // They would hide what is found.
+  }
   go(readForm());
 });
 byId('filters').addEventListener('change', () => countFilters(readForm()));

@@ -178,6 +178,10 @@ def use_search(browser, folder):
     browser.js("document.getElementById('filters').open = true")
     check("the folder's field", browser.js("document.getElementById('below').value"),
           f"{folder}/caf\\351 & co")
+    look_for(browser, "harbour")
+    await_text(browser, SUMMARY, "Nothing was found.")
+    look_for(browser, "light*")  # The field shows what it cannot hold, and the folder is still meant.
+    await_text(browser, SUMMARY, "1 file found.")
     browser.js("document.getElementById('larger').value = '1k'")
     look_for(browser, "lighthouse")
     await_text(browser, SUMMARY, "Nothing was found.")

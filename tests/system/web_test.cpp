@@ -292,12 +292,13 @@ TEST_F(WebTest, PausesAndResumes) {
 }
 
 TEST_F(WebTest, IsThereForOthersWhileClientsStall) {
+  const auto begin = Stack::Clock::now();
   std::vector<std::unique_ptr<Client>> stalled;
+  stalled.reserve(200);
   for (int i = 0; i < 200; ++i) {
     stalled.push_back(std::make_unique<Client>(web_.Port()));
     stalled.back()->Send(i % 2 == 0 ? "" : "GET /api/status HTTP/1.1\r\nX-Slow: ");
   }
-  const auto begin = Stack::Clock::now();
   EXPECT_EQ(web_.Get("/api/search?words=harbour")["total"].asInt(), kFiles);
   EXPECT_LT(Stack::Clock::now() - begin, std::chrono::seconds(10));
   EXPECT_EQ(web_.End(SIGINT), 0);
@@ -306,6 +307,7 @@ TEST_F(WebTest, IsThereForOthersWhileClientsStall) {
 TEST_F(WebTest, AnswersWhatItCanWhileTheEngineHangs) {
   stack->Signal("kavoelasticd", SIGSTOP);
   std::vector<std::unique_ptr<Client>> searches;
+  searches.reserve(10);
   for (int i = 0; i < 10; ++i) {  // As many as two threads and the queue for them take.
     searches.push_back(std::make_unique<Client>(web_.Port()));
     searches.back()->Send("GET /api/search?words=harbour HTTP/1.1\r\n" + web_.Host() + web_.Key() +

@@ -13,7 +13,7 @@
 namespace vexlo::cli {
 namespace {
 
-constexpr int kBacklog = 64;
+constexpr int kBacklog = 1024;
 
 socklen_t LengthOf(const sockaddr_storage& address) {
   return address.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in);

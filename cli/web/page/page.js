@@ -553,11 +553,11 @@ async function changePause() {
     showStatus(isPaused ? await ask('POST', '/api/resume') :
         await ask('POST', '/api/pause', {hours: byId('hours').value}));
     setProblem('pause', null);
-    await loadFolders();
   } catch (error) {
     setProblem('pause', error);
   }
   setUsable(byId('pause'), true);
+  loadFolders().catch((error) => setProblem('status', error));
 }
 
 async function follow() {
@@ -655,7 +655,7 @@ byId('pausing').addEventListener('submit', (event) => {
 });
 byId('more-folders').addEventListener('click', () => {
   foldersShown += kFolderPage;
-  loadFolders();
+  loadFolders().catch((error) => setProblem('status', error));
 });
 document.addEventListener('keydown', onKey);
 window.addEventListener('hashchange', show);

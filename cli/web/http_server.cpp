@@ -167,7 +167,7 @@ HttpRequest ReadRequest(MHD_Connection* connection, const char* path, const char
   return request;
 }
 
-MHD_Result Respond(MHD_Connection* connection, const HttpResponse& answer, bool is_last) {
+MHD_Result Respond(MHD_Connection* connection, const HttpResponse& answer) {
   // The library copies the bytes and does not change them.
   MHD_Response* const response = MHD_create_response_from_buffer(
       answer.body.size(), const_cast<char*>(answer.body.data()), MHD_RESPMEM_MUST_COPY);
@@ -178,9 +178,7 @@ MHD_Result Respond(MHD_Connection* connection, const HttpResponse& answer, bool 
   for (const auto& [name, value] : answer.headers) {
     MHD_add_response_header(response, name.c_str(), value.c_str());
   }
-  if (is_last) {
-    MHD_add_response_header(response, MHD_HTTP_HEADER_CONNECTION, "close");
-  }
+  MHD_add_response_header(response, MHD_HTTP_HEADER_CONNECTION, "close");
   const MHD_Result result = MHD_queue_response(connection, answer.status, response);
   MHD_destroy_response(response);
   return result;
@@ -240,15 +238,13 @@ struct HttpServer::State {
     if (*state != nullptr) {
       const auto& exchange = *static_cast<Exchange*>(*state);
       waiting.Begin(SocketOf(connection));
-      return exchange.response ? Respond(connection, *exchange.response, false) : MHD_NO;
+      return exchange.response ? Respond(connection, *exchange.response) : MHD_NO;
     }
     auto* const exchange = new Exchange;
     *state = exchange;
-    HttpRequest request = ReadRequest(connection, path, method);
-    const bool has_body = request.has_body;
-    Answer answer = handler(std::move(request));
+    Answer answer = handler(ReadRequest(connection, path, method));
     if (auto* const response = std::get_if<HttpResponse>(&answer)) {
-      return Respond(connection, *response, has_body);
+      return Respond(connection, *response);
     }
     auto& [lane, work] = std::get<1>(answer);
     waiting.End(SocketOf(connection));

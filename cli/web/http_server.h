@@ -35,11 +35,11 @@ struct HttpResponse {
 // One thread reads requests and writes responses for all connections; what takes time is answered
 // by threads of its own. So a client that stalls costs a connection and nobody waits for it:
 //
-// - There are up to 96 connections. When 48 of them wait for their clients, the one that waits
-//   longest is closed for the next. A request must have come, and its response have been taken,
-//   within 20 seconds each; no drop by drop makes that longer.
-// - A request line with its headers has up to 32 KiB; a body is announced to the handler and not
-//   read, and the connection ends with the response.
+// - There are up to 96 connections, of one request each. When 48 of them wait for their clients,
+// the
+//   one that waits longest is closed for the next. A request must have come, and its response have
+//   been taken, within 20 seconds each; no drop by drop makes that longer.
+// - A request line with its headers has up to 32 KiB; a body is announced to the handler, not read.
 // - A lane has threads and a queue, both of fixed size. When the queue is full, the answer is 503.
 class HttpServer {
  public:

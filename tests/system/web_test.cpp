@@ -67,12 +67,23 @@ class Web {
     token_ = url_.substr(at + mark.size());
   }
 
+  ~Web() {
+    if (!has_ended_) {
+      EXPECT_EQ(End(SIGINT), 0);
+    }
+  }
+  Web(const Web&) = delete;
+  Web& operator=(const Web&) = delete;
+
   const std::string& Url() const { return url_; }
   uint16_t Port() const { return port_; }
   const std::string& Token() const { return token_; }
   std::string Host() const { return "Host: 127.0.0.1:" + std::to_string(port_) + "\r\n"; }
   std::string Key() const { return "X-Fileindex-Token: " + token_ + "\r\n"; }
-  int End(int signal) { return program_.End(signal); }
+  int End(int signal) {
+    has_ended_ = true;
+    return program_.End(signal);
+  }
 
   // Without a line for "Host" among the headers, the right one is sent.
   Reply Ask(const std::string& line, const std::string& headers) const {
@@ -96,6 +107,7 @@ class Web {
 
  private:
   Program program_;
+  bool has_ended_ = false;
   std::string url_;
   uint16_t port_ = 0;
   std::string token_;

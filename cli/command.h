@@ -81,6 +81,7 @@ std::vector<Command> ShareCommands();
 std::vector<Command> StatusCommands();
 std::vector<Command> UpCommands();
 std::vector<Command> WatchCommands();
+std::vector<Command> WebCommands();
 
 // All of them, in the order of the overview.
 std::vector<Command> AllCommands();

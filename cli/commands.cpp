@@ -10,7 +10,7 @@ std::vector<Command> AllCommands() {
   for (auto* const family :
        {WatchCommands, QueueCommands, ExplainCommands, ShareCommands, IndexCommands, SearchCommands,
         PauseCommands, ConfigCommands, FolderCommands, StatusCommands, ExtractCommands,
-        AuditCommands, DoctorCommands, FailedCommands, MetricsCommands, UpCommands}) {
+        AuditCommands, DoctorCommands, FailedCommands, MetricsCommands, UpCommands, WebCommands}) {
     std::vector<Command> more = family();
     std::move(more.begin(), more.end(), std::back_inserter(commands));
   }

@@ -19,7 +19,7 @@ struct Backlog {
 // Reads the files. What is not there counts nothing.
 Backlog BacklogOf(const std::string& queue_path);
 
-// `state` is ServiceState()'s; "backlog" of a share, {"lines","bytes","age"}, is shown where it is
+// `state` is AskWholeStack()'s; "backlog" of a share, {"lines","bytes","age"}, is shown where it is
 // there.
 std::string MetricsText(const Json::Value& state);
 

@@ -3,14 +3,14 @@
 
 #include "cli/command.h"
 #include "cli/metrics.h"
-#include "cli/service.h"
+#include "cli/stack_report.h"
 #include "cli/text.h"
 
 namespace vexlo::cli {
 namespace {
 
 Json::Value StateWithBacklogs() {
-  Json::Value state = ServiceState();
+  Json::Value state = AskWholeStack();
   for (Json::Value& share : state["shares"]) {
     const Backlog backlog = BacklogOf(share["queue"].asString());
     share["backlog"]["lines"] = static_cast<Json::UInt64>(backlog.lines);

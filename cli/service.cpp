@@ -4,12 +4,8 @@
 #include <sys/un.h>
 #include <unistd.h>
 
-#include <map>
-
 #include "cli/daemon_stats.h"
-#include "fileindex/index_mgr/status_report.h"
 #include "fileindex/paths.h"
-#include "fileindex/status_mgr.h"
 #include "kavo/local/content.h"
 #include "kavo/local/shares.h"
 
@@ -42,34 +38,6 @@ Json::Value AskStats(const std::string& socket) {
   // The daemons name what they are asked differently; each passes over what it does not know.
   return AskDaemon(socket, R"({"command":"stats","type":"stats","data":null})")
       .value_or(Json::Value());
-}
-
-Json::Value ServiceState() {
-  Json::Value all;
-  all["daemons"] = Json::Value(Json::arrayValue);
-  all["shares"] = Json::Value(Json::arrayValue);
-  std::map<std::string, Json::Value> watched;  // By queue file.
-  for (const DaemonPlace& place : LocalDaemons()) {
-    const Json::Value stats = AskStats(place.socket);
-    Json::Value daemon;
-    daemon["name"] = place.name;
-    daemon["running"] = !stats.isNull();
-    daemon["socket"] = place.socket;
-    daemon["stats"] = stats;
-    all["daemons"].append(daemon);
-    for (const Json::Value& queue : stats["queues"]) {
-      watched[queue["queue"].asString()] = queue;
-    }
-    for (const Json::Value& share : stats["shares"]) {
-      all["shares"].append(share);
-    }
-  }
-  for (Json::Value& share : all["shares"]) {
-    share["watch"] = watched[share["queue"].asString()];
-  }
-  all["status"] = fileindex::GetIndexProcessingStatus();
-  all["resume_time"] = static_cast<Json::Int64>(fileindex::StatusMgr().GetPauseInfo());
-  return all;
 }
 
 Json::Value AskShares() {

@@ -23,13 +23,6 @@ std::vector<DaemonPlace> LocalDaemons();
 // What the daemon behind a socket answers to "stats", null when it does not (see AskDaemon).
 Json::Value AskStats(const std::string& socket);
 
-// {"daemons":[{"name","running","socket","stats"}],"shares":[...],"status","resume_time"}:
-// everything that the daemons tell. A daemon that does not answer in time runs no more than one
-// that is not there. A share is what the index daemon says of it, with "watch", what the notify
-// daemon says of its queue, or null. `resume_time` as in StatusMgr::GetPauseInfo. Throws as that
-// does.
-Json::Value ServiceState();
-
 // The index daemon's "shares", an array.
 Json::Value AskShares();
 

@@ -8,6 +8,7 @@
 
 #include "cli/command.h"
 #include "cli/service.h"
+#include "cli/stack_report.h"
 #include "cli/text.h"
 #include "common/error.h"
 #include "common/json.h"
@@ -84,7 +85,7 @@ std::string TableOf(const Json::Value& all, const std::map<std::string, double>&
 }
 
 void Show(const Arguments& arguments, const Console& console, Rates& rates, bool again) {
-  const Json::Value all = ServiceState();
+  const Json::Value all = AskWholeStack();
   const std::map<std::string, double> by_share = rates.Take(all["shares"]);
   if (arguments.Has("--json")) {
     console.out << JsonToString(all) << "\n" << std::flush;

@@ -415,6 +415,39 @@ TEST_F(Fileindexd, CarriesOutEachOperation) {
        {".", "new.txt", "after", "sane"},
        "elusive",
        {}},
+      {"FoldersToBeRenamed",
+       [&] {
+         Write("a/x", "ghostly"), Write("a/y", "ghostly");
+         Write("b/x", "ghostly"), Write("b/y", "ghostly");
+       },
+       {Line(EV_CREATE, In("a"), "", true), Line(EV_CREATE, In("b"), "", true)},
+       {".", "new.txt", "after", "sane", "a", "a/x", "a/y", "b", "b/x", "b/y"},
+       "ghostly",
+       {"a/x", "a/y", "b/x", "b/y"}},
+      // The making of the new folder cancels the delete, which was before the rename.
+      {"DeletedInAFolderThatIsRenamedAndMadeAnew",
+       [&] {
+         fs::remove(In("a/x"));
+         fs::rename(In("a"), In("a1"));
+         fs::create_directory(In("a"));
+       },
+       {Line(EV_DELETE, In("a/x")), Line(EV_RENAME, In("a1"), In("a"), true),
+        Line(EV_CREATE, In("a"), "", true)},
+       {".", "new.txt", "after", "sane", "a", "a1", "a1/y", "b", "b/x", "b/y"},
+       "ghostly",
+       {"a1/y", "b/x", "b/y"}},
+      {"DeletedInAFolderThatIsRenamedAndItsNamesTaken",
+       [&] {
+         fs::remove(In("b/x"));
+         fs::rename(In("b"), In("b1"));
+         fs::rename(In("a"), In("b"));
+         fs::rename(In("sane"), In("b/x"));
+       },
+       {Line(EV_DELETE, In("b/x")), Line(EV_RENAME, In("b1"), In("b"), true),
+        Line(EV_RENAME, In("b"), In("a"), true), Line(EV_RENAME, In("b/x"), In("sane"))},
+       {".", "new.txt", "after", "a1", "a1/y", "b", "b/x", "b1", "b1/y"},
+       "ghostly",
+       {"a1/y", "b1/y"}},
   };
   for (const auto& step : steps) {
     SCOPED_TRACE(step.name);

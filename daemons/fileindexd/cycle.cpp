@@ -255,7 +255,24 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
 bool Cycle::Move(const std::string& path, const std::string& path_old) {
   has_sent_ = true;
   try {
-    elastic::IndexRename(share_, path, path_old);
+    if (IsSameOrBelow(path_old, path)) {
+      elastic::IndexRename(share_, path, path_old);  // Some move to where others are.
+      return true;
+    }
+    MoveBelow(
+        id_, path, path_old, [this] { Check(); },
+        [this](const std::string& document, const FailedItem& item) {
+          if (OfOperation(item.code) != Consequence::kGoOn) {
+            throw Error(static_cast<ErrorCode>(item.code), item.reason);
+          }
+          Count(item.code, item.reason, document);
+        });
+    // Last: as long as it is at the old path, doing this again moves what is left there.
+    Json::Value requests(Json::arrayValue);
+    requests.append(MakeMove(id_, path, path_old));
+    for (const FailedItem& item : SendList(std::move(requests))) {
+      throw Error(static_cast<ErrorCode>(item.code), item.reason);
+    }
     return true;
   } catch (const Error& error) {
     if (OfOperation(error.GetErrorCode()) != Consequence::kGoOn) {

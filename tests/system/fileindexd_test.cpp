@@ -493,6 +493,30 @@ TEST_F(Fileindexd, IndexesNoMoreThanNeeded) {
   EXPECT_EQ(update(R"({"basic":true})"), 3034);
 }
 
+// Of more documents than are listed at a time, with names that stand before and behind "/".
+TEST_F(Fileindexd, MovesAFolderOfManyPages) {
+  constexpr int kFiles = 4500;
+  const std::string folders[] = {"old/", "old/a/", "old/a!/", "old/a.b/c/"};
+  for (int i = 0; i < kFiles; ++i) {
+    Write(folders[i % 4] + std::to_string(i), "");
+  }
+  Write("old.txt", "beside");
+  StartAll();
+  Paths want = All();
+  ASSERT_EQ(want.size(), kFiles + 7);
+  const Json::Value before = Stats();
+  fs::rename(In("old"), In("new"));
+  Cycle({Line(EV_RENAME, In("new"), In("old"), true)});
+  for (const std::string& path : All()) {
+    EXPECT_TRUE(path == "old.txt" || !path.starts_with("old")) << path;
+    want.erase(path.starts_with("new") ? "old" + path.substr(3) : path);
+  }
+  EXPECT_EQ(want, Paths());
+  EXPECT_EQ(Stats()["files"], before["files"]) << "documents were made anew";
+  EXPECT_EQ(Stats()["errors"], before["errors"]);
+  EXPECT_EQ(EndIndexer(SIGTERM), 0);
+}
+
 TEST_F(Fileindexd, FollowsTheSettings) {
   Write("a.txt", "alpha");
   fs::create_directories(docs_ / "new");

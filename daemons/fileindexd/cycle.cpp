@@ -77,7 +77,7 @@ void Cycle::Handle(const fileindex::OP& op) {
     return;
   }
   const std::string path = node->GetPath();
-  stats_.CountOperation();
+  stats_.CountOperation(op.op);
   try {
     Carry(op, path);
   } catch (const Error& error) {

@@ -6,6 +6,7 @@
 #include <thread>
 
 #include "daemons/kavoelasticd/engine.h"
+#include "daemons/kavoelasticd/request_stats.h"
 #include "daemons/kavoelasticd/server.h"
 #include "kavo/local/shares.h"
 
@@ -13,13 +14,17 @@ namespace {
 
 using namespace std::chrono_literals;
 
-// Commits what clients write and forget to commit, until it is stopped.
+// Commits what clients write and forget to commit, and tidies up behind them, until it is stopped.
+// Waits for nothing but a change once that is done.
 void CommitIdle(const std::stop_token& stop, vexlo::elasticd::Engine& engine) {
   std::mutex mutex;
   std::condition_variable_any stopped;
   std::unique_lock lock(mutex);
-  while (!stopped.wait_for(lock, stop, 1s, [&stop] { return stop.stop_requested(); })) {
-    engine.CommitIdle(5s);
+  while (!stop.stop_requested()) {
+    engine.AwaitChange(stop);
+    do {
+      stopped.wait_for(lock, stop, 1s, [&stop] { return stop.stop_requested(); });
+    } while (!stop.stop_requested() && engine.CommitIdle(5s));
   }
 }
 
@@ -30,7 +35,10 @@ int main(int argc, char** argv) {
       vexlo::elasticd::ElasticdOptions(), argc, argv, [](vexlo::daemon::Daemon& daemon) {
         vexlo::elasticd::Engine engine(kavo::local::Root() + "/var/lib/kavo/elastic/indexes.json");
         const std::jthread committer(CommitIdle, std::ref(engine));
-        vexlo::elasticd::Serve(
-            daemon, [&engine](const Json::Value& request) { return engine.Handle(request); });
+        vexlo::elasticd::RequestStats stats;
+        vexlo::elasticd::Serve(daemon, [&](const Json::Value& request) {
+          return stats.Answer(request,
+                              [&](const Json::Value& asked) { return engine.Handle(asked); });
+        });
       });
 }

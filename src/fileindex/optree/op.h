@@ -37,6 +37,8 @@ struct VEXLO_EXPORT OP {
   // The node is kept weakly and may be null; nothing is added to it.
   OP(std::shared_ptr<OPNode> node, FileIndexOP op, const std::string& path_old,
      const Json::Value& data);
+  // Without a path and a payload.
+  OP(std::weak_ptr<OPNode> node, FileIndexOP op);
 
   // Sets each of "document", "audio", "video", "photo" and "basic" of `data` to whether it is true
   // here (a JSON true; anything else is false) or in `data` (anything that converts to true). Other
@@ -57,6 +59,7 @@ class VEXLO_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
  public:
   // A null parent is for a root. The parent is not told: children are made by GetChild().
   OPNode(std::shared_ptr<OPNode> parent, const std::string& name);
+  OPNode(std::weak_ptr<OPNode> parent, std::string_view name);
   ~OPNode();
   OPNode(const OPNode&) = delete;
   OPNode& operator=(const OPNode&) = delete;
@@ -80,13 +83,18 @@ class VEXLO_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
  private:
   friend class OPTree;
 
-  OPNode* FindChild(std::string_view child_name);  // Null when there is none.
-  OPNode& FindOrAddChild(std::string_view child_name);
+  static constexpr uint32_t kPositionBits = (uint32_t{1} << 29) - 1;
+
+  // `hash` is the name's NameHash(). Null when there is none.
+  OPNode* FindChild(std::string_view child_name, uint64_t hash);
+  OPNode& FindOrAddChild(std::string_view child_name, uint64_t hash);
 
   std::unique_ptr<ChildIndex> index_;  // Of a node with many children; null otherwise.
-  uint32_t position_ = 0;              // In the parent's `children`, as GetChild() put it there.
-  uint32_t settled_ops_ = 0;           // That many at the front of `ops` concern no rule any more.
-  uint8_t marks_ = 0;                  // Bits of OPTree::Mark.
+  // In the parent's `children`, as GetChild() put it there. One that does not fit is a wrong one,
+  // which callers reckon with.
+  uint32_t position_ : 29 = 0;
+  uint32_t marks_ : 3 = 0;    // Bits of OPTree::Mark.
+  uint32_t settled_ops_ = 0;  // That many at the front of `ops` concern no rule any more.
 };
 
 // "[02] /volume1/s/a", "[05] OLD -> NEW" for a rename, with ", data=JSON" for a folder update.

@@ -34,6 +34,7 @@ enum FileIndexOP : int32_t {
 
 // One pending operation. Its node owns it, it refers to the node weakly.
 struct VEXLO_EXPORT OP {
+  // The node is kept weakly and may be null; nothing is added to it.
   OP(std::shared_ptr<OPNode> node, FileIndexOP op, const std::string& path_old,
      const Json::Value& data);
   // Without a path and a payload.
@@ -45,10 +46,10 @@ struct VEXLO_EXPORT OP {
   // is unchanged then.
   void MergeData(const Json::Value& incoming);
 
-  std::weak_ptr<OPNode> node;
-  FileIndexOP op;
-  std::string path_old;  // For a rename; else empty.
-  Json::Value data;      // Null unless the event carried a payload.
+  std::weak_ptr<OPNode> node;  // Lives as long as its tree.
+  FileIndexOP op;              // OP_NONE once it is cancelled.
+  std::string path_old;        // For a rename; else empty.
+  Json::Value data;            // Null unless the event carried a payload.
 };
 
 // One path component in the tree that mirrors the folders; the root's name is empty. Nodes are made
@@ -56,6 +57,7 @@ struct VEXLO_EXPORT OP {
 // trees are torn down without recursion.
 class VEXLO_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
  public:
+  // A null parent is for a root. The parent is not told: children are made by GetChild().
   OPNode(std::shared_ptr<OPNode> parent, const std::string& name);
   OPNode(std::weak_ptr<OPNode> parent, std::string_view name);
   ~OPNode();
@@ -73,8 +75,8 @@ class VEXLO_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
   // them and append to `ops`; what it appends is not visited.
   void TraverseOP(std::function<void(std::shared_ptr<OP>)> fn);
 
-  std::string name;
-  std::weak_ptr<OPNode> parent;
+  std::string name;                               // One component of a path, without "/".
+  std::weak_ptr<OPNode> parent;                   // Empty for the root.
   std::vector<std::shared_ptr<OPNode>> children;  // In order of creation.
   std::vector<std::shared_ptr<OP>> ops;           // In order of insertion.
 

@@ -34,9 +34,10 @@ class VEXLO_EXPORT OPTree {
 
   // How far BuildTree() has come, in bytes of the file and in lines.
   struct Progress {
-    uint64_t bytes_read;
-    uint64_t bytes_total;
-    uint64_t lines;
+    uint64_t bytes_read;   // From the beginning of the file. Anew from there when a folder is
+                           // renamed into itself, as the tree is then built once more.
+    uint64_t bytes_total;  // The size of the file.
+    uint64_t lines;        // Of these bytes, skipped ones too.
   };
 
   // The same, with a call every few thousand lines.
@@ -84,9 +85,10 @@ class VEXLO_EXPORT OPTree {
   uint64_t GetLineCount() const { return line_count_; }
   uint64_t GetSkippedCount() const { return skipped_count_; }
 
-  bool crashed = false;
-  std::string queue_path;
-  std::shared_ptr<OPNode> root;
+  // What was read and what came of it, for those who look into the tree or build one by hand.
+  bool crashed = false;          // Events were lost: nothing but the root's operation is delivered.
+  std::string queue_path;        // As it was given.
+  std::shared_ptr<OPNode> root;  // Never null.
   std::vector<std::shared_ptr<OP>> ops;  // All that were ever added, in order, cancelled ones too.
 
  private:

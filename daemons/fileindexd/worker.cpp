@@ -171,7 +171,7 @@ Worker::Outcome Worker::RunCycle() {
   fileindex::QueueMgr queue(queue_path);
   // Until the cycle's end tells.
   const bool may_have_unread = std::exchange(has_unread_, true);
-  const bool was_left = IsFileExist(queue_path + ".tmp");
+  const bool was_left = MayFileExist(queue_path + ".tmp");
   // Made when the snapshot has been taken: settings that were changed before a line was queued go
   // for it.
   std::optional<Cycle> made;

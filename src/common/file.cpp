@@ -60,6 +60,16 @@ bool WriteAll(int fd, std::string_view data) {
   return true;
 }
 
+// False with errno.
+bool ReadByte(int fd, off_t at, char& byte) {
+  while (true) {
+    const ssize_t count = pread(fd, &byte, 1, at);
+    if (count >= 0 || errno != EINTR) {
+      return count == 1;
+    }
+  }
+}
+
 std::string FolderOf(const std::string& path) {
   const size_t slash = path.rfind('/');
   if (slash == std::string::npos) {
@@ -91,7 +101,7 @@ const char* AppendUnderLock(const std::string& path, const std::string& lines) {
     return "open";
   }
   char last = '\n';
-  if (info.st_size > 0 && pread(fd.Get(), &last, 1, info.st_size - 1) != 1) {
+  if (info.st_size > 0 && !ReadByte(fd.Get(), info.st_size - 1, last)) {
     return "read";
   }
   // One write, so that a reader without the lock sees as little of a part as can be.
@@ -116,6 +126,12 @@ std::string RealPath(const std::string& path) {
 bool IsFileExist(const std::string& path) {
   struct stat info {};
   return lstat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode);
+}
+
+bool MayFileExist(const std::string& path) {
+  struct stat info {};
+  return lstat(path.c_str(), &info) == 0 ? S_ISREG(info.st_mode)
+                                         : errno != ENOENT && errno != ENOTDIR;
 }
 
 bool IsDirExist(const std::string& path, bool follow_link) {

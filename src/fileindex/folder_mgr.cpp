@@ -48,12 +48,12 @@ FolderMgr::FolderMgr() {
   const std::string path = kFileIndexFoldersCfgPath.Get();
   Json::Value folders;
   errno = 0;
-  // A folder that may not be searched hides the file; taking it for missing would end in a save
-  // over it. So would taking an object for a list.
+  // Taking a file for missing that only cannot be looked at would end in a save over it. So would
+  // taking an object for a list.
   VEXLO_CHECK_AT((LogSite{VEXLO_SOURCE, __LINE__, __func__,
                           "IsFileExist(kFileIndexFoldersCfgPath) && "
                           "!folders.fromFile(kFileIndexFoldersCfgPath)"}),
-                 (IsFileExist(path) || errno == EACCES) &&
+                 MayFileExist(path) &&
                      (!JsonFromFile(folders, path) || !(folders.isArray() || folders.isNull())),
                  ERR_LOAD, "Cannot load json: " + path);
   folders_.reserve(folders.size());

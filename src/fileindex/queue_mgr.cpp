@@ -45,7 +45,7 @@ bool AwaitWholeLine(LineReader& reader, QueueLine& line) {
 
 // Opens a queue for a scan; false when there is none. Throws for one that cannot be opened.
 bool IsThere(const std::string& path, std::optional<LineReader>& reader) {
-  if (!IsFileExist(path)) {
+  if (!MayFileExist(path)) {
     return false;
   }
   errno = 0;
@@ -119,11 +119,12 @@ QueueMgr::QueueMgr(const std::string& queue_path)
     : queue_path_(queue_path), queue_path_tmp_(queue_path + ".tmp") {}
 
 void QueueMgr::PrepareTmpQueue() {
-  if (!IsFileExist(queue_path_)) {
+  if (!MayFileExist(queue_path_)) {
     return;
   }
   const LockFile lock(queue_path_, /*exclusive=*/true);
-  if (IsFileExist(queue_path_tmp_)) {
+  // A snapshot that is there and cannot be seen must not be renamed over, nor deleted unread.
+  if (MayFileExist(queue_path_tmp_)) {
     return;
   }
   VEXLO_CHECK_AT((LogSite{"queue_mgr", 136, "PrepareTmpQueue",
@@ -152,7 +153,7 @@ int QueueMgr::ProcessOP(std::function<void(std::shared_ptr<OP>)> callback, bool 
   if (use_tmp) {
     PrepareTmpQueue();
   }
-  if (!IsFileExist(use_tmp ? queue_path_tmp_ : queue_path_)) {
+  if (!MayFileExist(use_tmp ? queue_path_tmp_ : queue_path_)) {
     return 0;
   }
   return static_cast<int>((use_tmp ? GetOPTreeTmp() : GetOPTree())->ProcessOP(callback));

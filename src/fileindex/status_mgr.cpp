@@ -29,12 +29,11 @@ Json::Int64 SecondsOf(int hours) {
 StatusMgr::StatusMgr() {
   const std::string path = kFileIndexStatusCfgPath.Get();
   errno = 0;
-  // A folder that may not be searched hides the file; taking it for missing would end in a save
-  // over it.
+  // Taking a file for missing that only cannot be looked at would end in a save over it.
   VEXLO_CHECK_AT((LogSite{VEXLO_SOURCE, __LINE__, __func__,
                           "IsFileExist(kFileIndexStatusCfgPath) && "
                           "!data_.fromFile(kFileIndexStatusCfgPath)"}),
-                 (IsFileExist(path) || errno == EACCES) && !JsonFromFile(data_, path), ERR_LOAD,
+                 MayFileExist(path) && !JsonFromFile(data_, path), ERR_LOAD,
                  "Cannot load json: " + path);
   if (data_.isNull()) {
     data_ = Json::objectValue;

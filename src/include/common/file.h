@@ -19,6 +19,11 @@ VEXLO_EXPORT std::string RealPath(const std::string& path);
 // True for a regular file itself: not for a directory, a device or a symbolic link, even to a file.
 VEXLO_EXPORT bool IsFileExist(const std::string& path);
 
+// False when there is certainly no regular file. True, too, when that cannot be told, as the disk
+// or a folder's permissions refuse the answer: for what would be lost if it were taken for missing.
+// Whoever opens the file then learns why.
+VEXLO_EXPORT bool MayFileExist(const std::string& path);
+
 // True for a directory. A symbolic link counts only with `follow_link`, when its text names a
 // directory in turn; the text is used as it stands, so a relative one is looked up from the working
 // directory. A chain of over 40 links is no directory.

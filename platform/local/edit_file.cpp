@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <new>
 
 namespace kavo::local {
 namespace {
@@ -52,6 +53,12 @@ bool IsNormalised(std::string_view path) {
     path.remove_prefix(component.size());
   }
   return true;
+}
+
+void RethrowNoMemory(const std::exception& error) {
+  if (strstr(error.what(), "allocate") != nullptr) {
+    throw std::bad_alloc();
+  }
 }
 
 std::string FolderOf(const std::string& file) {

@@ -2,6 +2,7 @@
 #ifndef PLATFORM_LOCAL_EDIT_FILE_H_
 #define PLATFORM_LOCAL_EDIT_FILE_H_
 
+#include <exception>
 #include <stdexcept>
 #include <string>
 #include <string_view>
@@ -19,6 +20,10 @@ class FileError : public std::runtime_error {
 
 // True when the path is absolute and each component is a name. A NUL is one of a name's bytes here.
 bool IsNormalised(std::string_view path);
+
+// For what JSON's reader throws, which is the same for a text that is nested too deep and for want
+// of memory: throws std::bad_alloc for the latter, which says nothing about the text.
+void RethrowNoMemory(const std::exception& error);
 
 // Without the slash that ends it; "." for the working directory.
 std::string FolderOf(const std::string& file);

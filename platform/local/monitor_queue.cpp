@@ -148,8 +148,8 @@ Json::Value Parse(const std::string& text) {
   bool is_json = false;
   try {
     is_json = reader->parse(text.data(), text.data() + text.size(), &root, &errors);
-  } catch (const Json::Exception&) {
-    // Nested too deep.
+  } catch (const Json::Exception& error) {
+    RethrowNoMemory(error);  // Else it is nested too deep.
   }
   Require(is_json, "not JSON");
   return root;
@@ -197,6 +197,7 @@ std::string Serialise(const std::vector<RegisteredQueue>& queues) {
   builder["emitUTF8"] = true;  // Every other form replaces bytes that are not UTF-8.
   const std::unique_ptr<Json::StreamWriter> writer(builder.newStreamWriter());
   std::ostringstream out;
+  out.exceptions(std::ios::badbit);  // Or want of memory would end the text early.
   out << "{\"queues\": [";
   const char* separator = "\n  ";
   for (const RegisteredQueue& queue : queues) {

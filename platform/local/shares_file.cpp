@@ -153,7 +153,8 @@ class Parser {
     bool is_json = false;
     try {
       is_json = reader->parse(text_.data(), text_.data() + text_.size(), &root, &errors);
-    } catch (const Json::Exception&) {
+    } catch (const Json::Exception& error) {
+      RethrowNoMemory(error);
       throw SharesError(file_ + ": not JSON: nested too deep");
     }
     if (!is_json) {
@@ -239,6 +240,7 @@ std::string Serialise(const std::vector<Share>& shares) {
   builder["emitUTF8"] = true;  // Every other form replaces bytes that are not UTF-8.
   const std::unique_ptr<Json::StreamWriter> writer(builder.newStreamWriter());
   std::ostringstream out;
+  out.exceptions(std::ios::badbit);  // Or want of memory would end the text early.
   out << "{\n  \"shares\": [";
   const char* separator = "\n    {\"name\": ";
   for (const Share& share : shares) {

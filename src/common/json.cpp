@@ -5,8 +5,10 @@
 
 #include <algorithm>
 #include <cstdio>
+#include <cstring>
 #include <deque>
 #include <memory>
+#include <new>
 #include <ostream>
 #include <streambuf>
 #include <type_traits>
@@ -18,6 +20,14 @@
 
 namespace vexlo {
 namespace {
+
+// The reader throws the same for a text that is nested too deep and for want of memory, which says
+// nothing about the text.
+void RethrowNoMemory(const Json::Exception& error) {
+  if (strstr(error.what(), "allocate") != nullptr) {
+    throw std::bad_alloc();
+  }
+}
 
 Json::CharReader* NewReader() {
   Json::CharReaderBuilder builder;
@@ -90,6 +100,7 @@ Json::StreamWriter* NewWriter(const char* indentation) {
 std::string Write(const Json::Value& value, Json::StreamWriter& writer) {
   BlockBuffer buffer;
   std::ostream stream(&buffer);
+  stream.exceptions(std::ios::badbit);  // Or want of memory would end the text early.
   writer.write(value, &stream);
   return buffer.Take();
 }
@@ -99,7 +110,8 @@ std::string Write(const Json::Value& value, Json::StreamWriter& writer) {
 bool JsonFromString(Json::Value& value, std::string_view text) {
   try {
     return Reader().parse(text.data(), text.data() + text.size(), &value, nullptr);
-  } catch (const Json::Exception&) {
+  } catch (const Json::Exception& error) {
+    RethrowNoMemory(error);
     return false;  // Nested too deep.
   }
 }
@@ -112,6 +124,7 @@ std::string JsonFault(std::string_view text) {
       return "";
     }
   } catch (const Json::Exception& error) {
+    RethrowNoMemory(error);
     return error.what();
   }
   // The first of several faults, as "* Line 3, Column 9\n  Missing ...\n".

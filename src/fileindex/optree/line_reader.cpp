@@ -5,6 +5,7 @@
 #include <sys/sysmacros.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 
@@ -35,7 +36,6 @@ LineReader::LineReader(const std::string& path)
     return;
   }
   file_bytes_ = static_cast<uint64_t>(info.st_size);
-  buffer_.resize(kFirstBufferBytes);
 }
 
 LineReader::~LineReader() {
@@ -114,7 +114,8 @@ bool LineReader::Refill() {
     begin_ = 0;
   }
   if (end_ == buffer_.size()) {
-    buffer_.resize(buffer_.size() * 2);  // A long line; kMaxQueueLineBytes bounds it.
+    // Twice as much for a long line; kMaxQueueLineBytes bounds it.
+    buffer_.resize(std::max(buffer_.size() * 2, kFirstBufferBytes));
   }
   while (true) {
     const ssize_t count = read(fd_, buffer_.data() + end_, buffer_.size() - end_);

@@ -1,6 +1,8 @@
 #include "fileindex/optree/op.h"
 
 #include <cstdio>
+#include <iterator>
+#include <new>
 #include <ostream>
 #include <utility>
 
@@ -71,10 +73,14 @@ OPNode::~OPNode() {
     const std::shared_ptr<OPNode> node = std::move(doomed.back());
     doomed.pop_back();
     if (node.use_count() == 1) {
-      for (std::shared_ptr<OPNode>& child : node->children) {
-        doomed.push_back(std::move(child));
+      try {
+        doomed.insert(doomed.end(), std::make_move_iterator(node->children.begin()),
+                      std::make_move_iterator(node->children.end()));
+        node->children.clear();
+      } catch (const std::bad_alloc&) {
+        // They go with the node. One for one they take the place of what was taken off the list, so
+        // stack is needed where paths fork only.
       }
-      node->children.clear();
     }
   }
 }

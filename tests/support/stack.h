@@ -74,12 +74,20 @@ class Stack {
   Stack(const Stack&) = delete;
   Stack& operator=(const Stack&) = delete;
 
-  // Returns when the daemon answers.
-  void Start(const std::string& name) {
-    const std::string command = kDaemonPrograms.at(name) + " " + arguments_[name] + " >&2";
+  // Returns when the daemon answers, or has ended. `before` stands before its command.
+  void Start(const std::string& name, const std::string& before = "") {
+    const std::string command = before + kDaemonPrograms.at(name) + " " + arguments_[name] + " >&2";
     programs_.emplace(
         name, std::make_unique<Program>("exec 2>>'" + root_ / ("logs/" + name) + "'", command));
-    EXPECT_TRUE(Await([&] { return IsAnswering(name); })) << name << "\n" << Logs();
+    EXPECT_TRUE(Await([&] { return IsAnswering(name) || HasEnded(name); })) << name << "\n"
+                                                                            << Logs();
+    EXPECT_TRUE(!before.empty() || !HasEnded(name)) << name << "\n" << Logs();
+  }
+  // Whether it has ended by itself; End() has its status then.
+  bool HasEnded(const std::string& name) const {
+    siginfo_t info{};
+    const auto pid = static_cast<id_t>(programs_.at(name)->pid);
+    return waitid(P_PID, pid, &info, WEXITED | WNOHANG | WNOWAIT) == 0 && info.si_pid != 0;
   }
   void Signal(const std::string& name, int signal) { kill(programs_.at(name)->pid, signal); }
   // The exit status, or 128 and the signal.

@@ -9,6 +9,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "faults/every_fault.h"
 #include "kavo/monitor_queue.h"
 #include "support/index_listing.h"
 #include "support/random_tree.h"
@@ -121,6 +122,45 @@ TEST(Stack, LosesNothingToKills) {
       }
     }
     ExpectIndexed(stack, tree);
+  });
+}
+
+// A daemon whose Nth call fails does its work all the same, or ends with an error and is started
+// anew.
+TEST(Stack, LosesNothingToFaults) {
+  if (*FAIL_NTH_MODULE == '\0') {
+    GTEST_SKIP() << "the module takes the place of functions that the sanitizers need themselves";
+  }
+  Stack stack(kRoot);
+  RecordHistory(stack);
+  const std::vector<std::string> names = {"fileindexd", "kavoelasticd"};
+  ForSeeds([&](unsigned seed) {
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    Empty(stack.In());
+    Empty(stack.Out());
+    std::filesystem::resize_file(HistoryFile(), 0);
+    RandomTree tree(stack.In(), stack.Out(), seed);
+    // Not the first: for a full disk the index daemon waits a minute.
+    const FaultKind& kind = kFaultKinds[1 + tree.Below(std::size(kFaultKinds) - 1)];
+    const std::string& name = names[tree.Below(static_cast<unsigned>(names.size()))];
+    const unsigned at = 1 + tree.Below(kind.error == ENOMEM ? 30000 : 300);
+    SCOPED_TRACE(name + ", " + kind.name + ", call " + std::to_string(at));
+    EXPECT_EQ(stack.End(name, SIGTERM), 0);
+    stack.Start(name, "env LD_PRELOAD=" FAIL_NTH_MODULE " FAIL_CALLS=" + std::string(kind.calls) +
+                          " FAIL_ERROR=" + std::to_string(kind.error) +
+                          " FAIL_AT=" + std::to_string(at) + " ");
+    for (int i = 0; i < kChanges / 4; ++i) {
+      tree.Change();
+      usleep(tree.Below(20000));
+    }
+    // Whoever looks after the daemons starts anew what has ended.
+    if (stack.HasEnded(name)) {
+      EXPECT_LT(stack.End(name, 0), 128) << stack.Logs();
+      stack.Start(name);
+    }
+    ExpectIndexed(stack, tree);
+    EXPECT_LT(stack.End(name, SIGTERM), 128) << stack.Logs();
+    stack.Start(name);
   });
 }
 

@@ -1,6 +1,7 @@
 #include "daemons/common/run_daemon.h"
 
 #include <fcntl.h>
+#include <linux/capability.h>
 #include <poll.h>
 #include <sys/eventfd.h>
 #include <sys/file.h>
@@ -20,9 +21,13 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <iterator>
 #include <stdexcept>
 #include <system_error>
 #include <thread>
+
+#include "daemons/common/sandbox.h"
+#include "kavo/local/shares.h"
 
 namespace vexlo::daemon {
 namespace {
@@ -192,6 +197,41 @@ bool IsJournal(int fd) {
          std::to_string(there.st_dev) + ":" + std::to_string(there.st_ino) == stream;
 }
 
+// The folders below the root that daemons write to.
+constexpr const char* kStateFolders[] = {
+    "/tmp",
+    "/var/lib/kavo",
+    "/var/lib/kavo/elastic",
+    "/var/lib/kavo/evnotify",
+    "/var/lib/kavo/extract",
+    "/var/lib/kavo/fileindex",
+    "/var/lib/kavo/fileindex/db",
+    "/var/lib/kavo/fileindex/queue",
+    "/var/lib/kavo/fileindexd",
+    "/var/packages/Vexlo/etc",
+    "/var/run",
+};
+
+// Whether root can write there by owning it. A root folder of an ordinary user's is another matter.
+bool OwnsStateFolders() {
+  return std::all_of(std::begin(kStateFolders), std::end(kStateFolders), [](const char* folder) {
+    struct stat info {};
+    return stat((kavo::local::Root() + folder).c_str(), &info) != 0 || info.st_uid == geteuid();
+  });
+}
+
+void GiveUpRights(std::vector<int> capabilities) {
+  if (geteuid() == 0 && !OwnsStateFolders()) {
+    syslog(LOG_NOTICE,
+           "the folders below '%s' are another user's: the right to write to any file is kept",
+           kavo::local::Root().c_str());
+    capabilities.push_back(CAP_DAC_OVERRIDE);
+  }
+  if (!KeepCapabilities(capabilities) || (kCanBeConfined && !ForbidAdministration())) {
+    Throw("rights cannot be given up");
+  }
+}
+
 void OpenLog(const DaemonOptions& options) {
   openlog(options.name.c_str(), LOG_PID | (IsJournal(STDERR_FILENO) ? 0 : LOG_PERROR), LOG_DAEMON);
 }
@@ -233,6 +273,7 @@ int RunDaemon(const DaemonOptions& options, int argc, char** argv,
     }
     AllowManyFiles();
     const PidFile pid_file(options.pid_file);
+    GiveUpRights(options.capabilities);
     Daemon daemon(options);
     const SignalThread signals(options, daemon.StopFd());
     work(daemon);

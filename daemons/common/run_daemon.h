@@ -23,6 +23,9 @@ struct DaemonOptions {
   std::string pid_file;  // Its folder is made when it is missing.
   // Shown behind the name by --help, and by a command line that `arguments` refuses.
   std::string usage;
+  // Of a superuser's capabilities those (CAP_...) that the work needs; it keeps no others. Files of
+  // its own it needs none for.
+  std::vector<int> capabilities;
   // Takes the command line, less the program's name and --help; false for one that is wrong. A path
   // among it must be made absolute here, as the work runs in "/". Unset, no argument is right.
   std::function<bool(const std::vector<std::string>&)> arguments;
@@ -56,6 +59,10 @@ class Daemon {
 // Runs work(daemon) on the calling thread, in the foreground, and returns the exit status. Called
 // once, by main(), before there are other threads: SIGTERM, SIGINT and SIGHUP stay blocked in all
 // of them, and one thread waits for them. SIGPIPE is ignored.
+//
+// Before the work it gives up the capabilities that are not wanted and what ForbidAdministration()
+// has. CAP_DAC_OVERRIDE stays, and the log says so, where a superuser runs it on folders of state
+// that are another user's.
 //
 // While it runs it holds an flock on the pid file; where another process does, it says so and
 // returns kAlreadyRunning. So whatever belongs to a daemon of this name (its socket, its files) is

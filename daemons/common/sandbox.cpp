@@ -95,6 +95,62 @@ constexpr Denied kDenied[] = {
     {SCMP_SYS(sched_setaffinity), EPERM},
 };
 
+// Of the machine, or of other processes.
+constexpr int kAdministration[] = {
+    SCMP_SYS(acct),
+    SCMP_SYS(add_key),
+    SCMP_SYS(adjtimex),
+    SCMP_SYS(bpf),
+    SCMP_SYS(chroot),
+    SCMP_SYS(clock_adjtime),
+    SCMP_SYS(clock_settime),
+    SCMP_SYS(delete_module),
+    SCMP_SYS(finit_module),
+    SCMP_SYS(fsconfig),
+    SCMP_SYS(fsmount),
+    SCMP_SYS(fsopen),
+    SCMP_SYS(fspick),
+    SCMP_SYS(init_module),
+    SCMP_SYS(ioperm),
+    SCMP_SYS(iopl),
+    SCMP_SYS(io_uring_setup),
+    SCMP_SYS(kcmp),
+    SCMP_SYS(kexec_file_load),
+    SCMP_SYS(kexec_load),
+    SCMP_SYS(keyctl),
+    SCMP_SYS(lookup_dcookie),
+    SCMP_SYS(mknod),
+    SCMP_SYS(mknodat),
+    SCMP_SYS(mount),
+    SCMP_SYS(mount_setattr),
+    SCMP_SYS(move_mount),
+    SCMP_SYS(nfsservctl),
+    SCMP_SYS(open_tree),
+    SCMP_SYS(perf_event_open),
+    SCMP_SYS(personality),
+    SCMP_SYS(pidfd_getfd),
+    SCMP_SYS(pivot_root),
+    SCMP_SYS(process_vm_readv),
+    SCMP_SYS(process_vm_writev),
+    SCMP_SYS(ptrace),
+    SCMP_SYS(quotactl),
+    SCMP_SYS(quotactl_fd),
+    SCMP_SYS(reboot),
+    SCMP_SYS(request_key),
+    SCMP_SYS(setdomainname),
+    SCMP_SYS(sethostname),
+    SCMP_SYS(setns),
+    SCMP_SYS(settimeofday),
+    SCMP_SYS(swapoff),
+    SCMP_SYS(swapon),
+    SCMP_SYS(syslog),
+    SCMP_SYS(umount),
+    SCMP_SYS(umount2),
+    SCMP_SYS(unshare),
+    SCMP_SYS(userfaultfd),
+    SCMP_SYS(vhangup),
+};
+
 using Filter = std::unique_ptr<void, decltype(&seccomp_release)>;
 using Comparison = struct scmp_arg_cmp;
 
@@ -122,6 +178,12 @@ Comparison MaskedIs(unsigned argument, uint64_t mask, uint64_t value) {
 }
 Comparison Is(unsigned argument, int value) {
   return {argument, SCMP_CMP_EQ, static_cast<unsigned>(value), 0};
+}
+
+bool Load(const Filter& filter, const Rules& rules) {
+  const int error = rules.Error() != 0 ? rules.Error() : seccomp_load(filter.get());
+  errno = -error;
+  return error == 0;
 }
 
 void AddMemory(Rules& rules) {
@@ -206,6 +268,19 @@ bool KeepCapabilities(const std::vector<int>& kept) {
   return cap_set_proc(left.get()) == 0;
 }
 
+bool ForbidAdministration() {
+  const Filter filter(seccomp_init(SCMP_ACT_ALLOW), seccomp_release);
+  if (filter == nullptr) {
+    errno = ENOMEM;
+    return false;
+  }
+  Rules rules(filter.get());
+  for (const int call : kAdministration) {
+    rules.Add(SCMP_ACT_ERRNO(EPERM), call);
+  }
+  return Load(filter, rules);
+}
+
 PathRule ForbidPaths(const std::vector<std::string>& readable) {
   const auto version =
       syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION);
@@ -246,9 +321,7 @@ bool AllowReadingOnly(int socket, bool may_open) {
   AddMemory(rules);
   AddFiles(rules, may_open);
   AddOutput(rules, socket);
-  const int error = rules.Error() != 0 ? rules.Error() : seccomp_load(filter.get());
-  errno = -error;
-  return error == 0;
+  return Load(filter, rules);
 }
 
 }  // namespace vexlo::daemon

@@ -36,6 +36,11 @@ bool BecomeAccount(const Account& account);
 // program it starts could win by being set-uid or by its file's capabilities. False with errno.
 bool KeepCapabilities(const std::vector<int>& kept);
 
+// Refuses (EPERM) the system calls that administer a machine whoever makes them: mounts, modules,
+// other kernels, clocks, quotas, tracing, namespaces, keys. No service of this kind has a use for
+// them, and CAP_SYS_ADMIN, where one must keep it, comes to less. False with errno.
+bool ForbidAdministration();
+
 // Whether the kernel lets the process be confined by path.
 enum class PathRule { kInForce, kNotThere, kFailed };
 

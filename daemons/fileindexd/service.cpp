@@ -1,5 +1,7 @@
 #include "daemons/fileindexd/service.h"
 
+#include <linux/capability.h>
+
 #include <charconv>
 #include <cstdio>
 #include <utility>
@@ -272,6 +274,7 @@ void Serve(daemon::Daemon& daemon, const ServiceOptions& options) {
 daemon::DaemonOptions FileindexdOptions(ServiceOptions* options) {
   daemon::DaemonOptions daemon_options;
   daemon_options.name = "fileindexd";
+  daemon_options.capabilities = {CAP_DAC_READ_SEARCH};
   daemon_options.pid_file = kPidFile.Get();
   daemon_options.usage =
       "[--cycle MILLISECONDS]\n\nKeeps the indexes of the shares up to date with what is queued "

@@ -1,6 +1,7 @@
 #include "daemons/kavocontentextractd/service.h"
 
 #include <fcntl.h>
+#include <linux/capability.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -169,6 +170,7 @@ Json::Value Service::Stats() {
 daemon::DaemonOptions ExtractdOptions(Settings* settings) {
   daemon::DaemonOptions options;
   options.name = "kavocontentextractd";
+  options.capabilities = {CAP_KILL, CAP_SETGID, CAP_SETUID};  // For workers of another user.
   options.pid_file = kavo::local::Root() + "/var/run/kavocontentextractd.pid";
   options.usage =
       "[--deadline SECONDS] [--memory MIB] [--workers N]\n\n"

@@ -3,8 +3,10 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <netinet/in.h>
+#include <sched.h>
 #include <sys/capability.h>
 #include <sys/mman.h>
+#include <sys/mount.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
@@ -157,6 +159,27 @@ TEST(Sandbox, KeepsTheCapabilitiesOfTheList) {
   };
   for (const auto& row : rows) {
     EXPECT_EQ(InChild([&] { return KeepCapabilities(row.kept) && row.deed(); }), row.outcome)
+        << row.name;
+  }
+}
+
+TEST(Sandbox, RefusesAdministration) {
+  if (!kCanBeConfined || geteuid() != 0) {
+    GTEST_SKIP() << "a sanitizer's run-time traces processes, and only root may administer";
+  }
+  const TempFolder folder;
+  const struct {
+    const char* name;
+    std::function<bool()> deed;
+    int outcome;
+  } rows[] = {
+      {"changes the root", [&] { return chroot(folder.Path().c_str()) == 0; }, EPERM},
+      {"mounts", [&] { return mount("", folder.Path().c_str(), "tmpfs", 0, "") == 0; }, EPERM},
+      {"leaves a namespace", [] { return unshare(CLONE_NEWNET) == 0; }, EPERM},
+      {"opens", [&] { return Opens(folder / "new", O_RDWR | O_CREAT); }, 0},
+  };
+  for (const auto& row : rows) {
+    EXPECT_EQ(InChild([&] { return ForbidAdministration() && row.deed(); }), row.outcome)
         << row.name;
   }
 }

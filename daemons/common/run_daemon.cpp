@@ -197,6 +197,7 @@ bool IsJournal(int fd) {
          std::to_string(there.st_dev) + ":" + std::to_string(there.st_ino) == stream;
 }
 
+constexpr char kStateFolder[] = "/var/lib/kavo";
 // The folders below the root that daemons write to.
 constexpr const char* kStateFolders[] = {
     "/tmp",
@@ -218,6 +219,18 @@ bool OwnsStateFolders() {
     struct stat info {};
     return stat((kavo::local::Root() + folder).c_str(), &info) != 0 || info.st_uid == geteuid();
   });
+}
+
+// What is in there tells of everybody's files. The sockets, which others may see, are not.
+void CloseStateFolder() {
+  const std::string folder = kavo::local::Root() + kStateFolder;
+  std::error_code ignored;
+  std::filesystem::create_directories(folder, ignored);
+  struct stat info {};
+  if (stat(folder.c_str(), &info) == 0 && info.st_uid == geteuid() && (info.st_mode & 077U) != 0 &&
+      chmod(folder.c_str(), info.st_mode & 07700U) == 0) {
+    syslog(LOG_NOTICE, "closed to other users: %s", folder.c_str());
+  }
 }
 
 void GiveUpRights(std::vector<int> capabilities) {
@@ -273,6 +286,7 @@ int RunDaemon(const DaemonOptions& options, int argc, char** argv,
     }
     AllowManyFiles();
     const PidFile pid_file(options.pid_file);
+    CloseStateFolder();
     GiveUpRights(options.capabilities);
     Daemon daemon(options);
     const SignalThread signals(options, daemon.StopFd());

@@ -64,6 +64,9 @@ class Daemon {
 // has. CAP_DAC_OVERRIDE stays, and the log says so, where a superuser runs it on folders of state
 // that are another user's.
 //
+// The folder of all daemons' state, "/var/lib/kavo" below the root, is made when it is missing, and
+// closed to other users.
+//
 // While it runs it holds an flock on the pid file; where another process does, it says so and
 // returns kAlreadyRunning. So whatever belongs to a daemon of this name (its socket, its files) is
 // the work's alone. The file is removed at the end; one that a killed daemon left is taken over.

@@ -255,9 +255,7 @@ void Serve(daemon::Daemon& daemon, const ServiceOptions& options) {
   };
   // A client waits for an answer for ever, also where its connection is closed.
   server_options.refusal = [](daemon::Refusal refusal) {
-    return JsonToString(Refusal(refusal == daemon::Refusal::kTooLong
-                                    ? "the command is too long"
-                                    : "the command made the daemon fail"));
+    return JsonToString(Refusal(RefusalSentence(refusal, "the daemon")));
   };
   server_options.workers = 2;
   server_options.max_request_bytes = kMostCommandBytes;

@@ -225,9 +225,7 @@ void Serve(daemon::Daemon& daemon, const Settings& settings, const std::string& 
   };
   server_options.stopping = [&service] { service.Stop(); };
   server_options.refusal = [](daemon::Refusal refusal) {
-    return Refusal(reason::kUnavailable, refusal == daemon::Refusal::kTooLong
-                                             ? "the request is too long"
-                                             : "the request made the daemon fail");
+    return Refusal(reason::kUnavailable, RefusalSentence(refusal, "the daemon"));
   };
   daemon::FrameServer server(std::move(server_options));
   daemon.Ready();

@@ -13,7 +13,7 @@ namespace {
 std::string SocketPath() { return kavo::local::Root() + "/var/run/kavoelasticd.sock"; }
 
 // Never one of the codes that make callers wait and try again: none of these passes by waiting.
-std::string ErrorText(ErrorCode code, const char* message) {
+std::string ErrorText(ErrorCode code, const std::string& message) {
   Json::Value reply(Json::objectValue);
   reply["success"] = false;
   reply["error"]["code"] = static_cast<int>(code);
@@ -22,9 +22,8 @@ std::string ErrorText(ErrorCode code, const char* message) {
 }
 
 std::string RefusalText(daemon::Refusal refusal) {
-  return refusal == daemon::Refusal::kTooLong
-             ? ErrorText(ERR_BAD_PARAMETER, "the request is too long")
-             : ErrorText(ERR_INTERNAL, "the request made the engine fail");
+  return ErrorText(refusal == daemon::Refusal::kHandlerFailed ? ERR_INTERNAL : ERR_BAD_PARAMETER,
+                   RefusalSentence(refusal, "the engine"));
 }
 
 }  // namespace

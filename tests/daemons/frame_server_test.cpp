@@ -1,12 +1,15 @@
 #include "daemons/common/frame_server.h"
 
 #include <fcntl.h>
+#include <grp.h>
 #include <signal.h>
 #include <sys/eventfd.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 
 #include <filesystem>
+#include <functional>
 #include <future>
 #include <optional>
 
@@ -117,6 +120,67 @@ TEST_F(FrameServerTest, GivesTheHandlerTheFileThatComesWithARequest) {
     EXPECT_EQ(reply, request.size() == 4 ? "cont" : "content");
   }
   EXPECT_EQ(Ask("no file"), "none");
+}
+
+// What a process of that user hears.
+std::string AskAs(uid_t uid, const std::function<std::string()>& ask) {
+  int ends[2];
+  EXPECT_EQ(pipe2(ends, O_CLOEXEC), 0);
+  const pid_t child = fork();
+  if (child == 0) {
+    const gid_t groups[] = {uid + 1, uid + 2};
+    const bool is_other =
+        setgroups(2, groups) == 0 && setresgid(uid, uid, uid) == 0 && setresuid(uid, uid, uid) == 0;
+    const std::string heard = is_other ? ask() : "<still the same user>";
+    _exit(write(ends[1], heard.data(), heard.size()) < 0 ? 1 : 0);
+  }
+  close(ends[1]);
+  const RawClient output(ends[0]);
+  std::string heard(4096, '\0');
+  const ssize_t count = read(output.fd, heard.data(), heard.size());
+  heard.resize(count > 0 ? static_cast<size_t>(count) : 0);
+  int status = 0;
+  waitpid(child, &status, 0);
+  return heard;
+}
+
+TEST_F(FrameServerTest, AsksWhoAsks) {
+  if (geteuid() != 0) {
+    GTEST_SKIP() << "only root can start processes of other users";
+  }
+  constexpr uid_t kGuest = 4711;
+  constexpr uid_t kStranger = 4811;
+  ASSERT_EQ(chmod(folder_.Path().c_str(), 0755), 0);
+  options_.mode = 0666;
+  options_.handler = nullptr;
+  options_.max_connections_per_user = 3;
+  options_.admits = [](const Peer& peer) { return peer.uid == kGuest; };
+  options_.peer_handler = [](const std::string& request, const Peer& peer) {
+    std::string text = request + " " + std::to_string(peer.uid) + " " + std::to_string(peer.gid);
+    for (const gid_t group : peer.groups) {
+      text += "+" + std::to_string(group);
+    }
+    return text;
+  };
+  Start();
+  const auto ask = [this] { return Ask("who"); };
+  const std::string refused = "refused " + std::to_string(static_cast<int>(Refusal::kNotAdmitted));
+  EXPECT_TRUE(Ask("who").starts_with("who 0 0"));
+  EXPECT_EQ(AskAs(kGuest, ask), "who 4711 4711+4712+4713");
+  EXPECT_EQ(AskAs(kStranger, ask), refused);
+  EXPECT_EQ(AskAs(kStranger, [this] { return Ask(std::string(100000, 'x')); }), refused)
+      << "little is read of what will be refused";
+  const auto ask_beside = [&](size_t others) {
+    std::vector<RawClient> held;
+    held.reserve(others);
+    for (size_t i = 0; i < others; ++i) {
+      held.emplace_back(path_);
+    }
+    return Ask("who");
+  };
+  EXPECT_EQ(AskAs(kGuest, [&] { return ask_beside(2); }), "who 4711 4711+4712+4713");
+  EXPECT_EQ(AskAs(kGuest, [&] { return ask_beside(3); }), "<failed>");
+  EXPECT_TRUE(Ask("who").starts_with("who 0 0")) << "one user does not shut out another";
 }
 
 TEST_F(FrameServerTest, StalledConnectionsCostNoThread) {

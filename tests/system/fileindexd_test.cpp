@@ -630,7 +630,7 @@ TEST_F(Fileindexd, AnswersEveryCommandAtOnce) {
   }
   for (const uint64_t length : {uint64_t{1} << 62, UINT64_MAX, uint64_t{100} << 20}) {
     const RawClient client(SocketPath(), LengthBytes(length) + "{");
-    EXPECT_NE(client.Receive(100).find("the command is too long"), std::string::npos) << length;
+    EXPECT_NE(client.Receive(100).find("the request is too long"), std::string::npos) << length;
   }
   ASSERT_TRUE(AwaitState("idle"));
   Program tool("exec 2>&1", FILEINDEX_PROGRAM " status --all");

@@ -56,6 +56,9 @@ TEST(Rights, DaemonsOfRootIndexEverybodysFilesWithFewCapabilities) {
     }
     EXPECT_EQ(StatusLine(pid, "NoNewPrivs"), "1") << row.name;
   }
+  struct stat state {};
+  ASSERT_EQ(stat((kRoot / "var/lib/kavo").c_str(), &state), 0);
+  EXPECT_EQ(state.st_mode & 0777U, 0700U) << "state tells of everybody's files";
   const std::string folder = stack.In() + "/private";
   std::filesystem::create_directory(folder);
   WriteText(folder / std::filesystem::path("plain.txt"), "tokenofplain");

@@ -14,6 +14,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <climits>
 #include <csignal>
 #include <cstddef>
 #include <cstdint>
@@ -117,6 +118,16 @@ void Notify(const std::string& state) {
   }
 }
 
+// Half of what the service manager lets pass without a sign of life; -1 where it wants none.
+int WatchdogMilliseconds() {
+  // NOLINTNEXTLINE(concurrency-mt-unsafe): nobody sets the environment.
+  const char* const microseconds = getenv("WATCHDOG_USEC");
+  const char* const pid = getenv("WATCHDOG_PID");  // NOLINT(concurrency-mt-unsafe)
+  const bool is_meant = pid == nullptr || pid == std::to_string(getpid());
+  const long long count = microseconds == nullptr || !is_meant ? 0 : atoll(microseconds);
+  return count <= 0 ? -1 : static_cast<int>(std::clamp<long long>(count / 2000, 1, INT_MAX));
+}
+
 // Takes the signals out of every thread's way, and waits for them on one of its own.
 class SignalThread {
  public:
@@ -146,13 +157,16 @@ class SignalThread {
 
  private:
   void Wait() {
+    const int pause = WatchdogMilliseconds();
     struct pollfd fds[] = {{signal_fd_.Get(), POLLIN, 0}, {quit_.Get(), POLLIN, 0}};
     while (fds[1].revents == 0) {
       struct signalfd_siginfo info {};
       while (read(signal_fd_.Get(), &info, sizeof(info)) == static_cast<ssize_t>(sizeof(info))) {
         Take(static_cast<int>(info.ssi_signo));
       }
-      poll(fds, 2, -1);
+      if (poll(fds, 2, pause) == 0) {
+        Notify("WATCHDOG=1");
+      }
     }
   }
 
@@ -197,6 +211,9 @@ bool IsJournal(int fd) {
          std::to_string(there.st_dev) + ":" + std::to_string(there.st_ino) == stream;
 }
 
+// With what is below them.
+constexpr const char* kWrittenFolders[] = {"/tmp", "/var/lib/kavo", "/var/packages/Vexlo/etc",
+                                           "/var/run"};
 constexpr char kStateFolder[] = "/var/lib/kavo";
 // The folders below the root that daemons write to.
 constexpr const char* kStateFolders[] = {
@@ -233,14 +250,28 @@ void CloseStateFolder() {
   }
 }
 
-void GiveUpRights(std::vector<int> capabilities) {
+bool KeepToState() {
+  std::vector<std::string> folders;
+  folders.reserve(std::size(kWrittenFolders) + 1);
+  for (const char* const folder : kWrittenFolders) {
+    folders.push_back(kavo::local::Root() + folder);
+    std::error_code ignored;
+    std::filesystem::create_directories(folders.back(), ignored);
+  }
+  folders.emplace_back("/dev/null");  // What programs are started with.
+  return ForbidWriting(folders) != PathRule::kFailed;
+}
+
+void GiveUpRights(const DaemonOptions& options) {
+  std::vector<int> capabilities = options.capabilities;
   if (geteuid() == 0 && !OwnsStateFolders()) {
     syslog(LOG_NOTICE,
            "the folders below '%s' are another user's: the right to write to any file is kept",
            kavo::local::Root().c_str());
     capabilities.push_back(CAP_DAC_OVERRIDE);
   }
-  if (!KeepCapabilities(capabilities) || (kCanBeConfined && !ForbidAdministration())) {
+  if (!KeepCapabilities(capabilities) || (kCanBeConfined && !ForbidAdministration()) ||
+      (kCanBeConfined && options.keeps_to_state && !KeepToState())) {
     Throw("rights cannot be given up");
   }
 }
@@ -287,7 +318,7 @@ int RunDaemon(const DaemonOptions& options, int argc, char** argv,
     AllowManyFiles();
     const PidFile pid_file(options.pid_file);
     CloseStateFolder();
-    GiveUpRights(options.capabilities);
+    GiveUpRights(options);
     Daemon daemon(options);
     const SignalThread signals(options, daemon.StopFd());
     work(daemon);

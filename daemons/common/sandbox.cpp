@@ -8,6 +8,7 @@
 #include <sys/capability.h>
 #include <sys/mman.h>
 #include <sys/prctl.h>
+#include <sys/stat.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -44,14 +45,51 @@ struct RuleSet {
   uint64_t scopes;
 };
 
-void Allow(int rules, const std::string& path) {
+// All that changes a file or a folder: of the first row all but executing and reading, linking
+// between folders, truncating.
+constexpr uint64_t kWritingRights =
+    0x7FFF & ~uint64_t{LANDLOCK_ACCESS_FS_EXECUTE | LANDLOCK_ACCESS_FS_READ_FILE |
+                       LANDLOCK_ACCESS_FS_READ_DIR};
+// Those that a rule for a file may have.
+constexpr uint64_t kFileRights =
+    LANDLOCK_ACCESS_FS_READ_FILE | LANDLOCK_ACCESS_FS_WRITE_FILE | uint64_t{1} << 14;
+constexpr int64_t kLinkingVersion = 2;  // Before it nothing can be moved to another folder.
+
+int64_t PathRuleVersion() {
+  return syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION);
+}
+
+void Allow(int rules, const std::string& path, uint64_t rights) {
   const UniqueFd folder(open(path.c_str(), O_PATH | O_CLOEXEC));
   struct landlock_path_beneath_attr rule {};
-  rule.allowed_access = LANDLOCK_ACCESS_FS_READ_FILE | LANDLOCK_ACCESS_FS_READ_DIR;
+  struct stat info {};
+  const bool is_folder = fstat(folder.Get(), &info) == 0 && S_ISDIR(info.st_mode);
+  rule.allowed_access = is_folder ? rights : rights & kFileRights;
   rule.parent_fd = folder.Get();
   if (folder.Get() >= 0) {
     syscall(SYS_landlock_add_rule, rules, LANDLOCK_RULE_PATH_BENEATH, &rule, 0);
   }
+}
+
+// Forbids what is in `set` but for `rights` below the paths.
+PathRule Enforce(const RuleSet& set, const std::vector<std::string>& paths, uint64_t rights) {
+  // A kernel takes members that it does not know as long as they are zero.
+  const UniqueFd rules(
+      static_cast<int>(syscall(SYS_landlock_create_ruleset, &set, sizeof(set), 0)));
+  if (rules.Get() < 0) {
+    return PathRule::kFailed;
+  }
+  for (const std::string& path : paths) {
+    Allow(rules.Get(), path, rights);
+  }
+  return prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
+                 syscall(SYS_landlock_restrict_self, rules.Get(), 0) == 0
+             ? PathRule::kInForce
+             : PathRule::kFailed;
+}
+
+size_t RowOf(int64_t version) {
+  return std::min<size_t>(static_cast<size_t>(version), std::size(kRights)) - 1;
 }
 
 // What needs no look at the arguments.
@@ -282,27 +320,22 @@ bool ForbidAdministration() {
 }
 
 PathRule ForbidPaths(const std::vector<std::string>& readable) {
-  const auto version =
-      syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION);
+  const int64_t version = PathRuleVersion();
   if (version < 1) {
     return PathRule::kNotThere;
   }
-  const RightsOfVersion& rights =
-      kRights[std::min<size_t>(static_cast<size_t>(version), std::size(kRights)) - 1];
-  const RuleSet set = {rights.files, rights.net, rights.scopes};
-  // A kernel takes what it does not know as long as it is zero.
-  const UniqueFd rules(
-      static_cast<int>(syscall(SYS_landlock_create_ruleset, &set, sizeof(set), 0)));
-  if (rules.Get() < 0) {
-    return PathRule::kFailed;
+  const RightsOfVersion& rights = kRights[RowOf(version)];
+  return Enforce({rights.files, rights.net, rights.scopes}, readable,
+                 LANDLOCK_ACCESS_FS_READ_FILE | LANDLOCK_ACCESS_FS_READ_DIR);
+}
+
+PathRule ForbidWriting(const std::vector<std::string>& writable) {
+  const int64_t version = PathRuleVersion();
+  if (version < kLinkingVersion) {
+    return PathRule::kNotThere;
   }
-  for (const std::string& path : readable) {
-    Allow(rules.Get(), path);
-  }
-  return prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
-                 syscall(SYS_landlock_restrict_self, rules.Get(), 0) == 0
-             ? PathRule::kInForce
-             : PathRule::kFailed;
+  const uint64_t rights = kRights[RowOf(version)].files & kWritingRights;
+  return Enforce({rights, 0, 0}, writable, rights);
 }
 
 bool AllowReadingOnly(int socket, bool may_open) {

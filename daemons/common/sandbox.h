@@ -50,6 +50,11 @@ enum class PathRule { kInForce, kNotThere, kFailed };
 // abstract socket of one connected to.
 PathRule ForbidPaths(const std::vector<std::string>& readable);
 
+// No file can be written, made, cut or removed by its path from here on but those of `writable` and
+// what is below them; reading is as it was, and what is open stays so. Ones that are missing give
+// nothing.
+PathRule ForbidWriting(const std::vector<std::string>& writable);
+
 // Lets the process do what a reader of open files does: memory that is not executable, reading,
 // waiting, messages on `socket`, and writing to its standard output and error. What else libraries
 // try as a matter of course is answered with an error: to open a file (unless `may_open`, and then

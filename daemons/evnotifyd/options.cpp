@@ -47,6 +47,7 @@ bool ReadArguments(const std::vector<std::string>& arguments, FeederOptions& opt
 daemon::DaemonOptions EvnotifydOptions(FeederOptions& options) {
   daemon::DaemonOptions daemon;
   daemon.name = "evnotifyd";
+  daemon.keeps_to_state = false;  // Whoever registers a queue says where it lies.
   // The latter for fanotify, where a share has more folders than inotify takes.
   daemon.capabilities = {CAP_DAC_READ_SEARCH, CAP_SYS_ADMIN};
   daemon.usage =

@@ -132,6 +132,41 @@ TEST(Sandbox, OpensOnlyWhatPathsAllow) {
   }
 }
 
+TEST(Sandbox, WritesOnlyWhatItMay) {
+  const TempFolder folder;
+  for (const char* const name : {"state", "state/below", "share"}) {
+    std::filesystem::create_directory(folder / name);
+    WriteText(folder / name + "/file", "text");
+  }
+  if (InChild([] { return ForbidWriting({}) != PathRule::kNotThere; }) != 0) {
+    GTEST_SKIP() << "this kernel's Landlock is missing, or too old";
+  }
+  const auto renames = [&](const std::string& from, const std::string& to) {
+    return rename((folder / from).c_str(), (folder / to).c_str()) == 0;
+  };
+  const struct {
+    const char* name;
+    std::function<bool()> deed;
+    int outcome;
+  } rows[] = {
+      {"its own", [&] { return Opens(folder / "state/new", O_RDWR | O_CREAT); }, 0},
+      {"moves its own", [&] { return renames("state/file", "state/below/moved"); }, 0},
+      {"reads", [&] { return Opens(folder / "share/file"); }, 0},
+      {"a file that is named", [] { return Opens("/dev/null", O_RDWR); }, 0},
+      {"writes", [&] { return Opens(folder / "share/file", O_WRONLY); }, EACCES},
+      {"truncates", [&] { return truncate((folder / "share/file").c_str(), 0) == 0; }, EACCES},
+      {"makes", [&] { return Opens(folder / "share/new", O_RDWR | O_CREAT); }, EACCES},
+      {"removes", [&] { return unlink((folder / "share/file").c_str()) == 0; }, EACCES},
+      {"moves away", [&] { return renames("share/file", "state/taken"); }, EACCES},
+  };
+  for (const auto& row : rows) {
+    const auto deed = [&] {
+      return ForbidWriting({folder / "state", "/dev/null"}) == PathRule::kInForce && row.deed();
+    };
+    EXPECT_EQ(InChild(deed), row.outcome) << row.name;
+  }
+}
+
 TEST(Sandbox, KeepsTheCapabilitiesOfTheList) {
   if (geteuid() != 0) {
     GTEST_SKIP() << "only root has capabilities to give up";

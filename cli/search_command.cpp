@@ -190,7 +190,7 @@ void PrintHit(const Arguments& arguments, const Console& console, const Json::Va
 
 ExitStatus RunSearch(const Arguments& arguments, const Console& console) {
   Json::Value reply;
-  const Json::Value hits = AskEngine(MakeRequest(arguments, console), &reply);
+  const Json::Value hits = AskSearch(MakeRequest(arguments, console), &reply);
   for (const Json::Value& hit : hits) {
     PrintHit(arguments, console, hit);
   }
@@ -201,7 +201,8 @@ ExitStatus RunSearch(const Arguments& arguments, const Console& console) {
   }
   if (console.err_is_terminal || hits.empty()) {
     const uint64_t total = reply["total"].asUInt64();
-    console.err << Counted(total, "file") << " found";
+    console.err << (reply["total_is_least"] == true ? "at least " : "") << Counted(total, "file")
+                << " found";
     if (total > hits.size()) {
       console.err << ", the first " << Grouped(hits.size()) << " shown";
     }

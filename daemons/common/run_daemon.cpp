@@ -318,6 +318,9 @@ int RunDaemon(const DaemonOptions& options, int argc, char** argv,
     AllowManyFiles();
     const PidFile pid_file(options.pid_file);
     CloseStateFolder();
+    if (options.prepare) {
+      options.prepare();
+    }
     GiveUpRights(options);
     Daemon daemon(options);
     const SignalThread signals(options, daemon.StopFd());

@@ -29,6 +29,9 @@ struct DaemonOptions {
   // Whether it writes below the root's folders of state alone, and so can be kept from writing
   // elsewhere.
   bool keeps_to_state = true;
+  // Called while there is one thread and nothing has been given up: for a process of the daemon's
+  // that needs other rights. May be unset.
+  std::function<void()> prepare;
   // Takes the command line, less the program's name and --help; false for one that is wrong. A path
   // among it must be made absolute here, as the work runs in "/". Unset, no argument is right.
   std::function<bool(const std::vector<std::string>&)> arguments;

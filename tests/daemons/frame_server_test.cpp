@@ -1,12 +1,10 @@
 #include "daemons/common/frame_server.h"
 
 #include <fcntl.h>
-#include <grp.h>
 #include <signal.h>
 #include <sys/eventfd.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 
 #include <filesystem>
 #include <functional>
@@ -15,6 +13,7 @@
 
 #include "common/error.h"
 #include "kavo/local/frames.h"
+#include "support/as_user.h"
 #include "support/faults.h"
 #include "support/raw_client.h"
 #include "support/syslog_capture.h"
@@ -122,28 +121,6 @@ TEST_F(FrameServerTest, GivesTheHandlerTheFileThatComesWithARequest) {
   EXPECT_EQ(Ask("no file"), "none");
 }
 
-// What a process of that user hears.
-std::string AskAs(uid_t uid, const std::function<std::string()>& ask) {
-  int ends[2];
-  EXPECT_EQ(pipe2(ends, O_CLOEXEC), 0);
-  const pid_t child = fork();
-  if (child == 0) {
-    const gid_t groups[] = {uid + 1, uid + 2};
-    const bool is_other =
-        setgroups(2, groups) == 0 && setresgid(uid, uid, uid) == 0 && setresuid(uid, uid, uid) == 0;
-    const std::string heard = is_other ? ask() : "<still the same user>";
-    _exit(write(ends[1], heard.data(), heard.size()) < 0 ? 1 : 0);
-  }
-  close(ends[1]);
-  const RawClient output(ends[0]);
-  std::string heard(4096, '\0');
-  const ssize_t count = read(output.fd, heard.data(), heard.size());
-  heard.resize(count > 0 ? static_cast<size_t>(count) : 0);
-  int status = 0;
-  waitpid(child, &status, 0);
-  return heard;
-}
-
 TEST_F(FrameServerTest, AsksWhoAsks) {
   if (geteuid() != 0) {
     GTEST_SKIP() << "only root can start processes of other users";
@@ -166,9 +143,9 @@ TEST_F(FrameServerTest, AsksWhoAsks) {
   const auto ask = [this] { return Ask("who"); };
   const std::string refused = "refused " + std::to_string(static_cast<int>(Refusal::kNotAdmitted));
   EXPECT_TRUE(Ask("who").starts_with("who 0 0"));
-  EXPECT_EQ(AskAs(kGuest, ask), "who 4711 4711+4712+4713");
-  EXPECT_EQ(AskAs(kStranger, ask), refused);
-  EXPECT_EQ(AskAs(kStranger, [this] { return Ask(std::string(100000, 'x')); }), refused)
+  EXPECT_EQ(HearAs(kGuest, ask), "who 4711 4711+4712+4713");
+  EXPECT_EQ(HearAs(kStranger, ask), refused);
+  EXPECT_EQ(HearAs(kStranger, [this] { return Ask(std::string(100000, 'x')); }), refused)
       << "little is read of what will be refused";
   const auto ask_beside = [&](size_t others) {
     std::vector<RawClient> held;
@@ -178,8 +155,8 @@ TEST_F(FrameServerTest, AsksWhoAsks) {
     }
     return Ask("who");
   };
-  EXPECT_EQ(AskAs(kGuest, [&] { return ask_beside(2); }), "who 4711 4711+4712+4713");
-  EXPECT_EQ(AskAs(kGuest, [&] { return ask_beside(3); }), "<failed>");
+  EXPECT_EQ(HearAs(kGuest, [&] { return ask_beside(2); }), "who 4711 4711+4712+4713");
+  EXPECT_EQ(HearAs(kGuest, [&] { return ask_beside(3); }), "<failed>");
   EXPECT_TRUE(Ask("who").starts_with("who 0 0")) << "one user does not shut out another";
 }
 

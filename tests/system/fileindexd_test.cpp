@@ -580,7 +580,7 @@ TEST_F(Fileindexd, TakesCareOfTheStatusBits) {
 TEST_F(Fileindexd, WaitsForTheEngineAndForSpace) {
   Write("a", "alpha");
   WriteText(kRoot.MakeFolder("usr/kavo/bin") + "/kavoqpxnotify",
-            "#!/bin/sh\necho told >> " + (kRoot / "told") + "\n");
+            "#!/bin/sh\necho told >> " + (kRoot / "tmp/told") + "\n");
   chmod((kRoot / "usr/kavo/bin/kavoqpxnotify").c_str(), 0755);
   {
     FakeEngine full(kRoot / "var/run/kavoelasticd.sock");
@@ -593,7 +593,7 @@ TEST_F(Fileindexd, WaitsForTheEngineAndForSpace) {
       ASSERT_TRUE(AwaitState("failing"));
       Command(R"({"type":"worker_create","data":{"share_name":"docs"}})");
     }
-    EXPECT_EQ(ReadText(kRoot / "told"), "told\n");
+    EXPECT_EQ(ReadText(kRoot / "tmp/told"), "told\n");
   }
   StartEngine();
   Command(R"({"type":"worker_create","data":{"share_name":"docs"}})");

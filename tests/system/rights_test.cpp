@@ -7,6 +7,7 @@
 #include <fstream>
 #include <initializer_list>
 
+#include "support/as_user.h"
 #include "support/stack.h"
 
 namespace {
@@ -74,6 +75,63 @@ TEST(Rights, DaemonsOfRootIndexEverybodysFilesWithFewCapabilities) {
   WriteText(folder + "/plain.txt", "tokenofchange");
   EXPECT_TRUE(stack.AwaitQuiet());
   EXPECT_TRUE(stack.IsFound("tokenofchange"));
+}
+
+TEST(Rights, OthersFindWhatTheyMayReadAndDoNothingElse) {
+  if (geteuid() != 0) {
+    GTEST_SKIP() << "only root can start processes of other users";
+  }
+  Stack stack(kRoot);
+  ASSERT_EQ(chmod(kRoot.Path().c_str(), 0755), 0);
+  // As an installation has them: a folder of everybody's, and in it what is one user's alone.
+  WriteText(stack.In() + "/open.txt", "lighthouse for all");
+  WriteText(stack.In() + "/theirs.txt", "lighthouse of one");
+  WriteText(stack.In() + "/roots.txt", "lighthouse of root");
+  ASSERT_EQ(chown((stack.In() + "/theirs.txt").c_str(), kSomebody, kSomebody), 0);
+  ASSERT_EQ(chmod((stack.In() + "/theirs.txt").c_str(), 0600), 0);
+  ASSERT_EQ(chmod((stack.In() + "/roots.txt").c_str(), 0600), 0);
+  ASSERT_TRUE(stack.AwaitQuiet());
+  const std::string search = R"({"command":"search","data":{"words":"lighthouse","snippet":true}})";
+  const auto hear = [&](uid_t uid, const std::string& socket, const std::string& request) {
+    return HearAs(uid, [&] { return Ask(kRoot / ("var/run/" + socket + ".sock"), request); });
+  };
+  const auto finds = [&](uid_t uid) {
+    Json::Value reply;
+    EXPECT_TRUE(vexlo::JsonFromString(reply, hear(uid, "kavoelasticd.search", search)));
+    std::string names;
+    for (const Json::Value& hit : reply["data"]) {
+      EXPECT_NE(hit["snippet"].asString().find("lighthouse"), std::string::npos);
+      names += hit["name"].asString() + " ";
+    }
+    return names + reply["total"].asString();
+  };
+  EXPECT_EQ(finds(kSomebody + 10), "open.txt 1");
+  EXPECT_EQ(finds(kSomebody), "open.txt theirs.txt 2");
+  const struct {
+    const char* socket;
+    const char* request;
+    const char* reply;  // Part of it.
+  } rows[] = {
+      {"kavoelasticd", R"({"command":"index_list","data":{}})", "<failed>"},
+      {"fileindexd", R"({"type":"pause","data":{"resume_time":0}})", "<failed>"},
+      {"evnotifyd", R"({"command":"stats"})", "<failed>"},
+      {"kavocontentextractd", R"({"command":"stats"})", "<failed>"},
+      {"kavoelasticd.search", R"({"command":"index_delete","data":{"id":"fileindex_docs"}})",
+       "only searches are answered here"},
+  };
+  for (const auto& row : rows) {
+    EXPECT_NE(hear(kSomebody, row.socket, row.request).find(row.reply), std::string::npos)
+        << row.socket << " " << row.request;
+  }
+  const auto tool = [&] {
+    Program program("cd /", std::string(FILEINDEX_PROGRAM) + " search lighthouse 2>&1");
+    const int status = program.End();
+    return program.text + std::to_string(status);
+  };
+  const auto reaches_tool = [] { return access(FILEINDEX_PROGRAM, X_OK) == 0 ? "yes" : "no"; };
+  if (HearAs(kSomebody + 10, reaches_tool) == "yes") {
+    EXPECT_EQ(HearAs(kSomebody + 10, tool), stack.In() + "/open.txt\n0");
+  }
 }
 
 }  // namespace

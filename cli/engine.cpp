@@ -66,6 +66,9 @@ Json::Value AskSearch(const Json::Value& request, Json::Value* reply) {
     return AskEngine(request, reply);
   }
   const std::string path = kSearchSocket.Get();
+  if (access(path.c_str(), W_OK) != 0 && errno == EACCES) {
+    throw Failure("only the user who runs the search engine can search: it is not root's");
+  }
   kavodaemon::DomainSockConnection connection(path);
   std::string text;
   if (!connection.Connect(kConnectSeconds) || !connection.Send(JsonToString(request)) ||

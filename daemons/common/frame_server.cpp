@@ -773,11 +773,10 @@ std::string FrameServer::Handle(const std::string& request, Connection& connecti
 
 // The request goes with the handler's call, before the reply is sent.
 std::optional<std::string> FrameServer::Answer(Connection& connection) {
-  Refusal reason = Refusal::kNotAdmitted;
+  const Refusal reason = connection.admitted ? Refusal::kHandlerFailed : Refusal::kNotAdmitted;
   const std::string request = std::move(connection.request);
   try {
     if (connection.admitted) {
-      reason = Refusal::kHandlerFailed;
       return Handle(request, connection);
     }
   } catch (const std::exception& error) {

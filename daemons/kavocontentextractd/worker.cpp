@@ -67,8 +67,8 @@ bool GiveUpRights(size_t memory, const daemon::Account& account) {
 // Loads what libraries would look for in files later.
 void LoadAhead() {
   for (const char* const encoding : kEncodings) {
-    iconv_open("UTF-8", encoding);  // Held to the end, as closing it might unload the module.
-    iconv_open(encoding, "UTF-8");
+    (void)iconv_open("UTF-8", encoding);  // Held to the end, as closing it might unload the module.
+    (void)iconv_open(encoding, "UTF-8");
   }
   // Unset, the C library asks for the file's attributes at each conversion of a time.
   // NOLINTNEXTLINE(concurrency-mt-unsafe): there is one thread.

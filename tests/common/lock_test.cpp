@@ -120,17 +120,17 @@ TEST(Lock, NobodyKeepsRootFromALockInASharedFolder) {
   const struct {
     const char* name;
     std::function<bool()> plants;
-    uid_t owner;
-    bool holds;           // For ever.
     std::string for_all;  // Why anybody else fails; "" when they do not.
-    bool fails;           // Even root.
+    uid_t owner;
+    bool holds;  // For ever.
+    bool fails;  // Even root.
   } rows[] = {
-      {"a link", links, kSomebody, false, "Too many levels of symbolic links", false},
-      {"a name of another file", names, 0, false, "Too many links", false},
-      {"a pipe", pipes, kSomebody, false, "", false},
-      {"their file", writes, kSomebody, false, "", false},
-      {"their file, held", writes, kSomebody, true, "Exceed max retry", false},
-      {"our file, held", writes, 0, true, "Exceed max retry", true},
+      {"a link", links, "Too many levels of symbolic links", kSomebody, false, false},
+      {"a name of another file", names, "Too many links", 0, false, false},
+      {"a pipe", pipes, "", kSomebody, false, false},
+      {"their file", writes, "", kSomebody, false, false},
+      {"their file, held", writes, "Exceed max retry", kSomebody, true, false},
+      {"our file, held", writes, "Exceed max retry", 0, true, true},
   };
   for (const auto& row : rows) {
     SCOPED_TRACE(row.name);

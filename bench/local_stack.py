@@ -11,6 +11,7 @@ import signal
 import socket
 import struct
 import subprocess
+import sys
 import tempfile
 import threading
 import time
@@ -45,6 +46,42 @@ def percentile(values, percent):
 def load():
     with open("/proc/loadavg", encoding="ascii") as file:
         return file.read().split()[0]
+
+
+class Report:
+    """What a measurement says: text for people, or with `as_json` an object a line for each figure
+    (the text goes to standard error then). A figure is judged by its ratio to the baseline where it
+    has one; `aim` is the most that it may be."""
+
+    def __init__(self, as_json, judges=True):
+        self._as_json = as_json
+        self._judges = judges
+
+    def say(self, text):
+        print(text, file=sys.stderr if self._as_json else sys.stdout, flush=True)
+
+    def figure(self, case, value, unit, baseline=None, aim=None):
+        ratio = value / baseline if baseline else None
+        judged = value if ratio is None else ratio
+        met = judged <= aim if aim is not None and self._judges else None
+        if self._as_json:
+            line = {
+                "case": case,
+                "value": value,
+                "unit": unit,
+                "baseline": baseline,
+                "ratio": ratio,
+                "aim": aim,
+                "met": met,
+            }
+            print(json.dumps(line), flush=True)
+            return
+        text = f"  {case:40} {value:10.3f} {unit}"
+        if ratio is not None:
+            text += f", baseline {baseline:.3f}, ratio {ratio:.2f}"
+        if aim is not None:
+            text += f", aim {aim:g}" + ("" if met is None else ": met" if met else ": missed")
+        print(text, flush=True)
 
 
 # Processes
@@ -347,6 +384,7 @@ class Stack:
 
 # The corpus
 
+NEW_WORD = "burstword"  # In no file until the burst.
 BLOCKS = ("north", "east", "south", "west")  # A quarter of the folders each.
 _SYLLABLES = (
     "ba be bi bo bu da de di do du fa fe fi ga ge gi go ha he hi ka ke ki ko la le li lo "
@@ -385,3 +423,29 @@ def make_corpus(top, files=20000, folders=400, seed=1):
         path.write_text(text, encoding="ascii")
         paths.append(path)
     return paths
+
+
+def change(corpus, paths, sizes):
+    """The burst; gives what `counts` must say when all of it is reflected."""
+    changed, deleted = sizes
+    quarter = {
+        block: [path for path in paths if path.parts[0] == block] for block in BLOCKS
+    }
+    for path in (quarter["north"] + quarter["east"])[:changed]:
+        with open(corpus / path, "a", encoding="ascii") as file:
+            file.write(f"{NEW_WORD}\n")
+    for path in quarter["south"][:deleted]:
+        (corpus / path).unlink()
+    os.rename(corpus / "west", corpus / "moved")
+    return changed, 0, len(quarter["west"]), len(paths) - deleted
+
+
+def make_small_files(top, files, folder_size=1000):
+    """Short texts in folders of so many: a tree whose size is in its names."""
+    top = pathlib.Path(top)
+    for i in range(files):
+        folder = top / f"folder-{i // folder_size:04d}"
+        if i % folder_size == 0:
+            folder.mkdir(parents=True)
+        with open(folder / f"note-{i:07d}.txt", "w", encoding="ascii") as file:
+            file.write(f"note number {i} of word{i % 977}\n")

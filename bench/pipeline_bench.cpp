@@ -1,16 +1,29 @@
 // From an open queue file to delivered operations, beside a baseline that only reads the same lines
-// and parses each with jsoncpp. Every case is run at two sizes: what a line costs must not grow
+// and parses each with jsoncpp. Every case is run at several sizes: what a line costs must not grow
 // with the queue.
 //
 //   skewed        a twentieth as many files as lines, a few of them busy (Zipf), 12 folders each
+//   skewed-fixed  the same with 50,000 files, however many lines there are
 //   wide          one folder, a fifth as many files as lines, in five passes
 //   deep          files 40 levels down, four lines each
 //   folder-rename folders of 10,000 new files, each renamed ten times
 //   save-rename   one file saved over and over: create beside, write, rename over
+//   children      one folder of as many new files as lines
+//   renames       a folder of 100,000 new files, renamed 1,000 times
+//   reindex       one path 36 levels down, reindexed over and over
 //
-// --quick runs the small size only, once. Otherwise all of Google Benchmark's flags.
-#include <benchmark/benchmark.h>
+// memory/NAME is the heap that the built tree holds for each distinct path with a pending
+// operation: `wide` and `deep` as above, `folders` with 200,000 new files in 997 folders.
+//
+// Times are processor time, the least of several passes that take turns with the baseline's, so
+// that what else runs on the machine counts for both. The baseline reads the case's queue of up to
+// 1,000,000 lines; of 10,000,000 lines it is our own figure at 1,000,000.
+//
+//   --quick  fewer passes, a shorter baseline, and nothing above 1,000,000 lines
+//   --json   a JSON object a line for each figure instead of the table
+//   NAME     the cases of that name alone
 #include <json/reader.h>
+#include <malloc.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -18,25 +31,29 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
+#include <ctime>
 #include <fstream>
 #include <functional>
-#include <iostream>
-#include <map>
 #include <memory>
 #include <random>
 #include <string>
 #include <string_view>
 #include <vector>
 
+#include "figure.h"
 #include "fileindex/optree/optree.h"
 
 namespace {
 
+using bench::Figure;
 using vexlo::fileindex::OP;
 using vexlo::fileindex::OPTree;
 
 constexpr int64_t kSmall = 10'000;
+constexpr int64_t kMiddle = 100'000;
 constexpr int64_t kLarge = 1'000'000;
+constexpr int64_t kHuge = 10'000'000;
 
 std::string Line(uint32_t event, const std::string& path, const std::string& path_old = "") {
   return "{\"event\":" + std::to_string(event) + ",\"is_dir\":false,\"path\":\"" + path +
@@ -50,8 +67,7 @@ std::string FolderLine(uint32_t event, const std::string& path, const std::strin
 
 using Sink = std::function<void(const std::string&)>;
 
-void Skewed(int64_t lines, const Sink& sink) {
-  const int64_t files = lines / 20;
+void SkewedOver(int64_t files, int64_t lines, const Sink& sink) {
   std::mt19937_64 random(1);
   std::vector<double> weights(static_cast<size_t>(files));
   for (size_t i = 0; i < weights.size(); ++i) {
@@ -68,6 +84,10 @@ void Skewed(int64_t lines, const Sink& sink) {
   }
 }
 
+void Skewed(int64_t lines, const Sink& sink) { SkewedOver(lines / 20, lines, sink); }
+
+void SkewedFixed(int64_t lines, const Sink& sink) { SkewedOver(kLarge / 20, lines, sink); }
+
 void Wide(int64_t lines, const Sink& sink) {
   constexpr uint32_t kPasses[] = {0x40, 8, 4, 8, 4};
   const int64_t files = lines / 5;
@@ -78,11 +98,16 @@ void Wide(int64_t lines, const Sink& sink) {
   }
 }
 
-void Deep(int64_t lines, const Sink& sink) {
+std::string DeepFolder() {
   std::string folder = "/volume1/src";
   for (int level = 0; level < 36; ++level) {
     folder += "/dir-" + std::to_string(level);
   }
+  return folder;
+}
+
+void Deep(int64_t lines, const Sink& sink) {
+  const std::string folder = DeepFolder();
   constexpr uint32_t kEvents[] = {0x40, 8, 4, 8};
   for (int64_t i = 0; i < lines; ++i) {
     const int64_t file = i / 4;
@@ -124,164 +149,239 @@ void SaveRename(int64_t lines, const Sink& sink) {
   }
 }
 
+void Children(int64_t lines, const Sink& sink) {
+  for (int64_t file = 0; file < lines; ++file) {
+    sink(Line(0x40, "/volume1/mail/archive/message-" + std::to_string(file * 7919 % lines)));
+  }
+}
+
+void Renames(int64_t lines, const Sink& sink) {
+  constexpr int64_t kRenames = 1000;
+  const std::string folder = "/volume1/projects/job-";
+  for (int64_t file = 0; file < lines - kRenames; ++file) {
+    sink(Line(0x40, folder + "0/part-" + std::to_string(file)));
+  }
+  for (int64_t i = 0; i < kRenames; ++i) {
+    sink(FolderLine(0x100, folder + std::to_string(i + 1), folder + std::to_string(i)));
+  }
+}
+
+void Reindex(int64_t lines, const Sink& sink) {
+  const std::string line = FolderLine(0x10000, DeepFolder(), "");
+  for (int64_t i = 0; i < lines; ++i) {
+    sink(line);
+  }
+}
+
+void Folders(int64_t lines, const Sink& sink) {
+  for (int64_t file = 0; file < lines; ++file) {
+    sink(Line(0x40, "/volume1/photo/album" + std::to_string(file % 997) + "/IMG_" +
+                        std::to_string(file) + ".JPG"));
+  }
+}
+
 struct Case {
   const char* name;
   void (*write)(int64_t, const Sink&);
+  std::vector<int64_t> sizes;
+  double aim;  // Of the ratio to jsoncpp, at 1,000,000 lines; NAN: none.
 };
-constexpr Case kCases[] = {{"skewed", Skewed},
-                           {"wide", Wide},
-                           {"deep", Deep},
-                           {"folder-rename", FolderRename},
-                           {"save-rename", SaveRename}};
 
-// The queue files, made at first use and removed at the end.
-class Queues {
+const std::vector<Case>& Cases() {
+  static const std::vector<Case> cases = {
+      {"skewed", Skewed, {kSmall, kMiddle, kLarge, kHuge}, 0.25},
+      {"skewed-fixed", SkewedFixed, {kLarge, kHuge}, NAN},
+      {"wide", Wide, {kSmall, kMiddle, kLarge}, 0.25},
+      {"deep", Deep, {kSmall, kMiddle, kLarge}, 0.25},
+      {"folder-rename", FolderRename, {kSmall, kMiddle, kLarge}, 0.25},
+      {"save-rename", SaveRename, {kSmall, kMiddle, kLarge}, 0.25},
+      {"children", Children, {kLarge}, NAN},
+      {"renames", Renames, {kMiddle + 1000}, NAN},
+      {"reindex", Reindex, {kMiddle}, NAN},
+  };
+  return cases;
+}
+
+struct MemoryCase {
+  const char* name;
+  void (*write)(int64_t, const Sink&);
+  int64_t lines;
+  int64_t paths;
+};
+constexpr MemoryCase kMemoryCases[] = {{"memory/folders", Folders, 200'000, 200'000},
+                                       {"memory/wide", Wide, kLarge, 200'000},
+                                       {"memory/deep", Deep, kLarge, 250'000}};
+constexpr double kMostBytesPerPath = 350;
+constexpr double kMostGrowth = 1.3;
+
+// A queue file of its own, removed at the end.
+class Queue {
  public:
-  Queues() {
+  Queue(void (*write)(int64_t, const Sink&), int64_t lines) {
     const char* const base = getenv("TMPDIR");
-    folder_ = std::string(base == nullptr ? "/tmp" : base) + "/pipeline_bench.XXXXXX";
-    if (mkdtemp(folder_.data()) == nullptr) {
-      perror("mkdtemp");
+    path_ = std::string(base == nullptr ? "/tmp" : base) + "/pipeline_bench.XXXXXX";
+    const int fd = mkstemp(path_.data());
+    if (fd < 0) {
+      perror(path_.c_str());
+      exit(3);
+    }
+    close(fd);
+    std::ofstream out(path_);
+    write(lines, [&out](const std::string& line) { out << line; });
+    out.close();
+    if (!out) {
+      (void)fprintf(stderr, "cannot write %s\n", path_.c_str());
+      unlink(path_.c_str());
       exit(3);
     }
   }
-  ~Queues() {
-    for (const auto& [name, path] : paths_) {
-      unlink(path.c_str());
-    }
-    rmdir(folder_.c_str());
-  }
-  Queues(const Queues&) = delete;
-  Queues& operator=(const Queues&) = delete;
+  ~Queue() { unlink(path_.c_str()); }
+  Queue(const Queue&) = delete;
+  Queue& operator=(const Queue&) = delete;
 
-  const std::string& Path(const Case& queue_case, int64_t lines) {
-    std::string& path = paths_[std::string(queue_case.name) + "." + std::to_string(lines)];
-    if (path.empty()) {
-      path = folder_ + "/" + queue_case.name + "." + std::to_string(lines);
-      std::ofstream out(path);
-      queue_case.write(lines, [&out](const std::string& line) { out << line; });
-    }
-    return path;
-  }
+  const std::string& Path() const { return path_; }
 
  private:
-  std::string folder_;
-  std::map<std::string, std::string> paths_;
+  std::string path_;
 };
 
-Queues& TheQueues() {
-  static Queues queues;
-  return queues;
+double ProcessorSeconds() {
+  timespec now{};
+  clock_gettime(CLOCK_PROCESS_CPUTIME_ID, &now);
+  return static_cast<double>(now.tv_sec) + static_cast<double>(now.tv_nsec) * 1e-9;
 }
 
-void Ours(benchmark::State& state, const Case& queue_case, int64_t lines) {
-  const std::string& path = TheQueues().Path(queue_case, lines);
-  while (state.KeepRunning()) {
+bool failed = false;
+
+void Check(bool right, const std::string& path) {
+  if (!right) {
+    (void)fprintf(stderr, "%s: lines were lost\n", path.c_str());
+    failed = true;
+  }
+}
+
+// Nanoseconds a line.
+double Fold(const std::string& path, int64_t lines) {
+  const double begin = ProcessorSeconds();
+  {
     OPTree tree(path);
     size_t delivered = 0;
     tree.ProcessOP([&delivered](const std::shared_ptr<OP>&) { ++delivered; });
-    if (tree.GetLineCount() != static_cast<uint64_t>(lines) || tree.GetSkippedCount() != 0) {
-      state.SkipWithError("lines were lost");
-    }
-    state.counters["delivered"] = static_cast<double>(delivered);
+    Check(tree.GetLineCount() == static_cast<uint64_t>(lines) && tree.GetSkippedCount() == 0 &&
+              delivered != 0,
+          path);
   }
+  return (ProcessorSeconds() - begin) * 1e9 / static_cast<double>(lines);
 }
 
-void Baseline(benchmark::State& state, const Case& queue_case, int64_t lines) {
-  const std::string& path = TheQueues().Path(queue_case, lines);
+// The same for the baseline, which stops after `lines`.
+double ParseAlone(const std::string& path, int64_t lines) {
   Json::CharReaderBuilder builder;
   builder["collectComments"] = false;
   const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
-  while (state.KeepRunning()) {
-    std::ifstream in(path);
-    std::string line;
-    int64_t parsed = 0;
-    while (std::getline(in, line)) {
-      Json::Value value;
-      parsed += reader->parse(line.data(), line.data() + line.size(), &value, nullptr) ? 1 : 0;
-      benchmark::DoNotOptimize(value);
-    }
-    if (parsed != lines) {
-      state.SkipWithError("lines were lost");
-    }
+  const double begin = ProcessorSeconds();
+  std::ifstream in(path);
+  std::string line;
+  int64_t parsed = 0;
+  while (parsed < lines && std::getline(in, line)) {
+    Json::Value value;
+    parsed += reader->parse(line.data(), line.data() + line.size(), &value, nullptr) ? 1 : 0;
   }
+  Check(parsed == lines, path);
+  return (ProcessorSeconds() - begin) * 1e9 / static_cast<double>(lines);
 }
 
-// Keeps the fastest repetition of each run, by name.
-class Figures : public benchmark::ConsoleReporter {
- public:
-  void ReportRuns(const std::vector<Run>& runs) override {
-    for (const Run& run : runs) {
-      if (run.run_type == Run::RT_Iteration && !run.error_occurred) {
-        const double seconds = run.real_accumulated_time / static_cast<double>(run.iterations);
-        auto [at, added] = seconds_.try_emplace(run.run_name.function_name, seconds);
-        at->second = std::min(at->second, seconds);
+int Passes(int64_t lines, bool quick) {
+  if (quick) {
+    return lines >= kLarge ? 1 : 3;
+  }
+  return lines > kLarge ? 2 : lines == kLarge ? 5 : 10;
+}
+
+void RunCase(const Case& queue_case, bool quick, std::vector<Figure>& figures) {
+  std::vector<int64_t> sizes = queue_case.sizes;
+  if (quick && sizes.back() > kLarge) {
+    sizes.pop_back();
+  }
+  const int64_t longest = std::min(sizes.back(), kLarge);
+  const auto first = static_cast<std::ptrdiff_t>(figures.size());
+  double baseline = NAN;
+  double at_large = NAN;
+  for (const int64_t lines : sizes) {
+    const Queue queue(queue_case.write, lines);
+    Figure figure;
+    figure.name = std::string("pipeline/") + queue_case.name + "/" + std::to_string(lines);
+    figure.unit = "ns/line";
+    for (int pass = Passes(lines, quick); pass > 0; --pass) {
+      figure.value = std::fmin(figure.value, Fold(queue.Path(), lines));
+      if (lines == longest) {
+        baseline =
+            std::fmin(baseline, ParseAlone(queue.Path(), quick ? std::min(lines, kMiddle) : lines));
       }
-      failed_ = failed_ || run.error_occurred;
     }
-    ConsoleReporter::ReportRuns(runs);
+    at_large = lines == kLarge ? figure.value : at_large;
+    figure.baseline = lines > kLarge ? at_large : NAN;
+    figure.aim = lines > kLarge ? kMostGrowth : lines == kLarge ? queue_case.aim : NAN;
+    figures.push_back(figure);
   }
-
-  bool Failed() const { return failed_; }
-
-  // Nanoseconds a line, NaN for what was not run.
-  double PerLine(const std::string& name, int64_t lines) const {
-    const auto found = seconds_.find(name);
-    return found == seconds_.end() ? NAN : found->second * 1e9 / static_cast<double>(lines);
-  }
-
- private:
-  std::map<std::string, double> seconds_;
-  bool failed_ = false;
-};
-
-std::string NameOf(const char* who, const char* queue_case, int64_t lines) {
-  return std::string(who) + "/" + queue_case + "/" + std::to_string(lines);
+  std::for_each(figures.begin() + first, figures.end(), [baseline](Figure& figure) {
+    figure.baseline = std::isnan(figure.baseline) ? baseline : figure.baseline;
+  });
 }
 
-void PrintTable(const Figures& figures) {
-  std::printf("\n%-14s %12s %12s %8s %12s %8s\n", "ns a line", "10,000", "1,000,000", "growth",
-              "jsoncpp", "ratio");
-  for (const Case& queue_case : kCases) {
-    const double small = figures.PerLine(NameOf("fold", queue_case.name, kSmall), kSmall);
-    const double large = figures.PerLine(NameOf("fold", queue_case.name, kLarge), kLarge);
-    double baseline = figures.PerLine(NameOf("jsoncpp", queue_case.name, kLarge), kLarge);
-    double ours = large;
-    if (std::isnan(large)) {
-      baseline = figures.PerLine(NameOf("jsoncpp", queue_case.name, kSmall), kSmall);
-      ours = small;
-    }
-    std::printf("%-14s %12.0f %12.0f %8.2f %12.0f %8.3f\n", queue_case.name, small, large,
-                large / small, baseline, ours / baseline);
-  }
+void RunMemoryCase(const MemoryCase& memory_case, std::vector<Figure>& figures) {
+  const Queue queue(memory_case.write, memory_case.lines);
+  const auto in_use = [] {
+    const struct mallinfo2 info = mallinfo2();
+    return static_cast<double>(info.uordblks) + static_cast<double>(info.hblkhd);
+  };
+  const double before = in_use();
+  const OPTree tree(queue.Path());
+  Figure figure;
+  figure.name = memory_case.name;
+  figure.unit = "bytes/path";
+  figure.value = (in_use() - before) / static_cast<double>(memory_case.paths);
+  figure.aim = kMostBytesPerPath;
+  Check(tree.ops.size() == static_cast<size_t>(memory_case.paths), queue.Path());
+  figures.push_back(figure);
 }
 
 }  // namespace
 
 int main(int argc, char** argv) {
-  const bool quick = argc > 1 && std::string_view(argv[1]) == "--quick";
-  if (quick) {
-    --argc;
-    std::rotate(argv + 1, argv + 2, argv + argc + 1);
-  }
-  const std::vector<int64_t> sizes = quick ? std::vector{kSmall} : std::vector{kSmall, kLarge};
-  for (const Case& queue_case : kCases) {
-    for (const int64_t lines : sizes) {
-      for (const auto& [who, run] : {std::pair{"fold", &Ours}, std::pair{"jsoncpp", &Baseline}}) {
-        auto* const registered = benchmark::RegisterBenchmark(
-            NameOf(who, queue_case.name, lines).c_str(), run, queue_case, lines);
-        registered->Unit(benchmark::kMillisecond)
-            ->MinTime(quick ? 0.01 : 0.3)
-            ->Repetitions(quick ? 1 : 3);
-      }
+  bool quick = false;
+  bool json = false;
+  std::string_view only;
+  for (int i = 1; i < argc; ++i) {
+    const std::string_view argument = argv[i];
+    if (argument == "--quick") {
+      quick = true;
+    } else if (argument == "--json") {
+      json = true;
+    } else if (only.empty() && !argument.starts_with("-")) {
+      only = argument;
+    } else {
+      (void)fprintf(stderr, "usage: pipeline_bench [--quick] [--json] [NAME]\n");
+      return 2;
     }
   }
-  benchmark::Initialize(&argc, argv);
-  if (benchmark::ReportUnrecognizedArguments(argc, argv)) {
+  std::vector<Figure> figures;
+  for (const MemoryCase& memory_case : kMemoryCases) {
+    if (only.empty() || only == memory_case.name || only == "memory") {
+      RunMemoryCase(memory_case, figures);
+    }
+  }
+  for (const Case& queue_case : Cases()) {
+    // Without the huge queue the fixed set of files has nothing to show.
+    const bool shows = !quick || queue_case.write != SkewedFixed;
+    if (only.empty() ? shows : only == queue_case.name) {
+      RunCase(queue_case, quick, figures);
+    }
+  }
+  if (figures.empty()) {
+    (void)fprintf(stderr, "no case is called %s\n", std::string(only).c_str());
     return 2;
   }
-  Figures figures;
-  benchmark::RunSpecifiedBenchmarks(&figures);
-  PrintTable(figures);
-  return figures.Failed() ? 1 : 0;
+  bench::Print(figures, json);
+  return failed ? 1 : 0;
 }

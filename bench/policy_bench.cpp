@@ -8,7 +8,8 @@
 //
 // 3,000 shares and the files are made up in a folder of the program's own below the temporary
 // folder.
-// --quick runs each case for a moment. Otherwise all of Google Benchmark's flags.
+// --quick runs each case for a moment; --json prints a JSON object a line for each figure, and what
+// Google Benchmark says on standard error. Otherwise all of Google Benchmark's flags.
 #include <benchmark/benchmark.h>
 #include <unistd.h>
 
@@ -19,6 +20,7 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iostream>
 #include <map>
 #include <new>
 #include <random>
@@ -190,6 +192,25 @@ class Figures : public benchmark::ConsoleReporter {
     return found == seconds_.end() ? 0 : found->second;
   }
 
+  // Nanoseconds a question or a look-up.
+  bool PrintJson() const {
+    for (const char* const name : {"refused-early", "refused-late", "accepted"}) {
+      std::printf(R"({"case":"policy: %s","value":%.1f,"unit":"ns","baseline":null,"ratio":null,)"
+                  R"("aim":null,"met":null})"
+                  "\n",
+                  name, 1e9 * Seconds(name));
+    }
+    const double ours = 1e9 * Seconds("type") / static_cast<double>(kPaths);
+    for (const char* const name : {"map", "map-find-only"}) {
+      const double baseline = 1e9 * Seconds(name) / static_cast<double>(kPaths);
+      std::printf(R"({"case":"file type, beside %s","value":%.2f,"unit":"ns","baseline":%.2f,)"
+                  R"("ratio":%.3f,"aim":null,"met":null})"
+                  "\n",
+                  name, ours, baseline, ours / baseline);
+    }
+    return !failed_;
+  }
+
   bool Print() const {
     std::printf("\n%-16s %14s\n", "", "decisions/s");
     for (const char* const name : {"refused-early", "refused-late", "accepted"}) {
@@ -214,11 +235,17 @@ class Figures : public benchmark::ConsoleReporter {
 }  // namespace
 
 int main(int argc, char** argv) {
-  const bool quick = argc > 1 && std::string_view(argv[1]) == "--quick";
-  if (quick) {
+  const auto take = [&](std::string_view option) {
+    char** const at = std::find(argv + 1, argv + argc, option);
+    if (at == argv + argc) {
+      return false;
+    }
+    std::rotate(at, at + 1, argv + argc + 1);
     --argc;
-    std::rotate(argv + 1, argv + 2, argv + argc + 1);
-  }
+    return true;
+  };
+  const bool quick = take("--quick");
+  const bool json = take("--json");
   MakeShares();
   // A file that has just been written is read anew for each question.
   std::this_thread::sleep_for(std::chrono::milliseconds(2100));
@@ -258,9 +285,15 @@ int main(int argc, char** argv) {
   benchmark::Initialize(&argc, argv);
   const bool usable = !benchmark::ReportUnrecognizedArguments(argc, argv);
   Figures figures;
+  if (json) {
+    figures.SetOutputStream(&std::cerr);
+  }
   if (usable) {
     benchmark::RunSpecifiedBenchmarks(&figures);
   }
   std::filesystem::remove_all(OwnRoot());
-  return usable ? (figures.Print() ? 0 : 1) : 2;
+  if (!usable) {
+    return 2;
+  }
+  return (json ? figures.PrintJson() : figures.Print()) ? 0 : 1;
 }

@@ -6,18 +6,28 @@
 //   own/N         whether a path is itself a folder's
 //   reindex       whether a reindex that covers a path waits in a queue of 1,000,000 lines
 //   again         the first of these once more, after a line was appended; and that line
+//   custom/N      1,000 custom events added one after the other to a queue of N lines, 0 or
+//   1,000,000:
+//                 each asks the first question, and must cost what the new lines cost
 //   processing    whether anything waits below a path, in the same queue
 //   simdjson      a pass over the same file, read whole, that parses each line with simdjson and
 //                 takes "event" and "path" out of it
+//   wc            a pass over the same file with wc -l
 //
 // The files are made in a folder of the program's own below the temporary folder.
-// --quick runs each case for a moment, with 10,000 lines. Otherwise all of Google Benchmark's
-// flags.
+// --quick runs each case for a moment, with 100,000 lines; --json prints a JSON object a line for
+// each figure. Times are processor time. Otherwise all of Google Benchmark's flags.
 #include <benchmark/benchmark.h>
+#include <fcntl.h>
 #include <json/value.h>
 #include <simdjson.h>
+#include <spawn.h>
+#include <sys/resource.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <cmath>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
@@ -31,10 +41,13 @@
 
 #include "common/file.h"
 #include "common/json.h"
+#include "common/sdk/share.h"
 #include "common/string.h"
+#include "figure.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/paths.h"
 #include "fileindex/queue_mgr.h"
+#include "fileindex/util/custom_event.h"
 #include "kavo/local/shares.h"
 
 namespace {
@@ -44,6 +57,7 @@ using vexlo::fileindex::FolderMgr;
 using vexlo::fileindex::QueueMgr;
 
 constexpr size_t kPaths = 4096;
+constexpr int kCustomEvents = 1000;
 
 // What stands before every fixed path here.
 const std::string& OwnRoot() {
@@ -73,8 +87,12 @@ namespace {
 void MakeShare() {
   std::filesystem::create_directories(OwnRoot() + "/etc/kavo");
   std::ofstream(kavo::local::SharesFile())
-      << R"({"shares": [{"name": "photo", "path": "/volume1/photo"}]})";
-  std::filesystem::create_directories(OwnRoot() + "/var/packages/Vexlo/etc");
+      << R"({"shares": [{"name": "photo", "path": "/volume1/photo"}, {"name": "own", "path": ")"
+      << OwnRoot() << R"(/own"}]})";
+  for (const char* const folder :
+       {"/own", "/tmp", "/var/packages/Vexlo/etc", "/var/lib/kavo/fileindex/queue"}) {
+    std::filesystem::create_directories(OwnRoot() + folder);
+  }
 }
 
 // Folders at three depths, as an administrator would have them.
@@ -188,6 +206,49 @@ void AskAndAppend(benchmark::State& state, const std::string& path) {
   }
 }
 
+// One iteration adds all of the events to a queue that holds what the file `before` holds.
+void AddEvents(benchmark::State& state, const std::string& before) {
+  const std::string queue = vexlo::sdk::SDKShare("own").GetQueuePath();
+  for (auto _ : state) {
+    state.PauseTiming();
+    std::filesystem::remove(queue);
+    if (!before.empty()) {
+      std::filesystem::copy_file(before, queue);
+      (void)QueueMgr(queue).IsFullPathHasReindex(OwnRoot());  // The one time that it is read.
+    }
+    state.ResumeTiming();
+    for (int i = 0; i < kCustomEvents; ++i) {
+      vexlo::fileindex::AddCustomEvent(8, OwnRoot() + "/own/" + std::to_string(i), "",
+                                       Json::Value());
+    }
+  }
+  std::filesystem::remove(queue);
+}
+
+void CountLines(benchmark::State& state, const std::string& path) {
+  std::string program = "wc";
+  std::string option = "-l";
+  std::string file = path;
+  char* const arguments[] = {program.data(), option.data(), file.data(), nullptr};
+  posix_spawn_file_actions_t actions;
+  posix_spawn_file_actions_init(&actions);
+  posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, "/dev/null", O_WRONLY, 0);
+  for (auto _ : state) {
+    pid_t child = 0;
+    int status = 0;
+    rusage used{};
+    if (posix_spawnp(&child, "wc", &actions, nullptr, arguments, environ) != 0 ||
+        wait4(child, &status, 0, &used) != child || status != 0) {
+      state.SkipWithError("wc failed");
+      break;
+    }
+    state.SetIterationTime(static_cast<double>(used.ru_utime.tv_sec + used.ru_stime.tv_sec) +
+                           static_cast<double>(used.ru_utime.tv_usec + used.ru_stime.tv_usec) *
+                               1e-6);
+  }
+  posix_spawn_file_actions_destroy(&actions);
+}
+
 void PassWithSimdjson(benchmark::State& state, const std::string& path) {
   for (auto _ : state) {
     const simdjson::padded_string text = simdjson::padded_string::load(path);
@@ -205,42 +266,68 @@ void PassWithSimdjson(benchmark::State& state, const std::string& path) {
 // Keeps the fastest repetition of each run, by name.
 class Figures : public benchmark::ConsoleReporter {
  public:
+  explicit Figures(bool json) : json_(json) {}
+
+  bool ReportContext(const Context& context) override {
+    return json_ || ConsoleReporter::ReportContext(context);
+  }
+
   void ReportRuns(const std::vector<Run>& runs) override {
     for (const Run& run : runs) {
       failed_ = failed_ || run.error_occurred;
       if (run.run_type == Run::RT_Iteration && !run.error_occurred) {
-        const double seconds = run.real_accumulated_time / static_cast<double>(run.iterations);
+        // Processor time, so that what else runs on the machine does not count; `wc` tells its own.
+        const double seconds = (run.run_name.function_name == "wc" ? run.real_accumulated_time
+                                                                   : run.cpu_accumulated_time) /
+                               static_cast<double>(run.iterations);
         auto [at, added] = seconds_.try_emplace(run.run_name.function_name, seconds);
         at->second = std::min(at->second, seconds);
       }
     }
-    ConsoleReporter::ReportRuns(runs);
+    if (!json_) {
+      ConsoleReporter::ReportRuns(runs);
+    }
   }
 
-  bool Print() const {
-    std::printf("\n%-16s %14s %26s\n", "", "ns a question", "times that of 10 folders");
-    for (const auto& [name, seconds] : seconds_) {
-      const size_t slash = name.find('/');
-      if (slash != std::string::npos) {
-        const double base = Seconds(name.substr(0, slash) + "/10");
-        std::printf("%-16s %14.0f %26.2f\n", name.c_str(), seconds * 1e9 / kPaths, seconds / base);
+  bool Failed() const { return failed_; }
+
+  std::vector<bench::Figure> Table() const {
+    std::vector<bench::Figure> table;
+    const auto add = [&](const char* name, const char* unit, double scale, double baseline,
+                         double aim) {
+      table.push_back(
+          {std::string("question/") + name, unit, Seconds(name) * scale, baseline * scale, aim});
+    };
+    for (const char* const count : {"10", "1000", "10000"}) {
+      for (const char* const kind : {"folders", "own", "linear"}) {
+        const std::string name = std::string(kind) + "/" + count;
+        if (!std::isnan(Seconds(name))) {
+          add(name.c_str(), "ns", 1e9 / kPaths, Seconds(std::string(kind) + "/10"), NAN);
+        }
       }
     }
-    std::printf("\n%-16s %14s %26s\n", "", "ms a question", "times simdjson's pass");
-    for (const char* const name : {"reindex", "again", "processing", "simdjson"}) {
-      std::printf("%-16s %14.3f %26.5f\n", name, Seconds(name) * 1e3,
-                  Seconds(name) / Seconds("simdjson"));
-    }
-    return !failed_;
+    const double passes = Seconds("simdjson") + Seconds("wc");
+    add("reindex", "ms", 1e3, passes, kMostOfPasses);
+    add("processing", "ms", 1e3, passes, NAN);
+    add("again", "ms", 1e3, passes, NAN);
+    add("simdjson", "ms", 1e3, NAN, NAN);
+    add("wc", "ms", 1e3, NAN, NAN);
+    add("custom/empty", "us/event", 1e6 / kCustomEvents, NAN, NAN);
+    add("custom/long", "us/event", 1e6 / kCustomEvents, Seconds("custom/empty"), kMostOfEmpty);
+    return table;
   }
 
  private:
-  // 0 for what was not run.
+  static constexpr double kMostOfPasses = 1.5;
+  static constexpr double kMostOfEmpty = 1.3;
+
+  // NAN for what was not run.
   double Seconds(const std::string& name) const {
     const auto found = seconds_.find(name);
-    return found == seconds_.end() ? 0 : found->second;
+    return found == seconds_.end() ? NAN : found->second;
   }
 
+  bool json_;
   std::map<std::string, double> seconds_;
   bool failed_ = false;
 };
@@ -248,17 +335,20 @@ class Figures : public benchmark::ConsoleReporter {
 }  // namespace
 
 int main(int argc, char** argv) {
-  const bool quick = argc > 1 && std::string_view(argv[1]) == "--quick";
-  if (quick) {
-    --argc;
-    std::rotate(argv + 1, argv + 2, argv + argc + 1);
-  }
+  const auto take = [&argc, argv](std::string_view option) {
+    char** const end = argv + argc;
+    char** const kept = std::remove(argv + 1, end, option);
+    argc = static_cast<int>(kept - argv);
+    return kept != end;
+  };
+  const bool quick = take("--quick");
+  const bool json = take("--json");
   MakeShare();
   const std::string queue = OwnRoot() + "/queue";
-  MakeQueue(queue, quick ? 10'000 : 1'000'000);
+  MakeQueue(queue, quick ? 100'000 : 1'000'000);
   const auto add = [quick](const std::string& name, auto run) {
-    benchmark::RegisterBenchmark(name.c_str(), run)
-        ->MinTime(quick ? 0.01 : 0.3)
+    return benchmark::RegisterBenchmark(name.c_str(), run)
+        ->MinTime(quick ? 0.01 : 0.2)
         ->Repetitions(quick ? 1 : 5);
   };
   for (const size_t count : {10, 1000, 10000}) {
@@ -274,13 +364,20 @@ int main(int argc, char** argv) {
   add("processing",
       [&](benchmark::State& state) { AskQueue(state, queue, &QueueMgr::IsFullPathProcessing); });
   add("again", [&](benchmark::State& state) { AskAndAppend(state, queue); });
+  add("custom/empty", [&](benchmark::State& state) { AddEvents(state, ""); });
+  add("custom/long", [&](benchmark::State& state) { AddEvents(state, queue); });
+  add("wc", [&](benchmark::State& state) { CountLines(state, queue); })->UseManualTime();
   add("simdjson", [&](benchmark::State& state) { PassWithSimdjson(state, queue); });
   benchmark::Initialize(&argc, argv);
   const bool usable = !benchmark::ReportUnrecognizedArguments(argc, argv);
-  Figures figures;
+  Figures figures(json);
   if (usable) {
     benchmark::RunSpecifiedBenchmarks(&figures);
   }
   std::filesystem::remove_all(OwnRoot());
-  return usable ? (figures.Print() ? 0 : 1) : 2;
+  if (!usable) {
+    return 2;
+  }
+  bench::Print(figures.Table(), json);
+  return figures.Failed() ? 1 : 0;
 }

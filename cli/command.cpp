@@ -21,40 +21,9 @@ void PrintOption(std::ostream& out, const Option& option) {
       << "\n";
 }
 
-const Option kHelp = {"--help", nullptr, "show this help"};
-
-void PrintOverview(std::ostream& out, const std::vector<Command>& commands) {
-  out << "usage: " << kName << " COMMAND [ARGUMENTS]\n\n"
-      << "Turns changes in folders into the least work for a search index.\n\ncommands:\n";
-  for (const Command& command : commands) {
-    out << "  " << std::left << std::setw(kOptionColumn) << command.name << command.summary << "\n";
-  }
-  out << "\n  " << std::setw(kOptionColumn) << "COMMAND --help"
-      << "explains a command\n  " << std::setw(kOptionColumn) << "--version"
-      << "prints the version\n\n"
-      << "exit status: 0 done (or yes), 1 nothing found (or no), 2 wrong usage, 3 failed\n";
-}
-
-void PrintUsage(std::ostream& out, const Command& command) {
-  out << "usage: " << kName << " " << command.name;
-  for (const Option& option : command.options) {
-    const bool required =
-        std::any_of(command.required_options.begin(), command.required_options.end(),
-                    [&](const char* name) { return strcmp(name, option.name) == 0; });
-    out << (required ? " " : " [") << option.name
-        << (option.value == nullptr ? "" : std::string(" ") + option.value)
-        << (required ? "" : "]");
-  }
-  out << " " << command.arguments << "\n";
-}
-
-void PrintHelp(std::ostream& out, const Command& command) {
-  PrintUsage(out, command);
-  out << "\n" << command.summary << "\n\n" << command.details << "\noptions:\n";
-  for (const Option& option : command.options) {
-    PrintOption(out, option);
-  }
-  PrintOption(out, kHelp);
+bool IsRequired(const Command& command, const Option& option) {
+  return std::any_of(command.required_options.begin(), command.required_options.end(),
+                     [&](const char* name) { return strcmp(name, option.name) == 0; });
 }
 
 // How many of the words name the command: all of its name's, or 0.
@@ -166,6 +135,42 @@ ExitStatus RunCommand(const Command& command, const std::vector<std::string>& wo
 }
 
 }  // namespace
+
+const char* const kToolSummary = "Turns changes in folders into the least work for a search index.";
+const char* const kExitStatusHelp =
+    "0 done (or yes), 1 nothing found (or no), 2 wrong usage, 3 failed";
+const Option kHelpOption = {"--help", nullptr, "show this help"};
+
+void PrintOverview(std::ostream& out, const std::vector<Command>& commands) {
+  out << "usage: " << kName << " COMMAND [ARGUMENTS]\n\n" << kToolSummary << "\n\ncommands:\n";
+  for (const Command& command : commands) {
+    out << "  " << std::left << std::setw(kOptionColumn) << command.name << command.summary << "\n";
+  }
+  out << "\n  " << std::setw(kOptionColumn) << "COMMAND --help"
+      << "explains a command\n  " << std::setw(kOptionColumn) << "--version"
+      << "prints the version\n\n"
+      << "exit status: " << kExitStatusHelp << "\n";
+}
+
+void PrintUsage(std::ostream& out, const Command& command) {
+  out << "usage: " << kName << " " << command.name;
+  for (const Option& option : command.options) {
+    const bool required = IsRequired(command, option);
+    out << (required ? " " : " [") << option.name
+        << (option.value == nullptr ? "" : std::string(" ") + option.value)
+        << (required ? "" : "]");
+  }
+  out << (*command.arguments == '\0' ? "" : " ") << command.arguments << "\n";
+}
+
+void PrintHelp(std::ostream& out, const Command& command) {
+  PrintUsage(out, command);
+  out << "\n" << command.summary << "\n\n" << command.details << "\noptions:\n";
+  for (const Option& option : command.options) {
+    PrintOption(out, option);
+  }
+  PrintOption(out, kHelpOption);
+}
 
 std::string Arguments::Get(const std::string& option) const {
   const auto found = options.find(option);

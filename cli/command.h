@@ -40,6 +40,9 @@ struct Option {
   const char* help;
 };
 
+// What --help, which every command has, says of itself.
+extern const Option kHelpOption;
+
 struct Arguments {
   std::vector<std::string> positional;
   std::map<std::string, std::string> options;  // By name; the value of a switch is empty.
@@ -70,6 +73,7 @@ std::vector<Command> ExtractCommands();
 std::vector<Command> FailedCommands();
 std::vector<Command> FolderCommands();
 std::vector<Command> IndexCommands();
+std::vector<Command> MetricsCommands();
 std::vector<Command> PauseCommands();
 std::vector<Command> QueueCommands();
 std::vector<Command> SearchCommands();
@@ -77,6 +81,19 @@ std::vector<Command> ShareCommands();
 std::vector<Command> StatusCommands();
 std::vector<Command> UpCommands();
 std::vector<Command> WatchCommands();
+std::vector<Command> WebCommands();
+
+// All of them, in the order of the overview.
+std::vector<Command> AllCommands();
+
+// Of the tool, and of every command: "0 done (or yes), ...".
+extern const char* const kToolSummary;
+extern const char* const kExitStatusHelp;
+
+// What --help shows, of the tool and of one command; and the line "usage: ..." alone.
+void PrintOverview(std::ostream& out, const std::vector<Command>& commands);
+void PrintHelp(std::ostream& out, const Command& command);
+void PrintUsage(std::ostream& out, const Command& command);
 
 // Finds the command, reads its arguments and runs it. `words` are the program's arguments without
 // its own name. Errors go to `console.err` as one sentence.

@@ -1,31 +1,16 @@
 // "fileindex pause" and "fileindex resume".
-#include <charconv>
 #include <ctime>
+#include <functional>
 
 #include "cli/command.h"
+#include "cli/pause.h"
 #include "cli/service.h"
-#include "cli/text.h"
-#include "common/error.h"
-#include "fileindex/paths.h"
 #include "fileindex/status_mgr.h"
 
 namespace vexlo::cli {
 namespace {
 
 using fileindex::StatusMgr;
-
-// The library counts the hours in seconds of 32 bits; a year is well within.
-constexpr int kMostHours = 366 * 24;
-
-int ReadHours(const std::string& text) {
-  int hours = 0;
-  const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), hours);
-  if (error != std::errc() || end != text.data() + text.size() || hours < 1 || hours > kMostHours) {
-    throw UsageError("'" + text + "' is no number of hours from 1 to " +
-                     std::to_string(kMostHours));
-  }
-  return hours;
-}
 
 std::string StateOnDisk() {
   const long resume_time = StatusMgr().GetPauseInfo();
@@ -43,16 +28,8 @@ std::string StateOnDisk() {
   return "paused until " + std::string(text, length);
 }
 
-// The state is saved before the daemon is told, so a failure to tell leaves it there.
-template <typename Work>
-ExitStatus Change(const Console& console, Work change) {
-  try {
-    StatusMgr status;
-    change(status);
-  } catch (const Error& error) {
-    if (error.GetErrorCode() != ERR_SYSTEM || IsIndexDaemonRunning()) {
-      throw;
-    }
+ExitStatus Change(const Console& console, const std::function<void(StatusMgr&)>& change) {
+  if (!ChangePause(change)) {
     console.err << NoIndexDaemon() << "; it will go by the status file when it starts\n";
   }
   console.out << "indexing is " << StateOnDisk() << "\n";
@@ -60,7 +37,7 @@ ExitStatus Change(const Console& console, Work change) {
 }
 
 ExitStatus Pause(const Arguments& arguments, const Console& console) {
-  const int hours = arguments.positional.empty() ? 0 : ReadHours(arguments.positional[0]);
+  const int hours = arguments.positional.empty() ? 0 : ReadPauseHours(arguments.positional[0]);
   return Change(console, [hours](StatusMgr& status) { status.Pause(hours); });
 }
 

@@ -8,6 +8,7 @@
 
 #include "cli/command.h"
 #include "cli/service.h"
+#include "cli/stack_report.h"
 #include "cli/text.h"
 #include "common/error.h"
 #include "common/json.h"
@@ -24,35 +25,6 @@ constexpr auto kInterval = std::chrono::seconds(1);
 constexpr const char* kWipeScreen = "\033[H\033[2J";
 
 const Option kJson = {"--json", nullptr, "the library's own JSON"};
-
-// The daemon's own answer, with "name" and "running". One that does not answer in time runs no more
-// than one that is not there.
-Json::Value AskAll() {
-  Json::Value all;
-  all["daemons"] = Json::Value(Json::arrayValue);
-  all["shares"] = Json::Value(Json::arrayValue);
-  std::map<std::string, Json::Value> watched;  // By queue file.
-  for (const DaemonPlace& place : LocalDaemons()) {
-    const Json::Value stats = AskStats(place.socket);
-    Json::Value daemon;
-    daemon["name"] = place.name;
-    daemon["running"] = !stats.isNull();
-    daemon["socket"] = place.socket;
-    all["daemons"].append(daemon);
-    for (const Json::Value& queue : stats["queues"]) {
-      watched[queue["queue"].asString()] = queue;
-    }
-    for (const Json::Value& share : stats["shares"]) {
-      all["shares"].append(share);
-    }
-  }
-  for (Json::Value& share : all["shares"]) {
-    share["watch"] = watched[share["queue"].asString()];
-  }
-  all["status"] = fileindex::GetIndexProcessingStatus();
-  all["resume_time"] = static_cast<Json::Int64>(fileindex::StatusMgr().GetPauseInfo());
-  return all;
-}
 
 // Operations a second of each share since the last time.
 class Rates {
@@ -113,7 +85,7 @@ std::string TableOf(const Json::Value& all, const std::map<std::string, double>&
 }
 
 void Show(const Arguments& arguments, const Console& console, Rates& rates, bool again) {
-  const Json::Value all = AskAll();
+  const Json::Value all = AskWholeStack();
   const std::map<std::string, double> by_share = rates.Take(all["shares"]);
   if (arguments.Has("--json")) {
     console.out << JsonToString(all) << "\n" << std::flush;

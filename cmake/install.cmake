@@ -7,6 +7,7 @@ set(fileindex_package ${CMAKE_INSTALL_LIBDIR}/cmake/fileindex)
 
 # fileindex_install_headers(FOLDER SUBFOLDER): the headers below FOLDER/SUBFOLDER, at the path from
 # FOLDER that their includes are spelled with; without those whose first comment says "Not installed."
+set(fileindex_installed_headers "")
 function(fileindex_install_headers folder subfolder)
   file(GLOB_RECURSE headers RELATIVE ${folder} CONFIGURE_DEPENDS ${folder}/${subfolder}/*.h)
   foreach(header IN LISTS headers)
@@ -16,8 +17,10 @@ function(fileindex_install_headers folder subfolder)
     if(marked EQUAL -1)
       get_filename_component(place ${header} DIRECTORY)
       install(FILES ${folder}/${header} DESTINATION ${fileindex_headers}/${place})
+      list(APPEND fileindex_installed_headers ${folder}|${header})
     endif()
   endforeach()
+  set(fileindex_installed_headers ${fileindex_installed_headers} PARENT_SCOPE)
 endfunction()
 
 fileindex_install_headers(${PROJECT_SOURCE_DIR}/src/include common)
@@ -67,3 +70,7 @@ install(FILES ${PROJECT_BINARY_DIR}/fileindex.pc DESTINATION ${CMAKE_INSTALL_LIB
 
 install(FILES ${PROJECT_SOURCE_DIR}/README.md ${PROJECT_SOURCE_DIR}/LICENSE
   DESTINATION ${CMAKE_INSTALL_DOCDIR})
+
+if(TARGET fileindex_manual)
+  include(cmake/manual.cmake)
+endif()

@@ -305,8 +305,12 @@ int RunDaemon(const DaemonOptions& options, int argc, char** argv,
   const std::vector<std::string> arguments(argv + std::min(argc, 1), argv + argc);
   const bool help = arguments == std::vector<std::string>{"--help"};
   if (help || !(options.arguments ? options.arguments(arguments) : arguments.empty())) {
-    fprintf(help ? stdout : stderr, "usage: %s%s%s\n", options.name.c_str(),
-            options.usage.empty() ? "" : " ", options.usage.c_str());
+    fprintf(
+        help ? stdout : stderr,
+        "usage: %s%s%s\n\nexit status: %d ended in order, %d failed (the log says why), %d wrong "
+        "usage, %d already running\n",
+        options.name.c_str(), options.usage.starts_with('\n') ? "" : " ", options.usage.c_str(),
+        kEnded, kFailed, kUsage, kAlreadyRunning);
     return help ? kEnded : kUsage;
   }
   OpenLog(options);

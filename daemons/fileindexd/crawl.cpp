@@ -104,7 +104,13 @@ IndexListing::IndexListing(std::string id, std::string root, std::string after)
     : id_(std::move(id)),
       root_(std::move(root)),
       after_(std::move(after)),
-      is_root_done_(root_ <= after_) {}
+      is_root_done_(root_ <= after_) {
+  AskForPage();
+}
+
+void IndexListing::AskForPage() {
+  next_page_ = std::async(std::launch::async, ListBelow, id_, root_, after_, kPage);
+}
 
 std::optional<IndexedPath> IndexListing::Next() {
   if (!is_root_done_) {
@@ -113,21 +119,15 @@ std::optional<IndexedPath> IndexListing::Next() {
       return found;
     }
   }
-  if (page_.empty() && !is_last_page_) {
-    for (IndexedPath& indexed : ListBelow(id_, root_, after_, kPage)) {
-      page_.push_back(std::move(indexed));
-    }
-    is_last_page_ = page_.size() < kPage;
-    if (!page_.empty()) {
+  if (next_ == page_.size() && next_page_.valid()) {
+    page_ = next_page_.get();
+    next_ = 0;
+    if (page_.size() == kPage) {
       after_ = page_.back().path;
+      AskForPage();
     }
   }
-  if (page_.empty()) {
-    return std::nullopt;
-  }
-  std::optional<IndexedPath> next(std::move(page_.front()));
-  page_.pop_front();
-  return next;
+  return next_ < page_.size() ? std::optional(std::move(page_[next_++])) : std::nullopt;
 }
 
 bool GoneList::Add(const std::string& path, bool with_all_below) {

@@ -3,8 +3,8 @@
 #define DAEMONS_FILEINDEXD_CRAWL_H_
 
 #include <cstdint>
-#include <deque>
 #include <functional>
+#include <future>
 #include <optional>
 #include <string>
 #include <unordered_set>
@@ -41,20 +41,26 @@ void MergeByPath(const NextOnDisk& next_on_disk, const NextIndexed& next_indexed
   }
 }
 
-// What the index has at and below a folder, page by page.
+// What the index has at and below a folder, page by page. The next page is asked for, by a thread
+// of its own, while one is gone through: so the walk over the disk and the engine are both at work.
+// What is written meanwhile at paths behind those that were given may be in it or not.
 class IndexListing {
  public:
+  // Begins with the first page at once.
   IndexListing(std::string id, std::string root, std::string after);
   // Throws as ListBelow() does.
   std::optional<IndexedPath> Next();
 
  private:
+  void AskForPage();
+
   const std::string id_;
   const std::string root_;
   std::string after_;
-  std::deque<IndexedPath> page_;
+  std::vector<IndexedPath> page_;
+  size_t next_ = 0;  // In the page.
   bool is_root_done_;
-  bool is_last_page_ = false;
+  std::future<std::vector<IndexedPath>> next_page_;  // Waited for where it is dropped.
 };
 
 // Paths that the index has and the disk has not, until they are deleted. What lies below one of

@@ -29,6 +29,7 @@ using fileindex::GetFileTypeName;
 constexpr Json::ArrayIndex kMostDeletes = 500;
 constexpr size_t kMostTaken = 10000;
 constexpr size_t kMostTouched = 100000;
+constexpr size_t kMostMoves = 100000;
 constexpr unsigned kMostLogged = 10;      // Of one code, in a cycle.
 constexpr char kByItself[] = "settings";  // The cause of a crawl that no operation asked for.
 
@@ -77,7 +78,7 @@ void Cycle::Handle(const fileindex::OP& op) {
     return;
   }
   const std::string path = node->GetPath();
-  stats_.CountOperation();
+  stats_.CountOperation(op.op);
   try {
     Carry(op, path);
   } catch (const Error& error) {
@@ -135,12 +136,15 @@ void Cycle::CarryKnown(const fileindex::OP& op, const std::string& path) {
       break;
     case fileindex::OP_UPDATE_DIRECTORY:
       Reconcile(path, op.data);
+      ReconcileMovedFrom(path, /*only_from_above=*/false);
       break;
     case fileindex::OP_RENAME:
       Rename(path, op.path_old);
+      ReconcileMovedFrom(path, /*only_from_above=*/true);
       break;
     case fileindex::OP_REINDEX:
       Reconcile(path, Json::Value());
+      ReconcileMovedFrom(path, /*only_from_above=*/false);
       break;
     case fileindex::OP_NONE:
     case fileindex::OP_QUEUE_CRASHED:
@@ -222,6 +226,7 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
     step = RenameStep::kReconcile;
   }
   if (step == RenameStep::kMove) {
+    NoteMove(path, path_old);
     if (now) {
       FinishMove(path, document->stamp, *now);
       // What lies below keeps what it was indexed with, unless other settings hold now.
@@ -250,7 +255,24 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
 bool Cycle::Move(const std::string& path, const std::string& path_old) {
   has_sent_ = true;
   try {
-    elastic::IndexRename(share_, path, path_old);
+    if (IsSameOrBelow(path_old, path)) {
+      elastic::IndexRename(share_, path, path_old);  // Some move to where others are.
+      return true;
+    }
+    MoveBelow(
+        id_, path, path_old, [this] { Check(); },
+        [this](const std::string& document, const FailedItem& item) {
+          if (OfOperation(item.code) != Consequence::kGoOn) {
+            throw Error(static_cast<ErrorCode>(item.code), item.reason);
+          }
+          Count(item.code, item.reason, document);
+        });
+    // Last: as long as it is at the old path, doing this again moves what is left there.
+    Json::Value requests(Json::arrayValue);
+    requests.append(MakeMove(id_, path, path_old));
+    for (const FailedItem& item : SendList(std::move(requests))) {
+      throw Error(static_cast<ErrorCode>(item.code), item.reason);
+    }
     return true;
   } catch (const Error& error) {
     if (OfOperation(error.GetErrorCode()) != Consequence::kGoOn) {
@@ -470,6 +492,51 @@ void Cycle::ForgetTaken(const std::string& path) {
   taken_.erase(path);
   // What lies below stands together, from "/" on and up to the byte behind it.
   taken_.erase(taken_.lower_bound(path + "/"), taken_.lower_bound(path + "0"));
+}
+
+void Cycle::NoteMove(const std::string& path, const std::string& path_old) {
+  if (moves_.size() < kMostMoves) {
+    moves_.emplace(path_old, path);
+  } else {
+    ReconcileMixed(path);  // At once, as it would not be known later.
+  }
+}
+
+// Compares where documents of the path have moved to in this cycle. A reindex, or a rename of
+// something else to the path, cancels what was pending there, a delete from before the move among
+// it; the move has then taken along a document that should have gone.
+void Cycle::ReconcileMovedFrom(const std::string& path, bool only_from_above) {
+  std::set<std::string> seen = {path};
+  std::vector<std::string> todo = {path};
+  const auto follow = [&](std::string moved_to) {
+    if (seen.insert(moved_to).second) {
+      todo.push_back(std::move(moved_to));
+    }
+  };
+  while (!todo.empty()) {
+    const std::string from = std::move(todo.back());
+    todo.pop_back();
+    const bool is_first = from == path;
+    std::string at = from;
+    if (is_first && only_from_above) {
+      at.resize(at.rfind('/'));
+    }
+    for (; !at.empty(); at.resize(at.rfind('/'))) {
+      const auto [first, last] = moves_.equal_range(at);
+      for (auto move = first; move != last; ++move) {
+        follow(move->second + from.substr(at.size()));
+      }
+    }
+    if (!is_first || !only_from_above) {
+      const auto last = moves_.lower_bound(from + "0");
+      for (auto move = moves_.lower_bound(from + "/"); move != last; ++move) {
+        follow(move->second);
+      }
+    }
+    if (!is_first && (only_from_above || !IsSameOrBelow(from, path))) {
+      ReconcileMixed(from);
+    }
+  }
 }
 
 void Cycle::NoteTouched(const std::string& path) {

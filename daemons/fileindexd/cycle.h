@@ -76,6 +76,8 @@ class Cycle {
   void NoteMissed(const std::string& path);
   void ForgetMissed(const std::string& path);
   void ForgetTaken(const std::string& path);
+  void NoteMove(const std::string& path, const std::string& path_old);
+  void ReconcileMovedFrom(const std::string& path, bool only_from_above);
   void NoteTouched(const std::string& path);
   bool WasTouched(const std::string& path) const;
   void FlushDeletes();
@@ -108,6 +110,8 @@ class Cycle {
   // so what happened at a path after a rename may be handed over before it.
   std::set<std::string> touched_;
   bool touched_too_much_ = false;
+  // Where this cycle has moved the documents of a path to, by the path.
+  std::multimap<std::string, std::string> moves_;
   bool inodes_count_ = false;  // In this crawl a document of another inode is another file's.
   std::set<std::string>
       moved_to_nothing_;  // Paths that documents were moved to, and nothing stood.

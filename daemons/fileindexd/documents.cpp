@@ -6,10 +6,13 @@
 
 #include <cerrno>
 #include <ctime>
+#include <deque>
+#include <future>
 #include <utility>
 
 #include "common/check.h"
 #include "common/json.h"
+#include "common/string.h"
 #include "daemons/common/unique_fd.h"
 #include "fileindex/comm.h"
 #include "fileindex/elastic_control/schema.h"
@@ -25,6 +28,9 @@ namespace {
 namespace field = fileindex::elastic::field;
 
 constexpr char kDelete[] = "document_del_by_id";
+constexpr unsigned kMovePage = 2000;
+// While the engine carries out one request it reads the next, and this side lists a third page.
+constexpr size_t kMostMovesUnderWay = 2;
 
 Json::Value MakeItem(const char* command, const std::string& id, const std::string& path) {
   Json::Value item;
@@ -43,12 +49,17 @@ void Send(Json::Value* response, const Json::Value& request) {
   SendRequestImpl(*response, request);
 }
 
-std::vector<IndexedPath> Query(const std::string& id, Json::Value query) {
+enum class Load { kPath, kPathAndStamp };
+
+std::vector<IndexedPath> Query(const std::string& id, Json::Value query,
+                               Load load = Load::kPathAndStamp) {
   Json::Value request;
   request["command"] = "document_get_by_query";
   request["data"]["id"] = id;
   query["load_field"].append(field::KAVOMDPath);
-  query["load_field"].append(kStampField);
+  if (load == Load::kPathAndStamp) {
+    query["load_field"].append(kStampField);
+  }
   request["data"]["query"] = std::move(query);
   Json::Value response;
   Send(&response, request);
@@ -89,6 +100,55 @@ void AddCopies(Json::Value* fields) {
   (*fields)[field::KAVOMDSearchAncestor] = extracted[field::KAVOMDParent];
 }
 
+std::vector<IndexedPath> QueryBelow(const std::string& id, const std::string& folder,
+                                    const std::string& after, unsigned count, Load load) {
+  Json::Value query;
+  query["qsl"]["prefix"][field::KAVOMDPath] = folder + "/";
+  query["size"] = count;
+  if (!after.empty()) {
+    query["after"] = after;
+  }
+  return Query(id, std::move(query), load);
+}
+
+// Requests on their way, each on a thread of its own.
+class MovesUnderWay {
+ public:
+  using Failed = std::function<void(const std::string& path, const FailedItem& item)>;
+
+  explicit MovesUnderWay(const Failed& failed) : failed_(failed) {}
+
+  void Send(Json::Value requests, std::vector<std::string> paths) {
+    if (sent_.size() == kMostMovesUnderWay) {
+      AwaitFirst();
+    }
+    sent_.push_back(
+        {std::move(paths), std::async(std::launch::async, SendList, std::move(requests))});
+  }
+  void AwaitAll() {
+    while (!sent_.empty()) {
+      AwaitFirst();
+    }
+  }
+
+ private:
+  struct Sent {
+    std::vector<std::string> paths;
+    std::future<std::vector<FailedItem>> failed;
+  };
+
+  void AwaitFirst() {
+    Sent first = std::move(sent_.front());
+    sent_.pop_front();
+    for (const FailedItem& item : first.failed.get()) {
+      failed_(first.paths.at(item.at), item);
+    }
+  }
+
+  const Failed& failed_;
+  std::deque<Sent> sent_;  // Waited for where they are dropped.
+};
+
 }  // namespace
 
 std::optional<IndexedPath> FindDocument(const std::string& id, const std::string& path) {
@@ -100,13 +160,7 @@ std::optional<IndexedPath> FindDocument(const std::string& id, const std::string
 
 std::vector<IndexedPath> ListBelow(const std::string& id, const std::string& folder,
                                    const std::string& after, unsigned count) {
-  Json::Value query;
-  query["qsl"]["prefix"][field::KAVOMDPath] = folder + "/";
-  query["size"] = count;
-  if (!after.empty()) {
-    query["after"] = after;
-  }
-  return Query(id, std::move(query));
+  return QueryBelow(id, folder, after, count, Load::kPathAndStamp);
 }
 
 Json::Value MakePut(const std::string& id, const std::string& path, bool content) {
@@ -209,6 +263,55 @@ std::vector<FailedItem> SendList(Json::Value requests) {
     }
   }
   return failed;
+}
+
+Json::Value MakeMove(const std::string& id, const std::string& path, const std::string& path_old) {
+  const std::string name = Basename(path);
+  const std::string parent = Dirname(path);
+  const std::string extension = GetFileExtension(path, /*lower=*/true);
+  Json::Value item = MakeItem("document_set_by_id", id, path_old);
+  Json::Value& fields = item["data"]["data"];
+  fields[field::KAVOMDPath] = path;
+  fields[field::KAVOMDParent] = parent;
+  fields[field::KAVOMDFSName] = name;
+  fields[field::KAVOMDSearchFileName] = name;
+  fields[field::KAVOMDSearchAncestor] = parent;
+  fields[field::KAVOMDDisplayName] = name;
+  fields[field::KAVOMDKind] = extension;
+  fields[field::KAVOMDExtension] = extension;
+  return item;
+}
+
+void MoveBelow(const std::string& id, const std::string& path, const std::string& path_old,
+               const std::function<void()>& check,
+               const std::function<void(const std::string& path, const FailedItem& item)>& failed) {
+  MovesUnderWay moves(failed);
+  std::vector<IndexedPath> page;
+  std::string after;
+  do {
+    check();
+    // What has moved lies before this page, so nothing need be committed for it to be right.
+    page = QueryBelow(id, path_old, after, kMovePage, Load::kPath);
+    if (!page.empty()) {
+      after = page.back().path;
+    }
+    Json::Value requests(Json::arrayValue);
+    std::vector<std::string> paths;
+    paths.reserve(page.size());
+    for (IndexedPath& document : page) {
+      const std::string moved = path + document.path.substr(path_old.size());
+      Json::Value item = MakeItem("document_set_by_id", id, document.path);
+      Json::Value& fields = item["data"]["data"];
+      fields[field::KAVOMDPath] = moved;
+      fields[field::KAVOMDParent] = fields[field::KAVOMDSearchAncestor] = Dirname(moved);
+      requests.append(std::move(item));
+      paths.push_back(std::move(document.path));
+    }
+    if (!paths.empty()) {
+      moves.Send(std::move(requests), std::move(paths));
+    }
+  } while (page.size() == kMovePage);
+  moves.AwaitAll();
 }
 
 }  // namespace vexlo::fileindexd

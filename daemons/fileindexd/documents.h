@@ -5,6 +5,7 @@
 
 #include <json/value.h>
 
+#include <functional>
 #include <optional>
 #include <string>
 #include <vector>
@@ -69,6 +70,18 @@ struct FailedItem {
 
 // Sends the requests as one; those that failed. Throws as above for the list as a whole.
 std::vector<FailedItem> SendList(Json::Value requests);
+
+// The request that gives the document at `path_old` the path `path`, and what follows from it.
+Json::Value MakeMove(const std::string& id, const std::string& path, const std::string& path_old);
+
+// Gives all documents below the folder `path_old` the same place below `path`; neither folder lies
+// in the other. Nothing of what a document says besides changes. Returns when the engine has
+// answered, and commits nothing. `check` is called before each request and may throw, as sending
+// may: some documents have moved then, and the rest moves when it is called again. `failed` is told
+// of each document that the engine does not move.
+void MoveBelow(const std::string& id, const std::string& path, const std::string& path_old,
+               const std::function<void()>& check,
+               const std::function<void(const std::string& path, const FailedItem& item)>& failed);
 
 }  // namespace vexlo::fileindexd
 

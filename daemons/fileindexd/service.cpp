@@ -36,9 +36,13 @@ Json::Value Success() {
   return answer;
 }
 
+// A worker keeps its state in a file of the share's name, which must lead to no other folder.
 std::string ShareOf(const Json::Value& data) {
   std::string share;
   GetJsonValue(share, data, "share_name", /*required=*/true);
+  VEXLO_CHECK(share.empty() || share == "." || share == ".." ||
+                  share.find_first_of(std::string_view("/\0", 2)) != std::string::npos,
+              ERR_BAD_PARAMETER, "no name of a share: " + JsonToString(share));
   return share;
 }
 

@@ -10,6 +10,14 @@ bool IsAtWork(WorkerState state) {
   return state == WorkerState::kProcessing || state == WorkerState::kCrawling;
 }
 
+Json::Value Counts(const std::map<int, uint64_t>& counts) {
+  Json::Value value(Json::objectValue);
+  for (const auto& [number, count] : counts) {
+    value[std::to_string(number)] = static_cast<Json::UInt64>(count);
+  }
+  return value;
+}
+
 }  // namespace
 
 void Stats::SetState(WorkerState state) {
@@ -21,9 +29,10 @@ void Stats::SetState(WorkerState state) {
   state_ = state;
 }
 
-void Stats::CountOperation() {
+void Stats::CountOperation(fileindex::FileIndexOP kind) {
   const std::lock_guard lock(mutex_);
   ++operations_;
+  ++kinds_[kind];
 }
 
 void Stats::CountFiles(uint64_t count) {
@@ -48,14 +57,12 @@ Json::Value Stats::ToJson() const {
   Json::Value value(Json::objectValue);
   value["state"] = kStateNames[static_cast<size_t>(state_)];
   value["operations"] = static_cast<Json::UInt64>(operations_);
+  value["kinds"] = Counts(kinds_);
   value["files"] = static_cast<Json::UInt64>(files_);
   const std::chrono::duration<double> seconds = Clock::now() - began_;
   const bool has_rate = IsAtWork(state_) && seconds.count() > 0;
   value["rate"] = has_rate ? static_cast<double>(files_ - files_before_) / seconds.count() : 0.0;
-  value["errors"] = Json::Value(Json::objectValue);
-  for (const auto& [code, count] : errors_) {
-    value["errors"][std::to_string(code)] = static_cast<Json::UInt64>(count);
-  }
+  value["errors"] = Counts(errors_);
   value["last_error"] = last_error_;
   value["progress"]["done"] = static_cast<Json::UInt64>(done_);
   value["progress"]["found"] = static_cast<Json::UInt64>(found_);

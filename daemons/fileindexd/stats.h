@@ -10,6 +10,8 @@
 #include <mutex>
 #include <string>
 
+#include "fileindex/optree/op.h"
+
 namespace vexlo::fileindexd {
 
 enum class WorkerState { kIdle, kProcessing, kCrawling, kPaused, kUnavailable, kFailing };
@@ -18,14 +20,15 @@ enum class WorkerState { kIdle, kProcessing, kCrawling, kPaused, kUnavailable, k
 class Stats {
  public:
   void SetState(WorkerState state);
-  void CountOperation();
+  void CountOperation(fileindex::FileIndexOP kind);
   // Documents that the engine has taken.
   void CountFiles(uint64_t count);
   void CountError(int code, const std::string& reason);
   // Where a crawl stands: how many paths it has met on the disk, and is done with.
   void SetProgress(uint64_t done, uint64_t found);
 
-  // {"state","operations","files","rate","errors":{CODE:COUNT},"last_error","progress"}. The rate
+  // {"state","operations","kinds":{NUMBER:COUNT},"files","rate","errors":{CODE:COUNT},"last_error",
+  // "progress"}; kinds by the numbers of FileIndexOP. The rate
   // is documents a second since the worker last began to work, 0 while it does not.
   Json::Value ToJson() const;
 
@@ -35,6 +38,7 @@ class Stats {
   mutable std::mutex mutex_;
   WorkerState state_ = WorkerState::kIdle;
   uint64_t operations_ = 0;
+  std::map<int, uint64_t> kinds_;
   uint64_t files_ = 0;
   uint64_t files_before_ = 0;  // When the work began.
   Clock::time_point began_;

@@ -72,7 +72,7 @@ void SetText(Record* record, uint32_t id, std::string text, const std::string& p
     record->PutBare(id, Kind::kParent);
   } else if (slash != std::string::npos && text == std::string_view(path).substr(slash + 1)) {
     record->PutBare(id, Kind::kName);
-  } else if (text.size() >= kBodyBytes) {
+  } else if (text.size() >= kBodyBytes && id < kBodyFields) {
     record->Fill(id, std::move(text));
   } else {
     record->Put(id, Kind::kString, std::move(text));

@@ -13,6 +13,9 @@
 
 namespace vexlo::elasticd {
 
+// Fields with this number or a higher one have their texts in the record, however long.
+constexpr uint32_t kBodyFields = 65536;
+
 // `path` is always the path of the document that the item belongs to.
 
 // Sets the field to a value that is not null. Numbers and truth values are converted where nothing

@@ -139,6 +139,7 @@ Json::Value Engine::Dispatch(const Json::Value& request) {
     WithStore(RequiredText(data, "id"), [&](Store& store) {
       store.Write([&](Writer& writer, Session& /*session*/) { RunWrite(writer, command, data); });
     });
+    NoteChange();
     return Success();
   }
   if (command == "document_get_by_query") {
@@ -233,6 +234,7 @@ void Engine::CompoundRun(const std::string& id, std::span<const Json::Value* con
             items.size(), [&](size_t i) { run_item(writer, i); }, refused);
       });
     });
+    NoteChange();
   } catch (const Failure& failure) {
     for (size_t i = 0; i < items.size(); ++i) {
       refused(i, failure);
@@ -511,7 +513,21 @@ Json::Value Engine::Search(const Json::Value& data, const JudgePaths& judge) {
   return reply;
 }
 
-void Engine::CommitIdle(std::chrono::steady_clock::duration idle) {
+void Engine::NoteChange() {
+  const std::lock_guard lock(change_mutex_);
+  if (!changed_) {
+    changed_ = true;
+    change_noted_.notify_all();
+  }
+}
+
+void Engine::AwaitChange(const std::stop_token& stop) {
+  std::unique_lock lock(change_mutex_);
+  change_noted_.wait(lock, stop, [this] { return changed_; });
+  changed_ = false;
+}
+
+bool Engine::CommitIdle(std::chrono::steady_clock::duration idle) {
   std::vector<SlotPtr> slots;
   {
     const std::lock_guard lock(registry_mutex_);
@@ -519,17 +535,17 @@ void Engine::CommitIdle(std::chrono::steady_clock::duration idle) {
       slots.push_back(slot);
     }
   }
+  bool left = false;
   for (const SlotPtr& slot : slots) {
     const Gate::Visit visit(slot->gate);
     try {
-      if (slot->store != nullptr) {
-        slot->store->CommitIdle(idle);
-      }
+      left = (slot->store != nullptr && slot->store->CommitIdle(idle)) || left;
     } catch (const std::exception& error) {
       LogLine(VEXLO_SOURCE, __LINE__,
               "committing failed, id=" + slot->id + ", reason=" + error.what());
     }
   }
+  return left;
 }
 
 }  // namespace vexlo::elasticd

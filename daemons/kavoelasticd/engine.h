@@ -6,11 +6,13 @@
 #include <json/value.h>
 
 #include <chrono>
+#include <condition_variable>
 #include <functional>
 #include <map>
 #include <memory>
 #include <mutex>
 #include <span>
+#include <stop_token>
 #include <string>
 
 #include "daemons/kavoelasticd/gate.h"
@@ -47,9 +49,12 @@ class Engine {
   // read: any other command is refused, and so are pages of over 10,000 hits.
   Json::Value HandleSearch(const Json::Value& request, const JudgePaths& judge);
 
-  // Commits what was written longer ago than `idle` to any index. To be called now and then by
-  // whoever runs the engine; never throws.
-  void CommitIdle(std::chrono::steady_clock::duration idle);
+  // Commits what was written longer ago than `idle` to any index, and tidies such indexes up in
+  // steps. To be called again and again by whoever runs the engine until it says that nothing is
+  // left to do; then once AwaitChange() has returned. Never throws.
+  bool CommitIdle(std::chrono::steady_clock::duration idle);
+  // Waits until something was written since the last call, or a stop is requested.
+  void AwaitChange(const std::stop_token& stop);
 
  private:
   struct Slot;
@@ -80,11 +85,16 @@ class Engine {
   void CloseCleanly(Slot& slot);
   void MarkDamaged(Slot& slot, const std::string& reason);
   void SetState(Slot& slot, State state);
+  void NoteChange();
 
   std::mutex admin_mutex_;     // One command on the indexes themselves at a time.
   std::mutex registry_mutex_;  // Guards the two below.
   Registry registry_;
   std::map<std::string, SlotPtr> slots_;  // By id, as in the registry.
+
+  std::mutex change_mutex_;
+  std::condition_variable_any change_noted_;
+  bool changed_ = false;  // Guarded by change_mutex_.
 };
 
 }  // namespace vexlo::elasticd

@@ -12,6 +12,7 @@
 
 #include "daemons/kavoelasticd/engine.h"
 #include "daemons/kavoelasticd/judge.h"
+#include "daemons/kavoelasticd/request_stats.h"
 #include "daemons/kavoelasticd/server.h"
 #include "kavo/local/shares.h"
 
@@ -19,13 +20,17 @@ namespace {
 
 using namespace std::chrono_literals;
 
-// Commits what clients write and forget to commit, until it is stopped.
+// Commits what clients write and forget to commit, and tidies up behind them, until it is stopped.
+// Waits for nothing but a change once that is done.
 void CommitIdle(const std::stop_token& stop, vexlo::elasticd::Engine& engine) {
   std::mutex mutex;
   std::condition_variable_any stopped;
   std::unique_lock lock(mutex);
-  while (!stopped.wait_for(lock, stop, 1s, [&stop] { return stop.stop_requested(); })) {
-    engine.CommitIdle(5s);
+  while (!stop.stop_requested()) {
+    engine.AwaitChange(stop);
+    do {
+      stopped.wait_for(lock, stop, 1s, [&stop] { return stop.stop_requested(); });
+    } while (!stop.stop_requested() && engine.CommitIdle(5s));
   }
 }
 
@@ -46,8 +51,10 @@ int main(int argc, char** argv) {
       return engine.HandleSearch(
           request, sees_all ? vexlo::elasticd::JudgePaths() : vexlo::elasticd::JudgePaths(ask));
     };
-    vexlo::elasticd::Serve(
-        daemon, [&engine](const Json::Value& request) { return engine.Handle(request); }, search,
-        judge->IsThere());
+    vexlo::elasticd::RequestStats stats;
+    const auto answer = [&](const Json::Value& request) {
+      return stats.Answer(request, [&](const Json::Value& asked) { return engine.Handle(asked); });
+    };
+    vexlo::elasticd::Serve(daemon, answer, search, judge->IsThere());
   });
 }

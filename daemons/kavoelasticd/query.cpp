@@ -108,6 +108,7 @@ void CollectWords(Session& session, const Condition& condition, const Field& fie
   if (session.words.QueryTokens(text, Cut::kPrefixQuery).empty()) {
     return;
   }
+  session.SettleTexts();
   const std::string phrase = Quote(text) + (prefix ? " *" : "");
   if (field.lookup == Lookup::kText) {
     Sql rows(session.db, "SELECT rowid FROM texts WHERE texts MATCH ?");
@@ -266,6 +267,7 @@ std::vector<int64_t> FindGrams(Session& session, const std::string& part) {
   }
   std::vector<int64_t> ids;
   if (!match.empty()) {
+    session.SettleTexts();
     Sql rows(session.db, "SELECT rowid FROM grams WHERE grams MATCH ?");
     Collect(rows.Text(match), &ids);
   }

@@ -265,11 +265,24 @@ class Filter {
   std::vector<std::string> types_;
 };
 
-std::vector<SearchHit> HitsOf(Session& session, const SearchRequest& request, const Ids& ids,
+// Removes what the text indexes know but is no document any more. `ids` are in order.
+void RemoveGone(Session& session, Ids* ids) {
+  Sql rows(session.db, "SELECT id FROM gone ORDER BY id");
+  Ids gone;
+  while (rows.Row()) {
+    gone.push_back(rows.IntAt(0));
+  }
+  std::erase_if(*ids, [&](int64_t id) { return std::binary_search(gone.begin(), gone.end(), id); });
+}
+
+std::vector<SearchHit> HitsOf(Session& session, const SearchRequest& request, Ids ids,
                               const Filter& filter) {
   std::vector<SearchHit> hits;
   hits.reserve(ids.size());
   const bool by_id = filter.Open() && request.order == Order::kRelevance;
+  if (by_id) {
+    RemoveGone(session, &ids);
+  }
   for (const int64_t id : ids) {
     SearchHit hit;
     hit.id = id;
@@ -320,7 +333,7 @@ std::vector<SearchHit> FindHits(Session& session, const SearchRequest& request) 
     Ids found = FindGrams(session, request.name);
     ids = ids ? Intersect(*ids, found) : std::move(found);
   }
-  std::vector<SearchHit> hits = HitsOf(session, request, *ids, filter);
+  std::vector<SearchHit> hits = HitsOf(session, request, *std::move(ids), filter);
   if (!request.terms.empty()) {
     Ids left;
     for (const SearchHit& hit : hits) {
@@ -348,6 +361,9 @@ std::vector<Wanted> WantedOf(Session& session, const SearchRequest& request) {
 
 std::string SnippetOf(Session& session, StoredDocument* document,
                       const std::vector<Wanted>& wanted) {
+  if (wanted.empty()) {
+    return "";
+  }
   // Long texts first: a name is shown anyway.
   for (const bool long_ones : {true, false}) {
     const std::vector<Item> items = document->record.Items();

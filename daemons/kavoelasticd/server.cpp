@@ -1,6 +1,9 @@
 #include "daemons/kavoelasticd/server.h"
 
+#include <malloc.h>
+
 #include <atomic>
+#include <cstddef>
 #include <optional>
 #include <thread>
 #include <utility>
@@ -12,6 +15,8 @@
 
 namespace vexlo::elasticd {
 namespace {
+
+constexpr size_t kLongBytes = size_t{1} << 20;
 
 std::string SocketPath() { return kavo::local::Root() + "/var/run/kavoelasticd.sock"; }
 
@@ -52,11 +57,19 @@ daemon::FrameServerOptions SearchOptions(const SearchHandler& handler, bool is_o
 }  // namespace
 
 std::string AnswerText(const Handler& handler, const std::string& request) {
-  Json::Value value;
-  if (!JsonFromString(value, request) || !value.isObject()) {
-    return ErrorText(ERR_BAD_PARAMETER, "the request is no JSON object");
+  std::string reply;
+  {
+    Json::Value value;
+    if (!JsonFromString(value, request) || !value.isObject()) {
+      return ErrorText(ERR_BAD_PARAMETER, "the request is no JSON object");
+    }
+    reply = JsonToString(handler(value));
   }
-  return JsonToString(handler(value));
+  // Each worker would keep as much as its longest request took.
+  if (request.size() + reply.size() >= kLongBytes) {
+    malloc_trim(0);
+  }
+  return reply;
 }
 
 daemon::DaemonOptions ElasticdOptions() {

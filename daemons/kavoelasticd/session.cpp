@@ -7,6 +7,7 @@
 
 #include "common/json.h"
 #include "daemons/kavoelasticd/failure.h"
+#include "daemons/kavoelasticd/pack.h"
 
 namespace vexlo::elasticd {
 namespace {
@@ -26,7 +27,12 @@ StoredDocument Stored(const Sql& row) {
 
 }  // namespace
 
-std::string FormatVersion() { return "1, Unicode " U_UNICODE_VERSION; }
+std::string FormatVersion() { return "2, Unicode " U_UNICODE_VERSION; }
+
+int64_t BodyId(int64_t document, uint32_t field) {
+  static_assert(kBodyFields == 1 << 16);
+  return static_cast<int64_t>((static_cast<uint64_t>(document) << 16) | field);
+}
 
 std::string LanguageOf(const Json::Value& settings) {
   if (!settings.isObject() || !settings.isMember("language")) {
@@ -54,9 +60,11 @@ void Session::MakeTables(const IndexInfo& info) {
       "CREATE TABLE fields(id INTEGER PRIMARY KEY, name BLOB NOT NULL UNIQUE);"
       "CREATE TABLE docs(id INTEGER PRIMARY KEY, path BLOB NOT NULL UNIQUE, ext BLOB,"
       " size INTEGER, mtime INTEGER);"
+      // Documents that the text indexes are still to forget, from records and bodies.
+      "CREATE TABLE gone(id INTEGER PRIMARY KEY, path BLOB NOT NULL);"
       "CREATE TABLE records(id INTEGER PRIMARY KEY, record BLOB NOT NULL);"
-      "CREATE TABLE bodies(id INTEGER, field INTEGER, text BLOB NOT NULL,"
-      " PRIMARY KEY(id, field)) WITHOUT ROWID;"
+      // Under their own number, as a page of any other table is left half empty by texts.
+      "CREATE TABLE bodies(id INTEGER PRIMARY KEY, text BLOB NOT NULL);"
       "CREATE TABLE exact(field INTEGER, value BLOB, id INTEGER,"
       " PRIMARY KEY(field, value, id)) WITHOUT ROWID;"
       "CREATE VIRTUAL TABLE texts USING fts5(" +
@@ -65,9 +73,16 @@ void Session::MakeTables(const IndexInfo& info) {
       ";CREATE VIRTUAL TABLE grams USING fts5(" + Columns('g', schema.GramColumns().size()) +
       "content='',columnsize=0,detail=none,tokenize='kavograms');"
       // The default of 1 MB writes many small segments, which are then merged again and again.
-      "INSERT INTO texts(texts, rank) VALUES('hashsize', 16777216);"
-      "INSERT INTO words(words, rank) VALUES('hashsize', 8388608);"
-      "INSERT INTO grams(grams, rank) VALUES('hashsize', 8388608);");
+      "INSERT INTO texts(texts, rank) VALUES('hashsize', 8388608);"
+      "INSERT INTO words(words, rank) VALUES('hashsize', 4194304);"
+      "INSERT INTO grams(grams, rank) VALUES('hashsize', 4194304);"
+      // A page of an index fills a page of the file, and a commit merges less; Store::Rest() does.
+      "INSERT INTO texts(texts, rank) VALUES('pgsz', 8000);"
+      "INSERT INTO words(words, rank) VALUES('pgsz', 8000);"
+      "INSERT INTO grams(grams, rank) VALUES('pgsz', 8000);"
+      "INSERT INTO texts(texts, rank) VALUES('automerge', 8);"
+      "INSERT INTO words(words, rank) VALUES('automerge', 8);"
+      "INSERT INTO grams(grams, rank) VALUES('automerge', 8);");
   const std::pair<const char*, std::string> rows[] = {
       {"version", FormatVersion()},
       {"token", info.token},
@@ -153,11 +168,11 @@ void Session::FillBody(int64_t id, Record* record, uint32_t field) {
   if (item == nullptr || item->kind != Kind::kBody || item->bytes.data() != nullptr) {
     return;
   }
-  Sql row(db, "SELECT text FROM bodies WHERE id = ? AND field = ?");
-  if (!row.Int(id).Int(field).Row()) {
+  Sql row(db, "SELECT text FROM bodies WHERE id = ?");
+  if (!row.Int(BodyId(id, field)).Row()) {
     throw Failure(Code::kIndexDamaged, "the text of a document is missing");
   }
-  record->Fill(field, row.StringAt(0));
+  record->Fill(field, Unpack(row.BytesAt(0)));
 }
 
 Selection Session::Select(const std::vector<std::string>& names) {

@@ -5,9 +5,11 @@
 #include <json/value.h>
 
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <string>
 #include <unordered_map>
+#include <utility>
 #include <vector>
 
 #include "daemons/kavoelasticd/document.h"
@@ -32,6 +34,9 @@ std::string LanguageOf(const Json::Value& settings);
 // Of the tables and of what cuts texts into words: a text index forgets only what is cut as it was
 // when it was learnt, so an index of another version is made anew.
 std::string FormatVersion();
+
+// The number of a text of its own: of the document, then the field, which is below kBodyFields.
+int64_t BodyId(int64_t document, uint32_t field);
 
 struct StoredDocument {
   int64_t id = 0;
@@ -68,6 +73,15 @@ class Session {
   // After a rollback, numbers may be given anew.
   void ForgetFields();
 
+  // Called before a text index is asked, for changes that are not in it yet. Not set, or what was
+  // written waits for nothing.
+  void SetBeforeTexts(std::function<void()> before) { before_texts_ = std::move(before); }
+  void SettleTexts() {
+    if (before_texts_) {
+      before_texts_();
+    }
+  }
+
   std::optional<StoredDocument> Load(int64_t id);
   std::optional<StoredDocument> LoadByPath(const std::string& path);
   // Reads the text of a kBody item that is not known yet, into the record.
@@ -77,6 +91,8 @@ class Session {
   Json::Value Fields(StoredDocument* document, const Selection& selection);
 
  private:
+  std::function<void()> before_texts_;
+
   void ReadFields();
   // Whether every name that is not known has no number: only this connection gives them.
   const bool gives_numbers_;

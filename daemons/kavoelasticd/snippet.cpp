@@ -17,9 +17,16 @@ struct Match {
   size_t word;  // Which of the wanted words.
 };
 
+// Up to where the best start is certain, and what is shown from there ends.
 std::vector<Match> Matches(WordCutter& words, std::string_view text,
                            const std::vector<Wanted>& wanted) {
   std::vector<Match> matches;
+  size_t count = 0;
+  for (const Wanted& term : wanted) {
+    count += term.tokens.size();
+  }
+  std::vector<size_t> last(count, std::string_view::npos);  // Where each wanted word stood last.
+  size_t stop = std::string_view::npos;
   words.Words(text, Cut::kDocument, [&](const Token& token) {
     size_t word = 0;
     for (const Wanted& term : wanted) {
@@ -29,10 +36,16 @@ std::vector<Match> Matches(WordCutter& words, std::string_view text,
                               : token.text == term.tokens[i];
         if (fits && (matches.empty() || matches.back().begin != token.begin)) {
           matches.push_back({token.begin, token.end, word});
+          last[word] = token.begin;
+          const auto [first, latest] = std::minmax_element(last.begin(), last.end());
+          if (stop == std::string_view::npos && *latest != std::string_view::npos &&
+              token.end - *first < kShownBytes) {
+            stop = token.end + kShownBytes;
+          }
         }
       }
     }
-    return true;
+    return token.begin <= stop;
   });
   return matches;
 }

@@ -77,6 +77,7 @@ void Connection::Run(const std::string& sql) {
 
 bool Connection::InTransaction() const { return sqlite3_get_autocommit(db_.get()) == 0; }
 int64_t Connection::LastInsertId() const { return sqlite3_last_insert_rowid(db_.get()); }
+int64_t Connection::TotalChanges() const { return sqlite3_total_changes64(db_.get()); }
 
 Connection::Idle::value_type& Connection::IdleOf(std::string_view sql) {
   const auto found = idle_.find(sql);

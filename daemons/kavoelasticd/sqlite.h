@@ -56,6 +56,8 @@ class Connection {
   void Run(const std::string& sql);
   bool InTransaction() const;
   int64_t LastInsertId() const;
+  // Rows changed since it was opened.
+  int64_t TotalChanges() const;
   // What the SQL function member(ID) answers with from now on; `members` outlives its use.
   void SetMembers(const std::vector<bool>* members) { *members_ = members; }
 

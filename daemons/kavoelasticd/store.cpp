@@ -1,5 +1,6 @@
 #include "daemons/kavoelasticd/store.h"
 
+#include <malloc.h>
 #include <sys/stat.h>
 
 #include <cerrno>
@@ -16,6 +17,9 @@ namespace {
 
 constexpr size_t kCommitAfter = 20'000;
 constexpr size_t kIdleReaders = 8;
+// Of a text index, 8 KB each: some hundredths of a second.
+constexpr int64_t kMergedPages = 500;
+constexpr int kStepsAtOnce = 10;
 
 [[noreturn]] void Damaged(const std::string& what) { throw Failure(Code::kIndexDamaged, what); }
 
@@ -76,8 +80,8 @@ void Store::CheckDatabase(Connection& db, const std::string& token) {
   }
   Sql tables(db,
              "SELECT count(*) FROM sqlite_master WHERE name IN"
-             "('meta','fields','docs','records','bodies','exact','texts','words','grams')");
-  if (!tables.Row() || tables.IntAt(0) != 9) {
+             "('meta','fields','docs','gone','records','bodies','exact','texts','words','grams')");
+  if (!tables.Row() || tables.IntAt(0) != 10) {
     Damaged("the database in " + folder_ + " is not an index");
   }
   if (Meta(db, "version") != FormatVersion()) {
@@ -125,6 +129,7 @@ Store::~Store() {
 void Store::Write(const std::function<void(Writer&, Session&)>& change) {
   const std::lock_guard lock(write_mutex_);
   uncommitted_ = true;
+  at_rest_ = false;
   last_change_ = std::chrono::steady_clock::now();
   try {
     change(*writer_, *write_session_);
@@ -215,14 +220,49 @@ void Store::CommitQuietly() {
   }
 }
 
-void Store::CommitIdle(std::chrono::steady_clock::duration idle) {
-  if (!uncommitted_) {
-    return;
+bool Store::CommitIdle(std::chrono::steady_clock::duration idle) {
+  for (int step = 0; step < kStepsAtOnce && !at_rest_; ++step) {
+    // Given back after each step, and whoever writes meanwhile ends the loop.
+    const std::unique_lock lock(write_mutex_, std::try_to_lock);
+    if (!lock.owns_lock() || std::chrono::steady_clock::now() - last_change_ < idle) {
+      return true;
+    }
+    if (uncommitted_) {
+      CommitQuietly();
+    }
+    try {
+      at_rest_ = !Rest();
+    } catch (const std::exception& error) {
+      LogLine(VEXLO_SOURCE, __LINE__,
+              "tidying failed, index=" + folder_ + ", reason=" + error.what());
+      at_rest_ = true;
+    }
   }
-  const std::unique_lock lock(write_mutex_, std::try_to_lock);
-  if (lock.owns_lock() && std::chrono::steady_clock::now() - last_change_ >= idle) {
-    CommitQuietly();
+  return !at_rest_;
+}
+
+// The write lock is held, and nothing is uncommitted. In steps, as whoever writes waits for one.
+// Whether there are more.
+bool Store::Rest() {
+  Connection& db = write_session_->db;
+  if (writer_->ForgetGone()) {
+    return true;
   }
+  for (const char* const merge : {"INSERT INTO texts(texts, rank) VALUES('merge', ?)",
+                                  "INSERT INTO words(words, rank) VALUES('merge', ?)",
+                                  "INSERT INTO grams(grams, rank) VALUES('merge', ?)"}) {
+    const int64_t before = db.TotalChanges();
+    Sql(db, merge).Int(kMergedPages).Run();
+    // One is the command itself.
+    if (db.TotalChanges() - before > 1) {
+      return true;
+    }
+  }
+  // Readers may keep it from it; the next change brings another try.
+  Sql(db, "PRAGMA wal_checkpoint(TRUNCATE)").Run();
+  db.Run("PRAGMA shrink_memory");
+  malloc_trim(0);
+  return false;
 }
 
 void Store::Close() {

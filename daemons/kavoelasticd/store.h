@@ -48,8 +48,10 @@ class Store {
   // What was written is on disk when this returns. Throws kLost when some of it was rolled back
   // before, and what the database answers.
   void Commit();
-  // Commits what was written longer ago than `idle`. Failures are logged, and told by Commit().
-  void CommitIdle(std::chrono::steady_clock::duration idle);
+  // Once nothing was written for `idle`: commits, merges the text indexes a step further, and at
+  // last empties the log. Whether anything is left to do, now or after `idle`. Failures are logged,
+  // and those of the commit told by Commit().
+  bool CommitIdle(std::chrono::steady_clock::duration idle);
   // Commits and empties the log, so that the one file holds everything once the store is gone.
   // Nobody else is using the store. When it throws, the store can be used on.
   void Close();
@@ -59,6 +61,7 @@ class Store {
   void CheckDatabase(Connection& db, const std::string& token);
   void CommitQuietly();
   void RollBack(const char* reason);
+  bool Rest();
   std::unique_ptr<Session> TakeReader();
 
   const std::string folder_;
@@ -69,7 +72,8 @@ class Store {
   std::unique_ptr<Writer> writer_;
   std::chrono::steady_clock::time_point last_change_;
   std::atomic<bool> uncommitted_ = false;
-  std::mutex readers_mutex_;  // Guards the sessions that no one uses.
+  std::atomic<bool> at_rest_ = true;  // Nothing is left for CommitIdle().
+  std::mutex readers_mutex_;          // Guards the sessions that no one uses.
   std::vector<std::unique_ptr<Session>> readers_;
 };
 

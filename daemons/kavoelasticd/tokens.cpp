@@ -5,6 +5,7 @@
 #include <unicode/uscript.h>
 
 #include <algorithm>
+#include <array>
 #include <cstdint>
 
 #include "daemons/kavoelasticd/failure.h"
@@ -15,17 +16,41 @@ namespace {
 
 // What is longer is no word; its beginning stands for it.
 constexpr size_t kMaxWordBytes = 128;
-constexpr size_t kKnownWords = 2048;
+constexpr size_t kKnownWords = 8192;
 
 enum class Class { kSeparator, kLetter, kExtend, kIdeograph };
+
+constexpr std::array<bool, 256> MakePlainLetters() {
+  std::array<bool, 256> letters{};
+  for (int c = 0; c < 0x80; ++c) {
+    letters[static_cast<size_t>(c)] =
+        (c >= '0' && c <= '9') || ((c | 0x20) >= 'a' && (c | 0x20) <= 'z');
+  }
+  return letters;
+}
+// Of ASCII: most texts are nothing else.
+constexpr std::array<bool, 256> kPlainLetters = MakePlainLetters();
+
+bool IsPlainLetter(char c) { return kPlainLetters[static_cast<unsigned char>(c)]; }
+
+// Copies ASCII letters and digits in lower case; false when there is something else.
+bool LowerAscii(std::string_view word, char* out) {
+  for (const char c : word) {
+    if (!IsPlainLetter(c)) {
+      return false;
+    }
+    // Digits have the bit already.
+    *out++ = static_cast<char>(c | 0x20);
+  }
+  return true;
+}
 
 Class ClassOf(int32_t c) {
   if (c < 0) {
     return Class::kSeparator;
   }
   if (c < 0x80) {
-    return (c >= '0' && c <= '9') || ((c | 0x20) >= 'a' && (c | 0x20) <= 'z') ? Class::kLetter
-                                                                              : Class::kSeparator;
+    return kPlainLetters[static_cast<size_t>(c)] ? Class::kLetter : Class::kSeparator;
   }
   if (c >= 0x4E00 && c <= 0x9FFF) {
     return Class::kIdeograph;
@@ -90,8 +115,10 @@ bool Ideographs(const std::vector<Cluster>& run, Cut cut, const TokenSink& sink)
   if (run.empty() || (cut != Cut::kDocument && run.size() > 1)) {
     return true;
   }
+  // At the place of the pair that it ends: what follows a run follows its last pair, also in a
+  // query.
   const Cluster& last = run.back();
-  return sink({last.text, last.begin, last.end, /*same_place=*/false});
+  return sink({last.text, last.begin, last.end, /*same_place=*/run.size() > 1});
 }
 
 std::vector<std::string_view> Characters(std::string_view text) {
@@ -127,7 +154,7 @@ WordCutter::WordCutter(const std::string& language) {
 
 WordCutter::~WordCutter() = default;
 
-std::string_view WordCutter::Stem(const std::string& word) {
+std::string_view WordCutter::Stem(std::string_view word) {
   if (stemmer_ == nullptr ||
       std::any_of(word.begin(), word.end(), [](char c) { return c >= '0' && c <= '9'; })) {
     return word;
@@ -135,7 +162,7 @@ std::string_view WordCutter::Stem(const std::string& word) {
   if (known_.empty()) {
     known_.resize(kKnownWords);
   }
-  Known& known = known_[std::hash<std::string>()(word) % kKnownWords];
+  Known& known = known_[std::hash<std::string_view>()(word) % kKnownWords];
   if (known.word != word) {
     const auto* stem =
         sb_stemmer_stem(stemmer_.get(), reinterpret_cast<const sb_symbol*>(word.data()),
@@ -143,7 +170,7 @@ std::string_view WordCutter::Stem(const std::string& word) {
     const int length = stem == nullptr ? 0 : sb_stemmer_length(stemmer_.get());
     known.stem = length > 0
                      ? std::string(reinterpret_cast<const char*>(stem), static_cast<size_t>(length))
-                     : word;
+                     : std::string(word);
     known.word = word;
   }
   return known.stem;
@@ -151,13 +178,18 @@ std::string_view WordCutter::Stem(const std::string& word) {
 
 bool WordCutter::Word(std::string_view text, size_t begin, size_t end, Cut cut,
                       const TokenSink& sink) {
-  std::string word = Fold(text.substr(begin, end - begin));
-  if (word.size() > kMaxWordBytes) {
-    size_t length = kMaxWordBytes;
-    while ((static_cast<unsigned char>(word[length]) & 0xC0) == 0x80) {
+  char plain[kMaxWordBytes];
+  std::string folded;
+  std::string_view word = text.substr(begin, std::min(end - begin, kMaxWordBytes));
+  if (LowerAscii(word, plain)) {
+    word = std::string_view(plain, word.size());
+  } else {
+    folded = Fold(text.substr(begin, end - begin));
+    size_t length = std::min(folded.size(), kMaxWordBytes);
+    while (length < folded.size() && (static_cast<unsigned char>(folded[length]) & 0xC0) == 0x80) {
       --length;
     }
-    word.resize(length);
+    word = std::string_view(folded).substr(0, length);
   }
   if (word.empty()) {
     return true;
@@ -189,6 +221,9 @@ void WordCutter::Words(std::string_view text, Cut cut, const TokenSink& sink) {
           return;
         }
         run.clear();
+        while (i < text.size() && IsPlainLetter(text[i])) {
+          ++i;
+        }
         for (size_t next = i; next < text.size(); i = next) {
           const Class kind = ClassOf(NextCodePoint(text, &next));
           if (kind != Class::kLetter && kind != Class::kExtend) {

@@ -28,8 +28,8 @@ using TokenSink = std::function<bool(const Token&)>;
 
 // Words are runs of letters, digits and marks. A document's word is found by itself and by its
 // stem, a query's by its stem, a query for beginnings by the word as typed. Chinese, Japanese and
-// Korean characters come in overlapping pairs, and the last of a run also alone, so that one
-// character is found as the beginning of a pair.
+// Korean characters come in overlapping pairs, and the last of a run also alone, at the place of
+// its pair, so that one character is found as the beginning of a pair.
 class WordCutter {
  public:
   // A Snowball algorithm's name, or "none". Throws Failure kBadMappings for another one.
@@ -49,7 +49,7 @@ class WordCutter {
 
  private:
   bool Word(std::string_view text, size_t begin, size_t end, Cut cut, const TokenSink& sink);
-  std::string_view Stem(const std::string& word);
+  std::string_view Stem(std::string_view word);
 
   struct StemmerDelete {
     void operator()(sb_stemmer* stemmer) const;

@@ -7,118 +7,20 @@
 
 #include "common/string.h"
 #include "daemons/kavoelasticd/failure.h"
-#include "daemons/kavoelasticd/fields.h"
-#include "daemons/kavoelasticd/fold.h"
+#include "daemons/kavoelasticd/pack.h"
+#include "daemons/kavoelasticd/rows.h"
 
 namespace vexlo::elasticd {
 namespace {
 
 constexpr size_t kDeleteSlice = 10'000;
 
-enum Table : unsigned {
-  kTexts = 1,
-  kWordTable = 2,
-  kGramTable = 4,
-  kExactTable = 8,
-  kDocsTable = 16,  // Its columns beside the path.
-};
+// Removed documents that the text indexes may still know; more are forgotten at the next commit.
+constexpr int64_t kMostGone = 20'000;
+constexpr int64_t kForgottenAtOnce = 2'000;
 
-using Row = std::vector<std::string>;
-using ExactRows = std::vector<std::pair<uint32_t, std::string>>;  // In order, each once.
-
-unsigned TablesOf(const Field& field) {
-  const unsigned filter = field.filter ? static_cast<unsigned>(kDocsTable) : 0;
-  const unsigned all = filter | (field.all ? static_cast<unsigned>(kWordTable) : 0);
-  switch (field.lookup) {
-    case Lookup::kKey:
-      return 0;
-    case Lookup::kNumber:
-      return all;
-    case Lookup::kAncestor:
-    case Lookup::kExact:
-      return all | kExactTable;
-    case Lookup::kGrams:
-      return all | kGramTable;
-    case Lookup::kText:
-      return filter | kTexts;
-    case Lookup::kWords:
-      return filter | kWordTable;
-  }
-  return 0;
-}
-
-void Append(std::string* column, std::string text) {
-  if (column->empty()) {
-    *column = std::move(text);
-    return;
-  }
-  *column += '\n';
-  *column += text;
-}
-
-// What the three text tables hold of a document; bodies must be known.
-Row RowOf(Session& session, const StoredDocument& document, unsigned table, size_t columns) {
-  Row row(columns);
-  for (const Item& item : document.record.Items()) {
-    const Field& field = session.FieldOf(item.field);
-    if ((TablesOf(field) & table) == 0) {
-      continue;
-    }
-    size_t column = static_cast<size_t>(std::max(0, field.column));
-    if (table == kWordTable) {
-      column = field.lookup == Lookup::kGrams ? 0 : field.all ? 1 : 2;
-    }
-    Append(&row[column], JoinedTexts(item, document.path));
-  }
-  return row;
-}
-
-ExactRows ExactRowsOf(Session& session, const StoredDocument& document) {
-  ExactRows rows;
-  for (const Item& item : document.record.Items()) {
-    const Field& field = session.FieldOf(item.field);
-    if ((TablesOf(field) & kExactTable) == 0 ||
-        (item.kind == Kind::kParent && FoundByPath(field))) {
-      continue;
-    }
-    for (const std::string& text : TextsOf(item, document.path)) {
-      for (std::string& value : ExactValues(field, text)) {
-        rows.emplace_back(item.field, std::move(value));
-      }
-    }
-  }
-  std::sort(rows.begin(), rows.end());
-  rows.erase(std::unique(rows.begin(), rows.end()), rows.end());
-  return rows;
-}
-
-// What docs holds of the fields, for the filters and orders of a search.
-struct DocsRow {
-  std::optional<std::string> extension;
-  std::optional<int64_t> size;
-  std::optional<int64_t> modified;
-};
-
-DocsRow DocsRowOf(Session& session, const StoredDocument& document) {
-  DocsRow row;
-  const auto find = [&](const char* name) -> const Item* {
-    const auto id = session.IdOf(name);
-    return id ? document.record.Find(*id) : nullptr;
-  };
-  // A folder's name has no extension in this sense: a search for types is one for files.
-  const Item* const is_dir = find(kIsDirField);
-  const bool is_folder = is_dir != nullptr && JsonOf(*is_dir, document.path).asBool();
-  if (const Item* item = find(kExtensionField); !is_folder && item != nullptr && IsText(*item)) {
-    row.extension = Fold(TextOf(*item, document.path));
-  }
-  if (const Item* item = find(kSizeField); item != nullptr && item->kind == Kind::kInt) {
-    row.size = IntOf(*item);
-  }
-  if (const Item* item = find(kModifiedField); item != nullptr && item->kind == Kind::kInt) {
-    row.modified = IntOf(*item);
-  }
-  return row;
-}
+// Texts that wait for their indexes; as much again is in the indexes' own memory.
+constexpr size_t kBatchBytes = size_t{4} << 20;
 
 template <typename T>
 void Bind(Sql& sql, const std::optional<T>& value) {
@@ -131,21 +33,16 @@ void Bind(Sql& sql, const std::optional<T>& value) {
   }
 }
 
-std::string TextSql(const std::string& table, const std::string& columns, size_t count,
-                    bool forget) {
-  std::string names;
-  std::string marks;
-  for (size_t i = 0; i < count; ++i) {
-    names += columns.size() == 1 ? "," + columns + std::to_string(i) : "";
-    marks += ",?";
-  }
-  names = columns.size() == 1 ? names : "," + columns;
-  return forget ? "INSERT INTO " + table + "(" + table + ",rowid" + names + ") VALUES('delete',?" +
-                      marks + ")"
-                : "INSERT INTO " + table + "(rowid" + names + ") VALUES(?" + marks + ")";
-}
-
 }  // namespace
+
+// A text index, and what of TablesOf() a field is in it by.
+struct Writer::TextTable {
+  TextBatch::TextTable index;
+  unsigned fields;
+};
+
+constexpr Writer::TextTable Writer::kTextTables[] = {
+    {TextBatch::kTexts, kTexts}, {TextBatch::kWords, kWordTable}, {TextBatch::kGrams, kGramTable}};
 
 // `before` and `after` are the same document; a record without a path is none.
 struct Writer::Change {
@@ -154,18 +51,11 @@ struct Writer::Change {
   std::vector<uint32_t> new_bodies = {};
 };
 
-Writer::Writer(Session& session)
-    : session_(session), text_tables_([&session] {
-        const auto table = [](unsigned which, const char* name, const char* columns, size_t count) {
-          return TextTable{which, count, TextSql(name, columns, count, /*forget=*/false),
-                           TextSql(name, columns, count, /*forget=*/true)};
-        };
-        const size_t texts = std::max<size_t>(1, session.schema.TextColumns().size());
-        const size_t grams = std::max<size_t>(1, session.schema.GramColumns().size());
-        return std::array<TextTable, 3>{table(kTexts, "texts", "t", texts),
-                                        table(kWordTable, "words", "name,rest,other", 3),
-                                        table(kGramTable, "grams", "g", grams)};
-      }()) {}
+Writer::Writer(Session& session) : session_(session), texts_(session) {
+  session_.SetBeforeTexts([this] { WriteTexts(); });
+}
+
+Writer::~Writer() { session_.SetBeforeTexts({}); }
 
 void Writer::Begin() {
   if (!session_.db.InTransaction()) {
@@ -176,6 +66,9 @@ void Writer::Begin() {
 void Writer::Lose(const std::string& reason) {
   lost_ = reason;
   changes_ = 0;
+  in_list_ = false;
+  gone_.reset();
+  texts_.Clear();
   session_.ForgetFields();
   if (session_.db.InTransaction()) {
     session_.db.Run("ROLLBACK");
@@ -184,9 +77,24 @@ void Writer::Lose(const std::string& reason) {
 
 void Writer::CommitChanges() {
   if (session_.db.InTransaction()) {
+    while (Gone() > kMostGone) {
+      ForgetSome();
+    }
+    WriteTexts();
     session_.db.Run("COMMIT");
   }
+  texts_.Clear();
   changes_ = 0;
+}
+
+// A part of what waits cannot be taken back alone.
+void Writer::WriteTexts() {
+  try {
+    texts_.Write();
+  } catch (const std::exception& error) {
+    Lose(error.what());
+    throw;
+  }
 }
 
 void Writer::Commit() {
@@ -288,7 +196,7 @@ size_t Writer::DeleteWhere(const Conditions& conditions) {
   for (;;) {
     // What is deleted is found no more, so every slice begins at the front.
     std::vector<int64_t> ids = Find(session_, conditions, {.after = "", .size = kDeleteSlice});
-    // FTS5 writes out what it has gathered whenever a lower number follows a higher one.
+    // In the order of their rows.
     std::sort(ids.begin(), ids.end());
     for (const int64_t id : ids) {
       if (auto found = session_.Load(id)) {
@@ -303,11 +211,84 @@ size_t Writer::DeleteWhere(const Conditions& conditions) {
   }
 }
 
+// What the text indexes have of it is forgotten later, by ForgetGone(): that takes as long as
+// adding it did.
 void Writer::RemoveDocument(StoredDocument document) {
   Change change;
   change.after.id = document.id;
   change.before = std::move(document);
-  Apply(change);
+  WriteExact(change);
+  Sql(session_.db, "INSERT INTO gone VALUES(?,?)")
+      .Int(change.after.id)
+      .Blob(change.before.path)
+      .Run();
+  Sql(session_.db, "DELETE FROM docs WHERE id = ?").Int(change.after.id).Run();
+  gone_ = gone_ ? std::optional(*gone_ + 1) : std::nullopt;
+  ++changes_;
+}
+
+bool Writer::ForgetGone() {
+  if (Gone() == 0) {
+    return false;
+  }
+  std::string lost = lost_;
+  try {
+    Begin();
+    ForgetSome();
+    session_.db.Run("COMMIT");
+    texts_.Clear();
+  } catch (...) {
+    // No client's change is lost with it.
+    lost_ = std::move(lost);
+    gone_.reset();
+    texts_.Clear();
+    if (session_.db.InTransaction()) {
+      session_.db.Run("ROLLBACK");
+    }
+    throw;
+  }
+  return Gone() > 0;
+}
+
+int64_t Writer::Gone() {
+  if (!gone_) {
+    Sql count(session_.db, "SELECT count(*) FROM gone");
+    count.Row();
+    gone_ = count.IntAt(0);
+  }
+  return *gone_;
+}
+
+void Writer::ForgetSome() {
+  std::vector<StoredDocument> documents;
+  {
+    Sql rows(session_.db,
+             "SELECT g.id, g.path, r.record FROM gone g CROSS JOIN records r ON r.id = g.id"
+             " ORDER BY g.id LIMIT ?");
+    rows.Int(kForgottenAtOnce);
+    while (rows.Row()) {
+      documents.push_back({rows.IntAt(0), rows.StringAt(1), Record::Decode(rows.StringAt(2))});
+    }
+  }
+  if (documents.empty()) {
+    throw Failure(Code::kIndexDamaged, "a removed document has no record");
+  }
+  for (StoredDocument& document : documents) {
+    Change change;
+    change.after.id = document.id;
+    change.before = std::move(document);
+    for (const TextTable& table : kTextTables) {
+      Reindex(change, table);
+    }
+    WriteBodies(change);
+    Sql(session_.db, "DELETE FROM records WHERE id = ?").Int(change.after.id).Run();
+    Sql(session_.db, "DELETE FROM gone WHERE id = ?").Int(change.after.id).Run();
+    if (texts_.Bytes() >= kBatchBytes) {
+      WriteTexts();
+    }
+  }
+  gone_.reset();
+  WriteTexts();
 }
 
 bool Writer::Same(Change& change, const Item& before, const Item& after) {
@@ -367,19 +348,19 @@ void Writer::FillBodies(int64_t id, StoredDocument* document, unsigned table) {
   }
 }
 
-void Writer::Reindex(Change& change, StoredDocument& document, const TextTable& table,
-                     bool before) {
-  FillBodies(change.after.id, &document, table.table);
-  const Row row = RowOf(session_, document, table.table, table.columns);
-  if (std::all_of(row.begin(), row.end(), [](const std::string& text) { return text.empty(); })) {
-    return;
+void Writer::Reindex(Change& change, const TextTable& table) {
+  const auto row_of = [&](StoredDocument& document) {
+    FillBodies(change.after.id, &document, table.fields);
+    TextRow row = TextRowOf(session_, document, table.fields, texts_.ColumnsOf(table.index));
+    const bool empty =
+        std::all_of(row.begin(), row.end(), [](const std::string& text) { return text.empty(); });
+    return empty ? TextRow() : row;
+  };
+  TextRow before;
+  if (!texts_.Holds(table.index, change.after.id)) {
+    before = row_of(change.before);
   }
-  Sql sql(session_.db, before ? table.remove : table.insert);
-  sql.Int(change.after.id);
-  for (const std::string& text : row) {
-    sql.Text(text);
-  }
-  sql.Run();
+  texts_.Put(table.index, change.after.id, std::move(before), row_of(change.after));
 }
 
 void Writer::WriteBodies(Change& change) {
@@ -388,17 +369,16 @@ void Writer::WriteBodies(Change& change) {
   };
   for (const Item& item : change.before.record.Items()) {
     if (is_body(&item) && !is_body(change.after.record.Find(item.field))) {
-      Sql(session_.db, "DELETE FROM bodies WHERE id = ? AND field = ?")
-          .Int(change.after.id)
-          .Int(item.field)
+      Sql(session_.db, "DELETE FROM bodies WHERE id = ?")
+          .Int(BodyId(change.after.id, item.field))
           .Run();
     }
   }
   for (const uint32_t field : change.new_bodies) {
-    Sql(session_.db, "INSERT OR REPLACE INTO bodies VALUES(?,?,?)")
-        .Int(change.after.id)
-        .Int(field)
-        .Blob(change.after.record.Find(field)->bytes)
+    const std::string packed = Pack(change.after.record.Find(field)->bytes);
+    Sql(session_.db, "INSERT OR REPLACE INTO bodies VALUES(?,?)")
+        .Int(BodyId(change.after.id, field))
+        .Blob(packed)
         .Run();
   }
 }
@@ -430,22 +410,18 @@ void Writer::MakeRoom(const std::string& path) {
 void Writer::WriteRows(Change& change, bool filters_differ) {
   Connection& db = session_.db;
   const bool exists = !change.before.path.empty();
-  if (change.after.path.empty()) {
-    Sql(db, "DELETE FROM docs WHERE id = ?").Int(change.after.id).Run();
-    Sql(db, "DELETE FROM records WHERE id = ?").Int(change.after.id).Run();
-    return;
-  }
   if (!exists) {
+    // Records give the number: they still have those that the text indexes have not forgotten.
+    const std::string record = change.after.record.Encode();
+    Sql(db, "INSERT INTO records(record) VALUES(?)").Blob(record).Run();
+    change.after.id = db.LastInsertId();
     const DocsRow row = DocsRowOf(session_, change.after);
-    Sql docs(db, "INSERT INTO docs(path, ext, size, mtime) VALUES(?,?,?,?)");
-    docs.Blob(change.after.path);
+    Sql docs(db, "INSERT INTO docs(id, path, ext, size, mtime) VALUES(?,?,?,?,?)");
+    docs.Int(change.after.id).Blob(change.after.path);
     Bind(docs, row.extension);
     Bind(docs, row.size);
     Bind(docs, row.modified);
     docs.Run();
-    change.after.id = db.LastInsertId();
-    const std::string record = change.after.record.Encode();
-    Sql(db, "INSERT INTO records VALUES(?,?)").Int(change.after.id).Blob(record).Run();
     return;
   }
   if (!change.after.record.SameStored(change.before.record)) {
@@ -489,10 +465,9 @@ void Writer::Apply(Change& change) {
   if (!exists) {
     WriteRows(change, filters_differ);
   }
-  for (const TextTable& table : text_tables_) {
-    if ((tables & table.table) != 0) {
-      Reindex(change, change.before, table, /*before=*/true);
-      Reindex(change, change.after, table, /*before=*/false);
+  for (const TextTable& table : kTextTables) {
+    if ((tables & table.fields) != 0) {
+      Reindex(change, table);
     }
   }
   if ((tables & kExactTable) != 0) {
@@ -503,45 +478,61 @@ void Writer::Apply(Change& change) {
   }
   WriteBodies(change);
   ++changes_;
+  if (!in_list_ && texts_.Bytes() >= kBatchBytes) {
+    WriteTexts();
+  }
 }
 
 void Writer::List(size_t count, const std::function<void(size_t)>& item,
                   const std::function<void(size_t, const Failure&)>& refused) {
   Begin();
   const size_t changes = changes_;
-  session_.db.Run("SAVEPOINT list");
+  const size_t mark = SetSavepoint("list");
+  in_list_ = true;
   try {
     for (size_t i = 0; i < count; ++i) {
       item(i);
     }
   } catch (const SqlError& error) {
-    if (!error.OfStatement() || !session_.db.InTransaction()) {
-      throw;
-    }
-    session_.db.Run("ROLLBACK TO list");
-    session_.ForgetFields();
+    UndoTo("list", mark, error);
     changes_ = changes;
     ListOneByOne(count, item, refused);
   }
   session_.db.Run("RELEASE list");
+  in_list_ = false;
+  texts_.DropMarks();
+  if (texts_.Bytes() >= kBatchBytes) {
+    WriteTexts();
+  }
 }
 
 void Writer::ListOneByOne(size_t count, const std::function<void(size_t)>& item,
                           const std::function<void(size_t, const Failure&)>& refused) {
   for (size_t i = 0; i < count; ++i) {
-    session_.db.Run("SAVEPOINT item");
+    const size_t mark = SetSavepoint("item");
     try {
       item(i);
     } catch (const SqlError& error) {
-      if (!error.OfStatement() || !session_.db.InTransaction()) {
-        throw;
-      }
-      session_.db.Run("ROLLBACK TO item");
-      session_.ForgetFields();
+      UndoTo("item", mark, error);
       refused(i, error);
     }
     session_.db.Run("RELEASE item");
   }
+}
+
+size_t Writer::SetSavepoint(const std::string& name) {
+  session_.db.Run("SAVEPOINT " + name);
+  return texts_.SetMark();
+}
+
+// Throws the error on when it is not about one statement, or the list's texts are in the database.
+void Writer::UndoTo(const std::string& name, size_t mark, const SqlError& error) {
+  if (!error.OfStatement() || !session_.db.InTransaction() || !texts_.Undo(mark)) {
+    throw SqlError(error);
+  }
+  session_.db.Run("ROLLBACK TO " + name);
+  session_.ForgetFields();
+  gone_.reset();
 }
 
 }  // namespace vexlo::elasticd

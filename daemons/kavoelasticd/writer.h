@@ -4,25 +4,30 @@
 
 #include <json/value.h>
 
-#include <array>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
+#include <optional>
 #include <string>
 
 #include "daemons/kavoelasticd/query.h"
 #include "daemons/kavoelasticd/session.h"
+#include "daemons/kavoelasticd/text_batch.h"
 
 namespace vexlo::elasticd {
 
 // - Changes gather in one transaction until Commit(). What was committed is on disk: the log is
 //   synced before Commit() returns. What was not is gone after a crash.
+// - The text indexes get their part late (TextBatch); whoever asks them gets it written before.
 // - A change that a rule refuses changes nothing. One that the database refuses (a full disk) rolls
 //   back everything since the last commit, and the next Commit() fails with kLost, once.
 class Writer {
  public:
   // The session may write. `session` outlives the writer.
   explicit Writer(Session& session);
+  ~Writer();
+  Writer(const Writer&) = delete;
+  Writer& operator=(const Writer&) = delete;
 
   // Each throws Failure: kBadDocument, kDocumentMissing, or what the database answers.
   void Upsert(const std::string& doc_id, const Json::Value& data);
@@ -43,6 +48,11 @@ class Writer {
   void List(size_t count, const std::function<void(size_t)>& item,
             const std::function<void(size_t, const Failure&)>& refused);
 
+  // Takes removed documents out of the text indexes, some thousand of them, and commits; nothing
+  // else is uncommitted. Whether more are left. Throws what the database answers, with nothing
+  // changed.
+  bool ForgetGone();
+
   // Changes since the last commit.
   size_t Uncommitted() const { return changes_; }
   // Rolls back what is not committed after the database failed; see the class.
@@ -55,15 +65,16 @@ class Writer {
   void ListOneByOne(size_t count, const std::function<void(size_t)>& item,
                     const std::function<void(size_t, const Failure&)>& refused);
   void RemoveDocument(StoredDocument document);
+  void ForgetSome();
+  int64_t Gone();
   void Apply(Change& change);
-  struct TextTable {
-    unsigned table;
-    size_t columns;
-    std::string insert;
-    std::string remove;
-  };
+  struct TextTable;
+  static const TextTable kTextTables[TextBatch::kTables];
   void FillBodies(int64_t id, StoredDocument* document, unsigned table);
-  void Reindex(Change& change, StoredDocument& document, const TextTable& table, bool before);
+  void Reindex(Change& change, const TextTable& table);
+  void WriteTexts();
+  size_t SetSavepoint(const std::string& name);
+  void UndoTo(const std::string& name, size_t mark, const SqlError& error);
   unsigned ChangedTables(Change& change);
   bool Same(Change& change, const Item& before, const Item& after);
   void WriteBodies(Change& change);
@@ -73,7 +84,9 @@ class Writer {
   void CheckRequired(const Json::Value& data, bool whole) const;
 
   Session& session_;
-  const std::array<TextTable, 3> text_tables_;
+  TextBatch texts_;
+  bool in_list_ = false;
+  std::optional<int64_t> gone_;  // Rows of that table, once they are counted.
   size_t changes_ = 0;
   std::string lost_;  // Why changes were rolled back, until it is told.
 };

@@ -24,6 +24,9 @@ constexpr bool IsElasticdBusy(int code) { return code == 1400 || code == 1401; }
 // "has_fail", its items are looked through: the first that the engine was too busy for is thrown
 // with its code and message alone, every other that failed is logged, and is no failure of the
 // whole.
+//
+// The commands are described in docs/engine.md. Any thread may call: nothing is kept between two
+// calls.
 VEXLO_EXPORT void SendRequestImpl(Json::Value& response, const Json::Value& request);
 
 }  // namespace vexlo

@@ -28,12 +28,14 @@ class VEXLO_EXPORT Folder {
          const std::string& group, bool document, bool audio, bool video, bool photo,
          bool privileged, bool paused);
 
+  // As they stand in the record: the share path, what people call the folder, and whose it is.
   const std::string& GetPath() const { return path_; }
   const std::string& GetName() const { return name_; }
   const std::string& GetOwner() const { return owner_; }
   const std::string& GetGroup() const { return group_; }  // "" for none.
   // Whose index data is still to be removed; kept here for the operations on volumes.
   const std::string& GetVolumeToBeClean() const { return volume_to_be_clean_; }
+  // Whether files of the type are indexed with what stands in them.
   bool IsDocument() const { return document_; }
   bool IsAudio() const { return audio_; }
   bool IsVideo() const { return video_; }

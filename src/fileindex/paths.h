@@ -13,16 +13,20 @@ namespace vexlo::fileindex {
 // read once; one configured for "" never looks there.
 VEXLO_EXPORT const std::string& GetFileIndexRoot();
 
+// A path that is fixed on a system's own installation.
 class FixedPath {
  public:
+  // Takes an absolute path, whose text outlives the object.
   constexpr explicit FixedPath(const char* path) : path_(path) {}
-  // With the root before it.
+  // With the root before it. Any thread may ask.
   std::string Get() const { return GetFileIndexRoot() + path_; }
 
  private:
   const char* path_;
 };
 
+// The two configuration files with the lock files of their writers (docs/state.md), the sockets of
+// the index daemon and the engine, and the tool behind SendQPXNotify().
 inline constexpr FixedPath kFileIndexFoldersCfgPath("/var/packages/Vexlo/etc/fileindex.folders");
 inline constexpr FixedPath kFileIndexFoldersLockPath("/tmp/vexlo_cfg_folder.lock");
 inline constexpr FixedPath kFileIndexStatusCfgPath("/var/packages/Vexlo/etc/fileindex.status");

@@ -9,6 +9,8 @@
 #include "common/export.h"
 #include "fileindex/optree/optree.h"
 
+// What indexing is made of: queues and what they come down to, the indexed folders, which paths are
+// indexed, the state of the service, and its administration.
 namespace vexlo::fileindex {
 
 // Moves the live queue aside to a snapshot (its path with ".tmp" behind it), so that the notify
@@ -20,6 +22,7 @@ namespace vexlo::fileindex {
 // Not for use by two threads at a time.
 class VEXLO_EXPORT QueueMgr {
  public:
+  // Touches no file yet; the queue need not exist.
   explicit QueueMgr(const std::string& queue_path);
 
   // Renames the live queue to the snapshot under the queue's LockFile, unless there is no live

@@ -415,6 +415,39 @@ TEST_F(Fileindexd, CarriesOutEachOperation) {
        {".", "new.txt", "after", "sane"},
        "elusive",
        {}},
+      {"FoldersToBeRenamed",
+       [&] {
+         Write("a/x", "ghostly"), Write("a/y", "ghostly");
+         Write("b/x", "ghostly"), Write("b/y", "ghostly");
+       },
+       {Line(EV_CREATE, In("a"), "", true), Line(EV_CREATE, In("b"), "", true)},
+       {".", "new.txt", "after", "sane", "a", "a/x", "a/y", "b", "b/x", "b/y"},
+       "ghostly",
+       {"a/x", "a/y", "b/x", "b/y"}},
+      // The making of the new folder cancels the delete, which was before the rename.
+      {"DeletedInAFolderThatIsRenamedAndMadeAnew",
+       [&] {
+         fs::remove(In("a/x"));
+         fs::rename(In("a"), In("a1"));
+         fs::create_directory(In("a"));
+       },
+       {Line(EV_DELETE, In("a/x")), Line(EV_RENAME, In("a1"), In("a"), true),
+        Line(EV_CREATE, In("a"), "", true)},
+       {".", "new.txt", "after", "sane", "a", "a1", "a1/y", "b", "b/x", "b/y"},
+       "ghostly",
+       {"a1/y", "b/x", "b/y"}},
+      {"DeletedInAFolderThatIsRenamedAndItsNamesTaken",
+       [&] {
+         fs::remove(In("b/x"));
+         fs::rename(In("b"), In("b1"));
+         fs::rename(In("a"), In("b"));
+         fs::rename(In("sane"), In("b/x"));
+       },
+       {Line(EV_DELETE, In("b/x")), Line(EV_RENAME, In("b1"), In("b"), true),
+        Line(EV_RENAME, In("b"), In("a"), true), Line(EV_RENAME, In("b/x"), In("sane"))},
+       {".", "new.txt", "after", "a1", "a1/y", "b", "b/x", "b1", "b1/y"},
+       "ghostly",
+       {"a1/y", "b1/y"}},
   };
   for (const auto& step : steps) {
     SCOPED_TRACE(step.name);
@@ -458,6 +491,30 @@ TEST_F(Fileindexd, IndexesNoMoreThanNeeded) {
   EXPECT_EQ(update(R"({"photo":true})"), 0);
   EXPECT_EQ(update(R"({"document":true})"), 3001);
   EXPECT_EQ(update(R"({"basic":true})"), 3034);
+}
+
+// Of more documents than are listed at a time, with names that stand before and behind "/".
+TEST_F(Fileindexd, MovesAFolderOfManyPages) {
+  constexpr int kFiles = 4500;
+  const std::string folders[] = {"old/", "old/a/", "old/a!/", "old/a.b/c/"};
+  for (int i = 0; i < kFiles; ++i) {
+    Write(folders[i % 4] + std::to_string(i), "");
+  }
+  Write("old.txt", "beside");
+  StartAll();
+  Paths want = All();
+  ASSERT_EQ(want.size(), kFiles + 7);
+  const Json::Value before = Stats();
+  fs::rename(In("old"), In("new"));
+  Cycle({Line(EV_RENAME, In("new"), In("old"), true)});
+  for (const std::string& path : All()) {
+    EXPECT_TRUE(path == "old.txt" || !path.starts_with("old")) << path;
+    want.erase(path.starts_with("new") ? "old" + path.substr(3) : path);
+  }
+  EXPECT_EQ(want, Paths());
+  EXPECT_EQ(Stats()["files"], before["files"]) << "documents were made anew";
+  EXPECT_EQ(Stats()["errors"], before["errors"]);
+  EXPECT_EQ(EndIndexer(SIGTERM), 0);
 }
 
 TEST_F(Fileindexd, FollowsTheSettings) {

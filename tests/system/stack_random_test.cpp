@@ -73,7 +73,8 @@ void ExpectIndexed(Stack& stack, const RandomTree& tree) {
     differences = Differences(ListDisk(stack.In()), ListIndex("docs", tree.Tokens()));
     return differences.empty();
   };
-  EXPECT_TRUE(Stack::Await(is_same, std::chrono::seconds(20)))
+  // Texts that nobody was there to read are asked for once a minute in the end.
+  EXPECT_TRUE(Stack::Await(is_same, std::chrono::seconds(90)))
       << differences << tree.Text() << ReadText(HistoryFile()) << stack.Logs();
 }
 

@@ -1,4 +1,4 @@
-// The platform's access rights.
+// The platform's access rights. Safe to call from several threads.
 #ifndef KAVO_ACL_H_
 #define KAVO_ACL_H_
 

@@ -6,6 +6,7 @@
 extern "C" {
 #endif
 
+// For one thread at a time; whoever made it releases it.
 typedef struct KLIBC_SZ_LIST {
   int nItem;        // How many strings the list holds.
   char** ppszItem;  // Owned by the list.

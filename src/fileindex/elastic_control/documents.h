@@ -6,6 +6,8 @@
 //
 // Not logged are Error 917, which callers meet every day and answer by indexing the path, and what
 // the engine answers with codes of its own.
+//
+// Shares are named, paths are full paths. Any thread may call; a holder of SDKMutex() must not.
 #ifndef FILEINDEX_ELASTIC_CONTROL_DOCUMENTS_H_
 #define FILEINDEX_ELASTIC_CONTROL_DOCUMENTS_H_
 

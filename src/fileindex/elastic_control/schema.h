@@ -7,7 +7,8 @@
 
 namespace vexlo::fileindex::elastic {
 
-// The mappings document as JSON text; GetFileIndexMappings() hands it out parsed.
+// The mappings document as JSON text; GetFileIndexMappings() hands it out parsed, which is the way
+// for programs: the text itself is not exported.
 //
 // "property_id" names the field whose value identifies a document, "default" the attributes of
 // every field that "properties" does not list, "properties" what is different for those it does.
@@ -22,6 +23,7 @@ extern const char kMappingsText[];
 namespace field {
 
 // NOLINTBEGIN(readability-identifier-naming)
+// Fields, as documents bear them.
 inline constexpr char KAVOMDAttributeChangeDate[] = "KAVOMDAttributeChangeDate";
 inline constexpr char KAVOMDAudiences[] = "KAVOMDAudiences";
 inline constexpr char KAVOMDAuthors[] = "KAVOMDAuthors";
@@ -169,10 +171,13 @@ inline constexpr char KAVOMDManager[] = "KAVOMDManager";
 // How the content-extraction daemon is reached, and the keys of the options it takes.
 namespace extraction {
 
+// Its pid file, the shared memory that it may use, and its service (kavo/service.h).
 inline constexpr FixedPath kPidFile("/var/run/kavocontentextractd.pid");
 inline constexpr FixedPath kSharedMemory("/tmp/kavoce_shm");
 inline constexpr char kService[] = "kavocontentextractd";
 
+// Keys of the options of an extraction library. The library sets "need_meta" alone (see
+// kavo/content_extract.h).
 inline constexpr char kOptionCfg[] = "cfg";
 inline constexpr char kOptionPath[] = "path";
 inline constexpr char kOptionNeedMeta[] = "need_meta";

@@ -5,8 +5,7 @@
 //   506. What they wait for under it has no limit: a busy engine, and a daemon that takes a command
 //   and does not answer. Callers that serve people run them where waiting does no harm.
 // - A whole list is checked before anything is changed. Then the services, the engine's index of
-// the
-//   share and the notify daemon's registration are brought into line, and only then the list is
+//   the share and the notify daemon's registration are brought into line, and only then the list is
 //   saved; the index daemon is told last. When a step fails, the Error goes to the caller, what was
 //   done stays done, and nothing after it happens: before the save, the list is the old one. Doing
 //   the same again is the remedy.

@@ -1,4 +1,5 @@
-// Which folders of a share the notify daemon watches.
+// Which folders of a share the notify daemon watches. Any thread may call; a holder of SDKMutex()
+// must not.
 #ifndef FILEINDEX_INDEX_MGR_MONITOR_H_
 #define FILEINDEX_INDEX_MGR_MONITOR_H_
 

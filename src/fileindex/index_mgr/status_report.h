@@ -1,4 +1,5 @@
-// How indexing stands, in the words that user interfaces show.
+// How indexing stands, in the words that user interfaces show. FolderSummary() reads the queues,
+// and so takes as long as these are. Any thread may call; a holder of SDKMutex() must not.
 #ifndef FILEINDEX_INDEX_MGR_STATUS_REPORT_H_
 #define FILEINDEX_INDEX_MGR_STATUS_REPORT_H_
 

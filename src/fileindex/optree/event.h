@@ -39,8 +39,8 @@ struct VEXLO_EXPORT Event {
   // mistyped optional member keeps its default.
   explicit Event(const std::string& event_raw);
 
-  uint32_t event = 0;  // Bits of EventMask.
-  bool is_dir = false;
+  uint32_t event = 0;    // Bits of EventMask.
+  bool is_dir = false;   // Whether the path names a folder, also one that is gone by now.
   std::string path;      // For a rename, the path after it.
   std::string path_old;  // For a rename, the path before it; else empty.
   Json::Value data;      // For EV_UPDATE_DIRECTORY, flags by category; else null.

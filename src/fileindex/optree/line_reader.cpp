@@ -14,7 +14,7 @@
 namespace vexlo::fileindex {
 namespace {
 
-constexpr size_t kFirstBufferBytes = size_t{256} * 1024;
+constexpr size_t kFirstBufferBytes = size_t{64} * 1024;
 
 }  // namespace
 

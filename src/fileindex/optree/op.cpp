@@ -6,17 +6,43 @@
 
 #include "common/json.h"
 #include "fileindex/optree/child_index.h"
+#include "fileindex/optree/name_hash.h"
+#include "fileindex/optree/slab.h"
 
 namespace vexlo::fileindex {
 namespace {
 
+// From so many children on their list grows by a quarter at a time: by then it is moved rarely, and
+// doubled it would be half empty on average.
+constexpr size_t kCloseGrowth = 16;
+
 constexpr const char* kCategories[] = {"document", "audio", "video", "photo", "basic"};
+
+// Fetches what the next nodes from the end on lead to, step by step, so that the waits overlap.
+void PrefetchDoomed(const std::vector<std::shared_ptr<OPNode>>& doomed) {
+  constexpr size_t kNodeAhead = 12;
+  constexpr size_t kListAhead = 8;
+  constexpr size_t kOpAhead = 4;
+  const size_t left = doomed.size();
+  if (left <= kNodeAhead) {
+    return;
+  }
+  const OPNode* const node = doomed[left - 1 - kNodeAhead].get();
+  __builtin_prefetch(node);
+  __builtin_prefetch(&node->ops);
+  __builtin_prefetch(doomed[left - 1 - kListAhead]->ops.data());
+  if (const auto& ops = doomed[left - 1 - kOpAhead]->ops; !ops.empty()) {
+    __builtin_prefetch(ops.front().get());
+  }
+}
 
 }  // namespace
 
 OP::OP(std::shared_ptr<OPNode> node_in, FileIndexOP op_in, const std::string& path_old_in,
        const Json::Value& data_in)
     : node(node_in), op(op_in), path_old(path_old_in), data(data_in) {}
+
+OP::OP(std::weak_ptr<OPNode> node_in, FileIndexOP op_in) : node(std::move(node_in)), op(op_in) {}
 
 void OP::MergeData(const Json::Value& incoming) {
   Json::Value merged = data.isObject() ? data : Json::Value(Json::objectValue);
@@ -32,12 +58,16 @@ void OP::MergeData(const Json::Value& incoming) {
 OPNode::OPNode(std::shared_ptr<OPNode> parent_in, const std::string& name_in)
     : name(name_in), parent(parent_in) {}
 
+OPNode::OPNode(std::weak_ptr<OPNode> parent_in, std::string_view name_in)
+    : name(name_in), parent(std::move(parent_in)) {}
+
 OPNode::~OPNode() {
   // Children are taken apart from a list of their own: a destructor that runs its children's would
   // need stack for every level, and a path may have a million.
   std::vector<std::shared_ptr<OPNode>> doomed;
   doomed.swap(children);
   while (!doomed.empty()) {
+    PrefetchDoomed(doomed);
     const std::shared_ptr<OPNode> node = std::move(doomed.back());
     doomed.pop_back();
     if (node.use_count() == 1) {
@@ -67,10 +97,10 @@ std::string OPNode::GetPath() const {
 }
 
 std::shared_ptr<OPNode> OPNode::GetChild(const std::string& child_name) {
-  return FindOrAddChild(child_name).shared_from_this();
+  return FindOrAddChild(child_name, NameHash(child_name)).shared_from_this();
 }
 
-OPNode* OPNode::FindChild(std::string_view child_name) {
+OPNode* OPNode::FindChild(std::string_view child_name, uint64_t hash) {
   if (index_ == nullptr) {
     for (const std::shared_ptr<OPNode>& child : children) {
       if (child->name == child_name) {
@@ -79,24 +109,28 @@ OPNode* OPNode::FindChild(std::string_view child_name) {
     }
     return nullptr;
   }
-  const auto name_at = [this](size_t i) { return std::string_view(children[i]->name); };
-  const size_t found = index_->Find(children.size(), name_at, child_name);
-  return found < children.size() ? children[found].get() : nullptr;
+  return index_->Find(children, child_name, hash);
 }
 
-OPNode& OPNode::FindOrAddChild(std::string_view child_name) {
-  if (OPNode* const found = FindChild(child_name); found != nullptr) {
+OPNode& OPNode::FindOrAddChild(std::string_view child_name, uint64_t hash) {
+  if (OPNode* const found = FindChild(child_name, hash); found != nullptr) {
     return *found;
   }
-  auto child = std::make_shared<OPNode>(shared_from_this(), std::string(child_name));
-  child->position_ = static_cast<uint32_t>(children.size());
+  if (children.size() == children.capacity() && children.size() >= kCloseGrowth) {
+    children.reserve(children.size() + children.size() / 4);
+  }
+  auto child = std::allocate_shared<OPNode>(SlabAllocator<OPNode>(), weak_from_this(), child_name);
+  child->position_ = static_cast<uint32_t>(children.size()) & kPositionBits;
+  if (index_ != nullptr) {
+    index_->Append(children.size(), hash);
+  }
   children.push_back(std::move(child));
   if (index_ == nullptr && children.size() >= ChildIndex::kFewestChildren) {
     index_ = std::make_unique<ChildIndex>();
     for (uint32_t i = 0; i < children.size(); ++i) {
       for (size_t bit = 0; bit < index_->marked.size(); ++bit) {
         if ((children[i]->marks_ >> bit & 1) != 0) {
-          index_->marked[bit].push_back(i);
+          index_->marked[bit].Add(i);
         }
       }
     }

@@ -34,8 +34,11 @@ enum FileIndexOP : int32_t {
 
 // One pending operation. Its node owns it, it refers to the node weakly.
 struct VEXLO_EXPORT OP {
+  // The node is kept weakly and may be null; nothing is added to it.
   OP(std::shared_ptr<OPNode> node, FileIndexOP op, const std::string& path_old,
      const Json::Value& data);
+  // Without a path and a payload.
+  OP(std::weak_ptr<OPNode> node, FileIndexOP op);
 
   // Sets each of "document", "audio", "video", "photo" and "basic" of `data` to whether it is true
   // here (a JSON true; anything else is false) or in `data` (anything that converts to true). Other
@@ -43,10 +46,10 @@ struct VEXLO_EXPORT OP {
   // is unchanged then.
   void MergeData(const Json::Value& incoming);
 
-  std::weak_ptr<OPNode> node;
-  FileIndexOP op;
-  std::string path_old;  // For a rename; else empty.
-  Json::Value data;      // Null unless the event carried a payload.
+  std::weak_ptr<OPNode> node;  // Lives as long as its tree.
+  FileIndexOP op;              // OP_NONE once it is cancelled.
+  std::string path_old;        // For a rename; else empty.
+  Json::Value data;            // Null unless the event carried a payload.
 };
 
 // One path component in the tree that mirrors the folders; the root's name is empty. Nodes are made
@@ -54,7 +57,9 @@ struct VEXLO_EXPORT OP {
 // trees are torn down without recursion.
 class VEXLO_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
  public:
+  // A null parent is for a root. The parent is not told: children are made by GetChild().
   OPNode(std::shared_ptr<OPNode> parent, const std::string& name);
+  OPNode(std::weak_ptr<OPNode> parent, std::string_view name);
   ~OPNode();
   OPNode(const OPNode&) = delete;
   OPNode& operator=(const OPNode&) = delete;
@@ -70,21 +75,26 @@ class VEXLO_EXPORT OPNode : public std::enable_shared_from_this<OPNode> {
   // them and append to `ops`; what it appends is not visited.
   void TraverseOP(std::function<void(std::shared_ptr<OP>)> fn);
 
-  std::string name;
-  std::weak_ptr<OPNode> parent;
+  std::string name;                               // One component of a path, without "/".
+  std::weak_ptr<OPNode> parent;                   // Empty for the root.
   std::vector<std::shared_ptr<OPNode>> children;  // In order of creation.
   std::vector<std::shared_ptr<OP>> ops;           // In order of insertion.
 
  private:
   friend class OPTree;
 
-  OPNode* FindChild(std::string_view child_name);  // Null when there is none.
-  OPNode& FindOrAddChild(std::string_view child_name);
+  static constexpr uint32_t kPositionBits = (uint32_t{1} << 29) - 1;
+
+  // `hash` is the name's NameHash(). Null when there is none.
+  OPNode* FindChild(std::string_view child_name, uint64_t hash);
+  OPNode& FindOrAddChild(std::string_view child_name, uint64_t hash);
 
   std::unique_ptr<ChildIndex> index_;  // Of a node with many children; null otherwise.
-  uint32_t position_ = 0;              // In the parent's `children`, as GetChild() put it there.
-  uint32_t settled_ops_ = 0;           // That many at the front of `ops` concern no rule any more.
-  uint8_t marks_ = 0;                  // Bits of OPTree::Mark.
+  // In the parent's `children`, as GetChild() put it there. One that does not fit is a wrong one,
+  // which callers reckon with.
+  uint32_t position_ : 29 = 0;
+  uint32_t marks_ : 3 = 0;    // Bits of OPTree::Mark.
+  uint32_t settled_ops_ = 0;  // That many at the front of `ops` concern no rule any more.
 };
 
 // "[02] /volume1/s/a", "[05] OLD -> NEW" for a rename, with ", data=JSON" for a folder update.

@@ -9,9 +9,12 @@
 #include "common/check.h"
 #include "common/string.h"
 #include "fileindex/optree/child_index.h"
+#include "fileindex/optree/folder_cache.h"
 #include "fileindex/optree/line_parser.h"
 #include "fileindex/optree/line_reader.h"
 #include "fileindex/optree/malformed_line.h"
+#include "fileindex/optree/name_hash.h"
+#include "fileindex/optree/slab.h"
 
 namespace vexlo::fileindex {
 namespace {
@@ -30,6 +33,18 @@ bool MovesWithItsFolder(const OP& op) { return op.op >= OP_UPSERT; }
 const Json::Value& NullData() {
   static const Json::Value null;
   return null;
+}
+
+std::shared_ptr<OP> NewOP(OPNode& node, FileIndexOP op) {
+  return std::allocate_shared<OP>(SlabAllocator<OP>(), node.weak_from_this(), op);
+}
+
+// For walks along a list: the operations lie where their lines put them.
+void PrefetchAhead(const std::vector<std::shared_ptr<OP>>& ops, size_t at) {
+  constexpr size_t kAhead = 8;
+  if (at + kAhead < ops.size()) {
+    __builtin_prefetch(ops[at + kAhead].get());
+  }
 }
 
 }  // namespace
@@ -96,8 +111,16 @@ OPTree::OPTree(const std::string& queue_path_in, std::function<void(const Progre
   BuildTree();
 }
 
+OPTree::~OPTree() {
+  for (size_t i = 0; i < ops.size(); ++i) {
+    PrefetchAhead(ops, i);
+    ops[i].reset();
+  }
+}
+
 void OPTree::BuildTree() {
   literal_ = !ops.empty() || !root->children.empty();
+  folders_ = literal_ ? nullptr : std::make_shared<FolderCache>();
   ReadQueue();
   if (must_start_over_) {
     must_start_over_ = false;
@@ -107,12 +130,13 @@ void OPTree::BuildTree() {
     crashed = false;
     ops.clear();
     root = std::make_shared<OPNode>(nullptr, "");
-    last_folder_ = nullptr;
+    folders_ = nullptr;
     literal_ = true;
     ReadQueue();
   }
   literal_ = true;  // Whatever comes after the file.
-  last_folder_ = nullptr;
+  ops.shrink_to_fit();
+  folders_ = nullptr;
   reported_lines_ = 0;
   unparsable_lines_.clear();
 }
@@ -122,9 +146,11 @@ struct OPTree::AheadLine {
   QueueLine line;
   bool ordinary = false;  // `event` holds what the line says.
   EventView event;
+  std::string_view folder_path;
+  uint64_t folder_hash = 0;
   OPNode* folder = nullptr;  // Of the path; null when it is not there or was not looked for.
-  std::string_view name;     // In the folder.
-  uint64_t hash = 0;
+  std::string_view name;     // In the folder; empty when the folder is not to be looked for.
+  uint64_t hash = 0;         // Of the name.
   size_t guess = ChildIndex::kNone;
   OPNode* node = nullptr;  // Of the path; null when it was not found.
 };
@@ -184,16 +210,28 @@ void OPTree::Resolve(std::vector<AheadLine>& lines) {
   }
   for (AheadLine& line : lines) {
     const size_t slash = line.event.path.rfind('/');
-    if (!line.ordinary || slash == std::string_view::npos || slash + 1 == line.event.path.size()) {
+    if (line.ordinary && slash != std::string_view::npos && slash + 1 < line.event.path.size()) {
+      line.name = line.event.path.substr(slash + 1);
+      line.folder_path = line.event.path.substr(0, slash);
+      line.folder_hash = NameHash(line.folder_path);
+      folders_->Prefetch(line.folder_hash);
+    }
+  }
+  for (AheadLine& line : lines) {
+    if (line.name.empty()) {
       continue;
     }
-    line.name = line.event.path.substr(slash + 1);
-    line.folder = FindFolder(line.event.path.substr(0, slash));
+    line.folder = FindFolder(line.folder_path, line.folder_hash);
+    line.hash = NameHash(line.name);
     if (line.folder != nullptr && line.folder->index_ != nullptr) {
-      line.hash = ChildIndex::Hash(line.name);
       line.folder->index_->Prefetch(line.hash);
     }
   }
+  ResolveChildren(lines);
+}
+
+// The steps behind the folders.
+void OPTree::ResolveChildren(std::vector<AheadLine>& lines) {
   for (AheadLine& line : lines) {
     if (line.folder != nullptr && line.folder->index_ != nullptr) {
       line.guess = line.folder->index_->Guess(line.hash);
@@ -225,22 +263,20 @@ void OPTree::Resolve(std::vector<AheadLine>& lines) {
 }
 
 // The node of a folder that is there already, by a path that is checked on the way; else null.
-OPNode* OPTree::FindFolder(std::string_view path) {
-  if (last_folder_ != nullptr && path == last_folder_path_) {
-    return last_folder_;
+OPNode* OPTree::FindFolder(std::string_view path, uint64_t hash) {
+  if (OPNode* const known = folders_->Find(path, hash); known != nullptr) {
+    return known;
   }
   OPNode* node = root.get();
   for (size_t begin = 0; begin < path.size() && node != nullptr;) {
     const size_t end = std::min(path.find('/', begin + 1), path.size());
     // Every component follows one "/": an empty one names no child.
-    node = path[begin] == '/' && end > begin + 1
-               ? node->FindChild(path.substr(begin + 1, end - begin - 1))
-               : nullptr;
+    const std::string_view name = path.substr(begin + 1, end - begin - 1);
+    node = path[begin] == '/' && !name.empty() ? node->FindChild(name, NameHash(name)) : nullptr;
     begin = end;
   }
   if (node != nullptr) {
-    last_folder_path_ = path;
-    last_folder_ = node;
+    folders_->Put(path, hash, node);
   }
   return node;
 }
@@ -254,7 +290,7 @@ void OPTree::InsertLine(LineParser& parser, const AheadLine& line, bool reported
     const EventView& event = line.ordinary ? line.event : parser.ParseUnusual(line.line);
     parsed = true;
     Insert(event, line.node != nullptr     ? *line.node
-                  : line.folder != nullptr ? line.folder->FindOrAddChild(line.name)
+                  : line.folder != nullptr ? line.folder->FindOrAddChild(line.name, line.hash)
                                            : FindNode(event.path));
   } catch (const Error& error) {
     ++skipped_count_;
@@ -313,18 +349,18 @@ void OPTree::InsertOneStep(uint32_t step, const EventView& event, OPNode& node) 
     case EV_UPDATE_DIRECTORY:
       return HandleNew(Handler::kUpdateDirectory, node,
                        event.data == nullptr ? NullData() : *event.data);
-    default:
-      return Rename(node, event.path,
-                    std::make_shared<OP>(node.shared_from_this(), OP_NONE,
-                                         std::string(event.path_old), NullData()),
-                    /*may_trade=*/!literal_);
+    default: {
+      const std::shared_ptr<OP> op = NewOP(node, OP_NONE);
+      op->path_old = event.path_old;
+      return Rename(node, event.path, op, /*may_trade=*/!literal_);
+    }
   }
 }
 
 // The steps of one line share one operation: a later step finds what an earlier one added among the
 // pending ones, and its rule applies to it like to any other.
 void OPTree::InsertSteps(uint32_t steps, const EventView& event, OPNode& node) {
-  const auto op = std::make_shared<OP>(node.shared_from_this(), OP_NONE, "", NullData());
+  const std::shared_ptr<OP> op = NewOP(node, OP_NONE);
   const auto has = [steps](EventMask step) { return (steps & step) != 0; };
   if (has(EV_CREATE)) {
     Handle(event.is_dir ? Handler::kReindex : Handler::kCreate, node, op);
@@ -404,17 +440,26 @@ void OPTree::HandleNew(Handler handler, OPNode& node, const Json::Value& data) {
     CancelBelow(node);
   }
   if (survives) {
-    Add(std::make_shared<OP>(node.shared_from_this(), kKindOf[static_cast<size_t>(handler)],
-                             std::string(), data));
+    const std::shared_ptr<OP> op = NewOP(node, kKindOf[static_cast<size_t>(handler)]);
+    if (handler == Handler::kUpdateDirectory) {  // No other carries a payload.
+      op->data = data;
+    }
+    AddTo(node, op);
   }
 }
 
 void OPTree::Add(const std::shared_ptr<OP>& op) {
-  ops.push_back(op);
   if (const std::shared_ptr<OPNode> node = op->node.lock(); node != nullptr) {
-    node->ops.push_back(op);
-    SetMarks(*node, MarksOf(op->op));
+    AddTo(*node, op);
+  } else {
+    ops.push_back(op);
   }
+}
+
+void OPTree::AddTo(OPNode& node, const std::shared_ptr<OP>& op) {
+  ops.push_back(op);
+  node.ops.push_back(op);
+  SetMarks(node, MarksOf(op->op));
 }
 
 bool OPTree::ApplyRules(Handler handler, OPNode& node, const Json::Value& data, OP* added) {
@@ -464,9 +509,8 @@ void OPTree::CancelBelow(OPNode& node) {
 
 void OPTree::Rename(OPNode& node, std::string_view new_path, const std::shared_ptr<OP>& op,
                     bool may_trade) {
-  const std::string old_path = op->path_old;
+  const std::string_view old_path = op->path_old;
   OPNode& source = FindNode(old_path);
-  last_folder_ = nullptr;
   const bool overlapping = IsSameOrBelow(new_path, old_path) || IsSameOrBelow(old_path, new_path);
   if (overlapping && !literal_) {
     must_start_over_ = true;
@@ -507,7 +551,7 @@ void OPTree::Rename(OPNode& node, std::string_view new_path, const std::shared_p
   }
   Add(op);  // To its node, which the moves may have changed.
   if (carried != OP_NONE) {
-    Add(std::make_shared<OP>(moved->shared_from_this(), carried, std::string(), NullData()));
+    AddTo(*moved, NewOP(*moved, carried));
   }
 }
 
@@ -516,10 +560,13 @@ void OPTree::Rename(OPNode& node, std::string_view new_path, const std::shared_p
 // time. All operations of both end on the node that was the source. False, and nothing is done,
 // where that does not pay or somebody else holds one of the two and would see it.
 bool OPTree::TradePlaces(OPNode& source, OPNode& target) {
+  if (source.children.empty() || !target.children.empty()) {
+    return false;
+  }
   const std::shared_ptr<OPNode> from = source.parent.lock();
   const std::shared_ptr<OPNode> to = target.parent.lock();
-  if (source.children.empty() || !target.children.empty() || from == nullptr || to == nullptr ||
-      source.position_ >= from->children.size() || target.position_ >= to->children.size()) {
+  if (from == nullptr || to == nullptr || source.position_ >= from->children.size() ||
+      target.position_ >= to->children.size()) {
     return false;
   }
   std::shared_ptr<OPNode>& source_slot = from->children[source.position_];
@@ -538,9 +585,12 @@ bool OPTree::TradePlaces(OPNode& source, OPNode& target) {
   target.settled_ops_ = 0;
 
   source_slot.swap(target_slot);
+  folders_->Forget();
   source.name.swap(target.name);
   source.parent.swap(target.parent);
-  std::swap(source.position_, target.position_);
+  const uint32_t position = source.position_;
+  source.position_ = target.position_;
+  target.position_ = position;
   const auto marks = static_cast<uint8_t>(source.marks_ | target.marks_);
   source.marks_ = 0;
   target.marks_ = 0;
@@ -560,7 +610,7 @@ void OPTree::MoveMarkedBelow(OPNode& from, OPNode& to, Mark mark, Which which) {
     const auto [node, node_to] = marked.back();
     marked.pop_back();
     TakeMarkedChildren(*node, mark, [&, target = node_to](OPNode& child) {
-      OPNode& child_to = target->FindOrAddChild(child.name);
+      OPNode& child_to = target->FindOrAddChild(child.name, NameHash(child.name));
       MoveOps(child, child_to, which);
       marked.emplace_back(&child, &child_to);
     });
@@ -632,7 +682,7 @@ void OPTree::SetMarks(OPNode& node, uint8_t marks) {
     if (marks == 0) {
       return;
     }
-    at->marks_ |= marks;
+    at->marks_ = static_cast<uint8_t>(at->marks_ | marks);
     std::shared_ptr<OPNode> above = at->parent.lock();
     if (above == nullptr) {
       return;
@@ -648,7 +698,7 @@ void OPTree::SetMarks(OPNode& node, uint8_t marks) {
       }
       for (size_t bit = 0; bit < above->index_->marked.size(); ++bit) {
         if ((marks >> bit & 1) != 0) {
-          above->index_->marked[bit].push_back(static_cast<uint32_t>(position));
+          above->index_->marked[bit].Add(position);
         }
       }
     }
@@ -661,7 +711,7 @@ template <typename Visit>
 void OPTree::TakeMarkedChildren(OPNode& node, Mark mark, Visit visit) {
   const auto take = [&](OPNode& child) {
     if ((child.marks_ & mark) != 0) {
-      child.marks_ &= static_cast<uint8_t>(~mark);
+      child.marks_ = static_cast<uint8_t>(child.marks_ & ~mark);
       visit(child);
     }
   };
@@ -672,11 +722,11 @@ void OPTree::TakeMarkedChildren(OPNode& node, Mark mark, Visit visit) {
     return;
   }
   const auto bit = static_cast<size_t>(std::countr_zero(static_cast<unsigned>(mark)));
-  for (const uint32_t position : std::exchange(node.index_->marked[bit], {})) {
+  node.index_->marked[bit].TakeAll([&](size_t position) {
     if (position < node.children.size()) {
       take(*node.children[position]);
     }
-  }
+  });
 }
 
 std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
@@ -684,13 +734,21 @@ std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
 }
 
 OPNode& OPTree::FindNode(std::string_view path) {
+  if (folders_ != nullptr && !path.empty() && path.back() != '/') {
+    const std::string_view folder_path = path.substr(0, std::min(path.rfind('/'), path.size()));
+    if (OPNode* const folder = folders_->Find(folder_path, NameHash(folder_path))) {
+      const std::string_view name = path.substr(folder_path.size() + 1);
+      return folder->FindOrAddChild(name, NameHash(name));
+    }
+  }
   OPNode* node = root.get();
   // Going back up from the node gives the path again just when every component followed one "/".
   bool normalised = path.empty() || path.front() == '/';
   for (size_t begin = 0; begin < path.size();) {
     const size_t end = std::min(path.find('/', begin), path.size());
     if (end > begin) {
-      node = &node->FindOrAddChild(path.substr(begin, end - begin));
+      const std::string_view name = path.substr(begin, end - begin);
+      node = &node->FindOrAddChild(name, NameHash(name));
     } else if (begin > 0) {
       normalised = false;
     }
@@ -735,9 +793,10 @@ size_t OPTree::ProcessOP(std::function<void(std::shared_ptr<OP>)> callback) {
     callback(std::make_shared<OP>(root, OP_QUEUE_CRASHED, "", NullData()));
     return 1;
   }
-  for (const std::shared_ptr<OP>& op : ops) {
-    if (op->op != OP_NONE) {
-      callback(op);
+  for (size_t i = 0; i < ops.size(); ++i) {
+    PrefetchAhead(ops, i);
+    if (ops[i]->op != OP_NONE) {
+      callback(ops[i]);
     }
   }
   return ops.size();

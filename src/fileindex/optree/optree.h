@@ -16,6 +16,7 @@
 
 namespace vexlo::fileindex {
 
+class FolderCache;
 struct EventView;
 struct QueueLine;
 class LineParser;
@@ -27,12 +28,16 @@ class VEXLO_EXPORT OPTree {
  public:
   // Reads the whole file; see BuildTree() for what it throws.
   explicit OPTree(const std::string& queue_path);
+  ~OPTree();
+  OPTree(const OPTree&) = default;
+  OPTree& operator=(const OPTree&) = default;
 
   // How far BuildTree() has come, in bytes of the file and in lines.
   struct Progress {
-    uint64_t bytes_read;
-    uint64_t bytes_total;
-    uint64_t lines;
+    uint64_t bytes_read;   // From the beginning of the file. Anew from there when a folder is
+                           // renamed into itself, as the tree is then built once more.
+    uint64_t bytes_total;  // The size of the file.
+    uint64_t lines;        // Of these bytes, skipped ones too.
   };
 
   // The same, with a call every few thousand lines.
@@ -80,9 +85,10 @@ class VEXLO_EXPORT OPTree {
   uint64_t GetLineCount() const { return line_count_; }
   uint64_t GetSkippedCount() const { return skipped_count_; }
 
-  bool crashed = false;
-  std::string queue_path;
-  std::shared_ptr<OPNode> root;
+  // What was read and what came of it, for those who look into the tree or build one by hand.
+  bool crashed = false;          // Events were lost: nothing but the root's operation is delivered.
+  std::string queue_path;        // As it was given.
+  std::shared_ptr<OPNode> root;  // Never null.
   std::vector<std::shared_ptr<OP>> ops;  // All that were ever added, in order, cancelled ones too.
 
  private:
@@ -103,14 +109,16 @@ class VEXLO_EXPORT OPTree {
   void ReadQueue();
   void ReadAhead(LineReader& reader, std::vector<AheadLine>& lines);
   void Resolve(std::vector<AheadLine>& lines);
-  OPNode* FindFolder(std::string_view path);
+  static void ResolveChildren(std::vector<AheadLine>& lines);
+  OPNode* FindFolder(std::string_view path, uint64_t hash);
   void InsertLine(LineParser& parser, const AheadLine& line, bool reported);
   void Insert(const EventView& event, OPNode& node);
   void InsertOneStep(uint32_t step, const EventView& event, OPNode& node);
   void InsertSteps(uint32_t steps, const EventView& event, OPNode& node);
   void Handle(Handler handler, OPNode& node, const std::shared_ptr<OP>& op);
   void HandleNew(Handler handler, OPNode& node, const Json::Value& data);
-  void Add(const std::shared_ptr<OP>& op);
+  void Add(const std::shared_ptr<OP>& op);  // To its own node.
+  void AddTo(OPNode& node, const std::shared_ptr<OP>& op);
 
   // Applies the handler's rules to all that is pending; true when none of it absorbs the new one,
   // which `added` points to if it exists already. `data` may be its own.
@@ -119,7 +127,7 @@ class VEXLO_EXPORT OPTree {
 
   void Rename(OPNode& node, std::string_view new_path, const std::shared_ptr<OP>& op,
               bool may_trade);
-  static bool TradePlaces(OPNode& source, OPNode& target);
+  bool TradePlaces(OPNode& source, OPNode& target);
   template <typename Which>
   static void MoveMarkedBelow(OPNode& from, OPNode& to, Mark mark, Which which);
   void MoveAllBelow(OPNode& from, std::string_view old_path, std::string_view new_path,
@@ -144,9 +152,7 @@ class VEXLO_EXPORT OPTree {
   uint64_t overlapping_bytes_ = 0;  // Of paths made for such renames.
 
   std::function<void(const Progress&)> on_progress_;
-  // The folder of the last line that was resolved; null after anything that moves nodes.
-  std::string last_folder_path_;
-  OPNode* last_folder_ = nullptr;
+  std::shared_ptr<FolderCache> folders_;  // While BuildTree() runs, unless it walks every node.
 
   // What was read before BuildTree() started over, so that nothing is logged twice.
   uint64_t reported_lines_ = 0;

@@ -1,4 +1,4 @@
-// The group of a file, by the extension of its name.
+// The group of a file, by the extension of its name. None of these fails, and any thread may call.
 #ifndef FILEINDEX_UTIL_FILE_TYPE_H_
 #define FILEINDEX_UTIL_FILE_TYPE_H_
 

@@ -13,7 +13,8 @@
 //
 // The cheap questions come first, the one that walks the disk last. What the platform cannot answer
 // about a path counts as a refusal (for the snapshot, as none). Throws Error 502 when no share
-// holds the path or the share cannot be asked, 800 when the share has just gone.
+// holds the path or the share cannot be asked, 800 when the share has just gone. Any thread may
+// ask; a holder of SDKMutex() must not.
 #ifndef FILEINDEX_UTIL_PATH_POLICY_H_
 #define FILEINDEX_UTIL_PATH_POLICY_H_
 
@@ -28,9 +29,11 @@ namespace vexlo::fileindex {
 // the platform's hidden attribute directory, ...). Byte for byte: "thumbs.db" does not.
 VEXLO_EXPORT bool IsSystemPreservedFileName(const std::string& name);
 
-// Throws Error 502 when no share holds the path.
+// Whether the path is a recycle bin, the share's or a user's, or lies in one. Throws Error 502 when
+// no share holds the path.
 VEXLO_EXPORT bool IsFullPathInRecycleBin(const std::string& full_path);
 
+// Whether no rule refuses the path.
 VEXLO_EXPORT bool CanFullPathBeIndexed(const std::string& full_path);
 
 // The same of a share path; throws as GetFullPath() does, too.
@@ -38,14 +41,15 @@ VEXLO_EXPORT bool CanPathBeIndexed(const std::string& path);
 
 // What one rule says of one path.
 struct RuleVerdict {
+  // Whether the rule holds the path up.
   enum Answer {
     kPasses,
     kRefuses,
     kCannotTell,  // CanFullPathBeIndexed() throws here.
   };
 
-  const char* rule;
-  Answer answer;
+  const char* rule;    // Its name in the list above; lives as long as the program.
+  Answer answer;       // What it says of the path.
   std::string reason;  // A sentence for people, without its full stop.
 };
 

@@ -1,5 +1,6 @@
 // A folder has two names: its share path, "/music/live", which begins with the share, and its full
-// path on the volume, "/volume1/music/live". These functions go from one to the other.
+// path on the volume, "/volume1/music/live". These functions go from one to the other. Any
+// thread may call; a holder of SDKMutex() must not.
 #ifndef FILEINDEX_UTIL_SHARE_PATH_H_
 #define FILEINDEX_UTIL_SHARE_PATH_H_
 
@@ -9,8 +10,8 @@
 
 namespace vexlo::fileindex {
 
-// The first component of a share path, "" for "/". Throws Error 120 with the path when it does not
-// begin with "/".
+// The first component of a share path ("/photo/2019" is in "photo"), "" for "/". Throws Error 120
+// with the path when it does not begin with "/".
 VEXLO_EXPORT void GetShareNameByPath(std::string& share_name, const std::string& share_path);
 VEXLO_EXPORT std::string GetShareNameByPath(const std::string& share_path);
 

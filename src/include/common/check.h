@@ -2,7 +2,7 @@
 //
 // Every line goes to syslog at error priority and begins "SOURCE:LINE ". A monitor that watches for
 // one of them matches source and line, so sites whose line is written out in the code (LogSite)
-// keep it when the code moves.
+// keep it when the code moves. Any thread may log.
 #ifndef COMMON_CHECK_H_
 #define COMMON_CHECK_H_
 
@@ -18,10 +18,10 @@ namespace vexlo {
 
 // Where a line comes from. All texts outlive the call; `condition` is the failing test as text.
 struct LogSite {
-  const char* source;
-  int line;
-  const char* function;
-  const char* condition;
+  const char* source;     // The file's name without folder and extension, or its module's.
+  int line;               // From 1.
+  const char* function;   // Its bare name.
+  const char* condition;  // As it stands in the code.
 };
 
 // "SOURCE:LINE text".

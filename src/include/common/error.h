@@ -8,6 +8,8 @@
 
 #include "common/export.h"
 
+// The foundation, which knows nothing of indexing: errors and log lines, texts, files, JSON, locks;
+// and the channel to the search engine.
 namespace vexlo {
 
 // Callers pass these numbers on to their own clients: never renumber. The enumeration is open: an
@@ -40,6 +42,7 @@ VEXLO_EXPORT std::string ErrorString(ErrorCode code, const std::string& reason);
 // Thrown by everything in the library that fails. Whoever throws it has logged it.
 class VEXLO_EXPORT Error : public std::runtime_error {
  public:
+  // With what the caller may show to people, or without. Logs nothing.
   explicit Error(ErrorCode code);
   Error(ErrorCode code, const std::string& reason);
   Error(const Error&) = default;
@@ -51,6 +54,7 @@ class VEXLO_EXPORT Error : public std::runtime_error {
   // The reason alone, empty when there is none: it is meant to be shown as it stands. The text of
   // ErrorString() is what the base class's what() returns.
   const char* what() const noexcept override;
+  // One of the above, or the engine's own.
   ErrorCode GetErrorCode() const noexcept { return code_; }
 
  private:

@@ -1,3 +1,4 @@
+// What the shared library shows, marked at its declaration.
 #ifndef COMMON_EXPORT_H_
 #define COMMON_EXPORT_H_
 

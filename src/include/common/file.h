@@ -1,4 +1,5 @@
-// Helpers on files. Those that answer with a bool leave the cause in errno where it is false.
+// Helpers on files. Those that answer with a bool leave the cause in errno where it is false. Paths
+// are full paths, or relative to the working directory; bytes in any encoding. Any thread may call.
 #ifndef COMMON_FILE_H_
 #define COMMON_FILE_H_
 
@@ -38,7 +39,7 @@ VEXLO_EXPORT bool CheckACLPerm(const std::string& path, unsigned perm);
 VEXLO_EXPORT bool Unlink(const std::string& path);
 
 // Move or copy a file with mode, owner, times and extended attributes; an existing target is
-// replaced whole or not at all. True when it is done.
+// replaced whole or not at all. True when it is done. What `args` asks for stands in kavo/file.h.
 VEXLO_EXPORT bool MVFile(const std::string& from, const std::string& to);
 VEXLO_EXPORT bool CPFile(const std::string& from, const std::string& to);
 VEXLO_EXPORT bool MVFileImpl(const std::string& from, const std::string& to,
@@ -48,7 +49,7 @@ VEXLO_EXPORT bool MVFileImpl(const std::string& from, const std::string& to,
 // the change is refused. Takes SDKMutex() around the look-up.
 VEXLO_EXPORT bool ChownVexlo(const std::string& path);
 
-// Reads a whole file; false when it cannot be opened or read.
+// Reads a whole file into `content`, whatever its size; false when it cannot be opened or read.
 VEXLO_EXPORT bool ReadFile(std::string& content, const std::string& path);
 
 // Replaces a file whole: a reader, or the next start after a power failure, finds the old content

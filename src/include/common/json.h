@@ -1,7 +1,7 @@
 // Reading and writing JSON, and typed access to its members.
 //
 // Texts are bytes: a string that is not valid UTF-8 (a file name need not be) is read and written
-// back unchanged. No Json::Exception leaves these functions.
+// back unchanged. No Json::Exception leaves these functions. Any thread may call.
 #ifndef COMMON_JSON_H_
 #define COMMON_JSON_H_
 
@@ -62,16 +62,17 @@ VEXLO_EXPORT void JsonApplyChanges(Json::Value& target, const Json::Value& chang
 // ", data=" and the styled text.
 VEXLO_EXPORT std::string AppendData(const Json::Value& value);
 
-// An array of the strings in order, [] for none.
+// An array of the strings in order, [] for none. T is std::string.
 template <typename T>
 Json::Value Vec2JsonArr(const std::vector<T>& values);
 
 // The elements as strings in order; null gives none. Throws Error 120 for anything that is no array
-// or holds an element that does not convert.
+// or holds an element that does not convert. T is std::string.
 template <typename T>
 std::vector<T> JsonArr2Vec(const Json::Value& array);
 
 // NOLINTBEGIN(bugprone-macro-parentheses): a type takes none.
+// Declares what the library has for one of the types; gone again below.
 #define VEXLO_JSON_TYPE(T)                                                              \
   template <>                                                                           \
   VEXLO_EXPORT bool isJsonType<T>(const Json::Value& value);                            \
@@ -79,6 +80,7 @@ std::vector<T> JsonArr2Vec(const Json::Value& array);
   VEXLO_EXPORT T asJsonType<T>(const Json::Value& value);                               \
   extern template VEXLO_EXPORT void GetJsonValue<T>(T & out, const Json::Value& object, \
                                                     const std::string& key, bool required)
+// The types that the templates are there for.
 VEXLO_JSON_TYPE(std::string);
 VEXLO_JSON_TYPE(bool);
 VEXLO_JSON_TYPE(int);
@@ -87,9 +89,11 @@ VEXLO_JSON_TYPE(long);
 VEXLO_JSON_TYPE(double);
 #undef VEXLO_JSON_TYPE
 // NOLINTEND(bugprone-macro-parentheses)
+// Besides these, a member as it is.
 extern template VEXLO_EXPORT void GetJsonValue<Json::Value>(Json::Value& out,
                                                             const Json::Value& object,
                                                             const std::string& key, bool required);
+// The one kind of list.
 template <>
 VEXLO_EXPORT Json::Value Vec2JsonArr<std::string>(const std::vector<std::string>& values);
 template <>

@@ -19,6 +19,7 @@ class VEXLO_EXPORT Mutex {
   Mutex(const Mutex&) = delete;
   Mutex& operator=(const Mutex&) = delete;
 
+  // Waits without a limit; TryLock() does not wait. Whoever locked unlocks, on the same thread.
   bool Lock();
   bool TryLock();
   bool Unlock();
@@ -31,6 +32,7 @@ class VEXLO_EXPORT Mutex {
 // destructor must not throw, and both ends behave alike.
 class VEXLO_EXPORT LockMutex {
  public:
+  // The mutex outlives the object.
   explicit LockMutex(Mutex& mutex);
   ~LockMutex();
   LockMutex(const LockMutex&) = delete;
@@ -66,6 +68,7 @@ class VEXLO_EXPORT LockFile {
   LockFile(const LockFile&) = delete;
   LockFile& operator=(const LockFile&) = delete;
 
+  // True of every object that the first constructor made.
   bool IsHeld() const { return fd_ >= 0; }
 
  private:

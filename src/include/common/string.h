@@ -1,5 +1,5 @@
 // Helpers on path and file-name texts. All of them work on bytes and know nothing of the file
-// system or of an encoding.
+// system or of an encoding. None fails, and any thread may call.
 #ifndef COMMON_STRING_H_
 #define COMMON_STRING_H_
 

@@ -179,26 +179,32 @@ TEST(Crash, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   // Stands for whatever one statement may be refused for.
   sqlite3* db = nullptr;
   ASSERT_EQ(sqlite3_open((engine.Folder() / "i/index.db").c_str(), &db), SQLITE_OK);
-  ASSERT_EQ(sqlite3_exec(db,
-                         "CREATE TRIGGER refuse BEFORE INSERT ON bodies WHEN instr(new.text, 'bad')"
-                         " BEGIN SELECT RAISE(ABORT, 'refused'); END",
-                         nullptr, nullptr, nullptr),
-            SQLITE_OK);
+  ASSERT_EQ(
+      sqlite3_exec(db,
+                   "CREATE TRIGGER refuse BEFORE INSERT ON records WHEN instr(new.record, 'bad')"
+                   " BEGIN SELECT RAISE(ABORT, 'refused'); END",
+                   nullptr, nullptr, nullptr),
+      SQLITE_OK);
   sqlite3_close(db);
   engine.Do("index_resume");
   const auto document = [](const std::string& path, const std::string& text) {
-    return WriteRequest(
-        "document_upsert_by_id", path,
-        MakeDocument(path, R"({"KAVOMDTextContent":")" + text + std::string(500, 'x') + "\"}"));
+    return WriteRequest("document_upsert_by_id", path,
+                        MakeDocument(path, R"({"KAVOMDTextContent":")" + text + "\"}"));
   };
-  // In a compound it fails alone, and leaves no part of it behind.
+  // In a compound it fails alone, and leaves no part of it behind, nor of the words that waited
+  // for their index before it.
+  EXPECT_EQ(Answer(engine.Send(document("/v/0", "first"))), "ok");
+  EXPECT_EQ(Answer(engine.Send(document("/v/0", "second"))), "ok");
   Json::Value request;
+  request["compound"].append(document("/v/0", "third"));
   request["compound"].append(document("/v/1", "good "));
   request["compound"].append(document("/v/2", "bad "));
   request["compound"].append(document("/v/3", "good "));
   const Json::Value reply = engine.Send(request);
   EXPECT_TRUE(reply["has_fail"].asBool());
-  EXPECT_EQ(Answer(reply["data"][1]), "2009");
+  EXPECT_EQ(Answer(reply["data"][2]), "2009");
+  EXPECT_EQ(engine.Search(R"({"words":"third"})"), "/v/0");
+  EXPECT_EQ(engine.Search(R"({"words":"second"})") + engine.Search(R"({"words":"first"})"), "");
   EXPECT_EQ(engine.Search(R"({"words":"good","sort":"path"})"), "/v/1 /v/3");
   EXPECT_EQ(engine.Search(R"({"words":"bad"})"), "");
   // Alone it takes what was not committed with it, and the commit says so.
@@ -207,7 +213,7 @@ TEST(Crash, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   EXPECT_EQ(engine.Add("/v/6"), "ok");
   EXPECT_EQ(engine.Do("commit"), "2011");
   EXPECT_EQ(engine.Do("commit"), "ok");
-  EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/v"}})"), "/v/1 /v/3 /v/6 /v/before");
+  EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/v"}})"), "/v/0 /v/1 /v/3 /v/6 /v/before");
 }
 
 TEST(Crash, AChangeOfTheRegistryThatCannotBeWrittenChangesNothing) {

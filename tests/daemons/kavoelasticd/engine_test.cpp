@@ -2,6 +2,8 @@
 
 #include <gtest/gtest.h>
 
+#include <chrono>
+#include <filesystem>
 #include <string>
 #include <vector>
 
@@ -323,6 +325,61 @@ TEST(Engine, MovesToAnotherDisk) {
   engine.Restart();
   EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
   EXPECT_EQ(engine.Do("index_delete"), "ok");
+}
+
+TEST(Engine, AtRestTheLogIsEmptyAndNothingIsLeftToDo) {
+  using namespace std::chrono_literals;
+  EngineFixture engine;
+  const std::string log = engine.Folder() / "i/index.db-wal";
+  EXPECT_FALSE(engine.Engine().CommitIdle(0s));
+  // More segments than a text index keeps, each of a commit.
+  for (int i = 0; i < 30; ++i) {
+    engine.Add("/v/" + std::to_string(i),
+               R"({"KAVOMDTextContent":"word )" + std::to_string(i) + "\"}");
+    EXPECT_EQ(engine.Do("commit"), "ok");
+  }
+  engine.Add("/v/last");
+  // Not before it has been quiet for so long.
+  EXPECT_TRUE(engine.Engine().CommitIdle(1h));
+  EXPECT_GT(std::filesystem::file_size(log), 0U);
+  engine.Engine().AwaitChange({});
+  for (int calls = 0; engine.Engine().CommitIdle(0s); ++calls) {
+    ASSERT_LT(calls, 100);
+  }
+  EXPECT_EQ(std::filesystem::file_size(log), 0U);
+  EXPECT_EQ(engine.Query(R"({"term":{"KAVOMDTextContent":"word"}})", R"({"size":0})"), "");
+  EXPECT_EQ(engine.Documents(R"({"term":{"KAVOMDTextContent":"word"}})", R"({"size":100})").size(),
+            30U);
+  EXPECT_EQ(engine.Search(R"({"name":"last"})"), "/v/last");
+}
+
+TEST(Engine, WhatIsRemovedIsFoundNoMoreAndThenForgotten) {
+  using namespace std::chrono_literals;
+  EngineFixture engine;
+  const auto total = [&engine] {
+    return engine.Send("search", Parsed(R"({"words":"word"})"))["total"].asInt();
+  };
+  for (const char* path : {"/v/1", "/v/2", "/w/3"}) {
+    engine.Add(path, R"({"KAVOMDTextContent":"word )" + std::string(500, 'x') + "\"}");
+  }
+  EXPECT_EQ(engine.Do("commit"), "ok");
+  EXPECT_EQ(
+      engine.Do("document_del_by_query", R"({"query":{"qsl":{"prefix":{"KAVOMDPath":"/w/"}}}})"),
+      "ok");
+  EXPECT_EQ(engine.Do("commit"), "ok");
+  EXPECT_EQ(total(), 2);
+  EXPECT_EQ(engine.Search(R"({"words":"word"})"), "/v/1 /v/2");
+  EXPECT_EQ(engine.Query(R"({"term":{"KAVOMDTextContent":"word"}})"), "/v/1 /v/2");
+  // A document that comes before it is forgotten, or after, has nothing of it.
+  engine.Add("/w/4");
+  engine.Restart();
+  EXPECT_EQ(engine.Do("document_del_by_id", R"({"doc_id":"/w/4"})"), "ok");
+  while (engine.Engine().CommitIdle(0s)) {
+  }
+  engine.Add("/w/5");
+  EXPECT_EQ(engine.Search(R"({"words":"word"})"), "/v/1 /v/2");
+  EXPECT_EQ(engine.Search(R"({"name":"3"})") + engine.Search(R"({"name":"4"})"), "");
+  EXPECT_EQ(engine.Search(R"({"name":"5"})"), "/w/5");
 }
 
 }  // namespace

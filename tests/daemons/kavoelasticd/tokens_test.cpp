@@ -66,14 +66,14 @@ TEST(WordCutter, CutsDocumentsAndQueries) {
        "ab\xff"
        "cd",
        "ab cd", "ab cd", "ab cd"},
-      {"Pairs", tokyo, "\u6771\u4eac \u4eac\u90fd \u90fd", "\u6771\u4eac \u4eac\u90fd",
+      {"Pairs", tokyo, "\u6771\u4eac \u4eac\u90fd/\u90fd", "\u6771\u4eac \u4eac\u90fd",
        "\u6771\u4eac \u4eac\u90fd"},
       {"One", "\u90fd", "\u90fd", "\u90fd", "\u90fd"},
       {"PairsAmongWords",
        "a\u6771\u4eac"
        "b",
-       "a \u6771\u4eac \u4eac b", "a \u6771\u4eac b", "a \u6771\u4eac b"},
-      {"DecomposedHangul", "\u1112\u1161\u11ab\u1100\u116e\u11a8", "\ud55c\uad6d \uad6d",
+       "a \u6771\u4eac/\u4eac b", "a \u6771\u4eac b", "a \u6771\u4eac b"},
+      {"DecomposedHangul", "\u1112\u1161\u11ab\u1100\u116e\u11a8", "\ud55c\uad6d/\uad6d",
        "\ud55c\uad6d", "\ud55c\uad6d"},
       {"SoftHyphen", "co\u00adop", "coop", "coop", "coop"},
       {"Nothing", " ... ", "", "", ""},

@@ -23,9 +23,9 @@ namespace content_reason {
 inline constexpr char kUnavailable[] = "unavailable";  // Nobody, or nobody in time, was there to
                                                        // read it: worth another try.
 inline constexpr char kUnreadable[] = "unreadable";    // It cannot be opened or read.
-inline constexpr char kEncrypted[] = "encrypted";
-inline constexpr char kDamaged[] = "damaged";      // Not what its beginning promises.
-inline constexpr char kOversized[] = "oversized";  // Over a limit of its format.
+inline constexpr char kEncrypted[] = "encrypted";      // It wants a password.
+inline constexpr char kDamaged[] = "damaged";          // Not what its beginning promises.
+inline constexpr char kOversized[] = "oversized";      // Over a limit of its format.
 // Reading it ended two processes, so it is left alone until it changes.
 inline constexpr char kDeadline[] = "deadline";
 inline constexpr char kMemory[] = "memory";

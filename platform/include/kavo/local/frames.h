@@ -12,6 +12,7 @@
 
 namespace kavo::local {
 
+// When a call gives up; one that is past lets it do what needs no waiting.
 using Deadline = std::chrono::steady_clock::time_point;
 
 // A connection to the socket at the path, owned by the caller; -1 with errno. A server that is too

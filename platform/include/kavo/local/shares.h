@@ -12,6 +12,7 @@
 #include <string>
 #include <vector>
 
+// What only the local platform has.
 namespace kavo::local {
 
 // One share as the file has it. A key that is missing has the value given here; a key that is not

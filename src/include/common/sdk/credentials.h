@@ -19,7 +19,7 @@ namespace vexlo::sdk {
 //                                 nothing goes back: a process that was someone else stays root.
 //
 // The identity belongs to the process: every thread changes with it. SDKMutex() is held around each
-// platform call, never in between.
+// platform call, never in between. So a program with several threads has one of these at a time.
 class VEXLO_EXPORT SDKCredentials {
  public:
   // Throws Error 503 when the effective user is not known to the platform.

@@ -11,6 +11,7 @@
 
 struct KAVO_SHARE;
 
+// The platform as the library sees it: shares, and the identity of the process.
 namespace vexlo::sdk {
 
 // A share by its name, as the platform has it now. Built on the stack where it is needed: what is
@@ -25,6 +26,7 @@ class VEXLO_EXPORT SDKShare {
   SDKShare(const SDKShare&) = delete;
   SDKShare& operator=(const SDKShare&) = delete;
 
+  // As it was asked for.
   const std::string& GetName() const { return name_; }
 
   // The share's directory on its volume: "/volume1/photo".

@@ -1,0 +1,26 @@
+# Makes a source of the files of a web page, so that the program carries them.
+#
+#   cmake -DFOLDER=cli/web/page -DOUTPUT=pages.cpp -P cmake/embed.cmake
+set(types_html "text/html; charset=utf-8")
+set(types_css "text/css; charset=utf-8")
+set(types_js "text/javascript; charset=utf-8")
+set(types_svg "image/svg+xml")
+
+file(GLOB files RELATIVE ${FOLDER} ${FOLDER}/*)
+set(texts "")
+set(table "")
+set(number 0)
+foreach(file IN LISTS files)
+  string(REGEX REPLACE ".*\\." "" extension ${file})
+  if(NOT DEFINED types_${extension})
+    message(FATAL_ERROR "${file}: this kind of file has no type here")
+  endif()
+  file(READ ${FOLDER}/${file} text HEX)
+  string(LENGTH "${text}" digits)
+  math(EXPR bytes "${digits} / 2")
+  string(REGEX REPLACE "(..)" "'\\\\x\\1'," text "${text}")
+  string(APPEND texts "constexpr char kText${number}[] = {${text}};\n")
+  string(APPEND table "    {\"/${file}\", \"${types_${extension}}\", {kText${number}, ${bytes}}},\n")
+  math(EXPR number "${number} + 1")
+endforeach()
+file(WRITE ${OUTPUT} "#include \"cli/web/pages.h\"\n\nnamespace vexlo::cli {\nnamespace {\n\n${texts}\nconstexpr Page kPages[] = {\n${table}};\n\n}  // namespace\n\nstd::span<const Page> EmbeddedPages() { return kPages; }\n\n}  // namespace vexlo::cli\n")

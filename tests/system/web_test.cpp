@@ -1,0 +1,381 @@
+// The web page's server beside the real daemons, over plain sockets and in a browser.
+#include <arpa/inet.h>
+#include <fcntl.h>
+#include <netinet/in.h>
+#include <sys/socket.h>
+
+#include <algorithm>
+#include <ctime>
+#include <set>
+#include <vector>
+
+#include "support/stack.h"
+#include "support/temp_folder.h"
+
+namespace {
+
+const PrivateRoot kRoot;
+constexpr int kFiles = 45;
+
+// A connection to a port of this machine.
+class Client {
+ public:
+  explicit Client(uint16_t port) : fd_(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
+    const timeval patience = {60, 0};
+    setsockopt(fd_, SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof(patience));
+    sockaddr_in address{};
+    address.sin_family = AF_INET;
+    address.sin_port = htons(port);
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    EXPECT_EQ(connect(fd_, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
+  }
+  ~Client() { close(fd_); }
+  Client(const Client&) = delete;
+  Client& operator=(const Client&) = delete;
+
+  void Send(const std::string& text) const { send(fd_, text.data(), text.size(), MSG_NOSIGNAL); }
+  // All until the server closes.
+  std::string Receive() const {
+    std::string text;
+    char buffer[4096];
+    ssize_t count = 0;
+    while ((count = recv(fd_, buffer, sizeof(buffer), 0)) > 0) {
+      text.append(buffer, static_cast<size_t>(count));
+    }
+    return text;
+  }
+
+ private:
+  const int fd_;
+};
+
+struct Reply {
+  int status;
+  std::string head;
+  Json::Value body;
+};
+
+// "fileindex web" on a port that was free.
+class Web {
+ public:
+  Web() : program_("true", FILEINDEX_PROGRAM " web --listen 127.0.0.1:0 2>&1") {
+    EXPECT_TRUE(program_.Await("Ctrl-C ends it\n")) << program_.text;
+    const std::string mark = "/#token=";
+    const size_t at = program_.text.find(mark);
+    url_ = program_.text.substr(0, program_.text.find('\n'));
+    port_ = static_cast<uint16_t>(std::stoi(program_.text.substr(strlen("http://127.0.0.1:"))));
+    token_ = url_.substr(at + mark.size());
+  }
+
+  ~Web() {
+    if (!has_ended_) {
+      EXPECT_EQ(End(SIGINT), 0);
+    }
+  }
+  Web(const Web&) = delete;
+  Web& operator=(const Web&) = delete;
+
+  const std::string& Url() const { return url_; }
+  uint16_t Port() const { return port_; }
+  const std::string& Token() const { return token_; }
+  std::string Host() const { return "Host: 127.0.0.1:" + std::to_string(port_) + "\r\n"; }
+  std::string Key() const { return "X-Fileindex-Token: " + token_ + "\r\n"; }
+  int End(int signal) {
+    has_ended_ = true;
+    return program_.End(signal);
+  }
+
+  // Without a line for "Host" among the headers, the right one is sent.
+  Reply Ask(const std::string& line, const std::string& headers) const {
+    const Client client(port_);
+    client.Send(line + " HTTP/1.1\r\n" +
+                (headers.find("Host:") == std::string::npos ? Host() : "") + headers + "\r\n");
+    const std::string text = client.Receive();
+    const size_t head = text.find("\r\n\r\n");
+    Reply reply = {-1, text.substr(0, head), {}};
+    if (text.starts_with("HTTP/1.1 ") && head != std::string::npos) {
+      reply.status = std::stoi(text.substr(9));
+      vexlo::JsonFromString(reply.body, text.substr(head + 4));
+    }
+    return reply;
+  }
+  Json::Value Get(const std::string& target) const {
+    const Reply reply = Ask("GET " + target, Key());
+    EXPECT_EQ(reply.status, 200) << target << vexlo::JsonToString(reply.body);
+    return reply.body;
+  }
+
+ private:
+  Program program_;
+  bool has_ended_ = false;
+  std::string url_;
+  uint16_t port_ = 0;
+  std::string token_;
+};
+
+class WebTest : public testing::Test {
+ protected:
+  static void SetUpTestSuite() {
+    stack = new Stack(kRoot);
+    for (int i = 0; i < kFiles; ++i) {
+      WriteText(stack->In() + "/letter" + std::to_string(100 + i) + ".txt", "the harbour");
+    }
+    std::filesystem::create_directory(stack->In() + "/caf\xE9 & co");
+    WriteText(stack->In() + "/caf\xE9 & co/na\xEFve.txt", "a lighthouse");
+    WriteText(stack->In() + "/<img src=x onerror=alert(1)>.txt", "lighthouse <b>keeper</b>");
+    ASSERT_TRUE(stack->AwaitQuiet());
+  }
+  static void TearDownTestSuite() { delete std::exchange(stack, nullptr); }
+
+  static std::set<std::string> PathsOf(const Json::Value& reply) {
+    std::set<std::string> paths;
+    for (const Json::Value& hit : reply["data"]) {
+      paths.insert(hit["path"].asString());
+    }
+    return paths;
+  }
+
+  static Stack* stack;
+  Web web_;
+};
+Stack* WebTest::stack = nullptr;
+
+struct RequestCase {
+  const char* name;
+  const char* line;
+  std::string headers;  // "KEY" and "HOST" stand for the right ones.
+  int status;
+};
+
+std::string Replaced(std::string text, const std::string& word, const std::string& by) {
+  const size_t at = text.find(word);
+  return at == std::string::npos ? text : text.replace(at, word.size(), by);
+}
+
+TEST_F(WebTest, AnswersNobodyButItsOwner) {
+  const std::string own = "127.0.0.1:" + std::to_string(web_.Port());
+  const std::string longer = "X-Fileindex-Token: " + web_.Token() + "0\r\n";
+  const std::string status = "GET /api/status";
+  const RequestCase cases[] = {
+      {"Page", "GET /", "", 200},
+      {"PageHead", "HEAD /page.js", "", 200},
+      {"PageByAnotherPort", "GET /", "Host: localhost:1\r\n", 200},
+      {"PageByIpv6", "GET /", "Host: [::1]:80\r\n", 200},
+      {"PagePost", "POST /", "Content-Length: 0\r\n", 405},
+      {"NoPage", "GET /page", "", 404},
+      {"WayUp", "GET /../../etc/passwd", "", 404},
+      {"NoHost", "GET /", "Host:\r\n", 421},
+      {"Rebound", "GET /", "Host: evil.example\r\n", 421},
+      {"ReboundData", "GET /api/status", "KEYHost: evil.example\r\n", 421},
+      {"HostBeginsRight", "GET /", "Host: 127.0.0.1.evil.example\r\n", 421},
+      {"HostEndsRight", "GET /", "Host: evil.example:127.0.0.1\r\n", 421},
+      {"NetworkHost", "GET /", "Host: 192.168.1.1\r\n", 421},
+      {"TwoHosts", "GET /", "HOSTHost: evil.example\r\n", 421},
+      {"Data", "GET /api/status", "KEY", 200},
+      {"DataWithoutToken", "GET /api/status", "", 401},
+      {"TokenInAddress", "GET /api/status?token=TOKEN", "", 401},
+      {"TokenInCookie", "GET /api/status", "Cookie: X-Fileindex-Token=TOKEN\r\n", 401},
+      {"WrongToken", "GET /api/status", "X-Fileindex-Token: 00\r\n", 401},
+      {"EmptyToken", "GET /api/status", "X-Fileindex-Token:\r\n", 401},
+      {"LongerToken", "GET /api/status", longer, 401},
+      {"TwoTokens", "GET /api/status", "KEYKEY", 401},
+      {"ChangeWithoutToken", "POST /api/pause", "Content-Length: 0\r\n", 401},
+      {"UnknownWithoutToken", "GET /api/none", "", 401},
+      {"OwnOrigin", "GET /api/status", "KEYOrigin: http://" + own + "\r\n", 200},
+      {"OtherOrigin", "POST /api/resume", "KEYOrigin: http://evil.example\r\n", 403},
+      {"OtherPort", "POST /api/resume", "KEYOrigin: http://127.0.0.1:1\r\n", 403},
+      {"NullOrigin", "GET /api/status", "KEYOrigin: null\r\n", 403},
+      {"OwnSite", "GET /api/status", "KEYSec-Fetch-Site: same-origin\r\n", 200},
+      {"OtherSite", "GET /api/status", "KEYSec-Fetch-Site: cross-site\r\n", 403},
+      {"SameSite", "POST /api/resume", "KEYSec-Fetch-Site: same-site\r\n", 403},
+      {"Preflight", "OPTIONS /api/pause", "Origin: http://evil.example\r\n", 403},
+      {"Unknown", "GET /api/none", "KEY", 404},
+      {"PostToRead", "POST /api/search?words=a", "KEYContent-Length: 0\r\n", 405},
+      {"GetToChange", "GET /api/pause", "KEY", 405},
+      {"Body", "POST /api/pause", "KEYContent-Length: 1\r\n", 413},
+      {"ChunkedBody", "POST /api/pause", "KEYTransfer-Encoding: chunked\r\n", 413},
+      {"HugeBody", "POST /api/pause", "KEYContent-Length: 99999999999\r\n", 413},
+  };
+  for (const RequestCase& test : cases) {
+    SCOPED_TRACE(test.name);
+    std::string headers = Replaced(test.headers, "HOST", web_.Host());
+    headers = Replaced(Replaced(headers, "KEY", web_.Key()), "KEY", web_.Key());
+    const Reply reply = web_.Ask(Replaced(test.line, "TOKEN", web_.Token()),
+                                 Replaced(headers, "=TOKEN", "=" + web_.Token()));
+    EXPECT_EQ(reply.status, test.status) << reply.head;
+    for (const char* const wanted :
+         {"frame-ancestors 'none'", "default-src 'none'", "script-src 'self';", "nosniff",
+          "Referrer-Policy: no-referrer", "Cache-Control: no-store"}) {
+      EXPECT_NE(reply.head.find(wanted), std::string::npos) << wanted << "\n" << reply.head;
+    }
+    EXPECT_EQ(reply.head.find("Access-Control"), std::string::npos) << reply.head;
+    EXPECT_EQ(reply.head.find(web_.Token()), std::string::npos) << reply.head;
+  }
+  EXPECT_EQ(web_.Get("/api/status")["resume_time"].asInt(), -1)
+      << "a refused request has changed it";
+}
+
+TEST_F(WebTest, SaysWhatIsWrongWithArguments) {
+  const std::pair<const char*, const char*> cases[] = {
+      {"GET /api/search", "wants words"},
+      {"GET /api/search?words=", "wants words"},
+      {"GET /api/search?word=a", "no argument 'word'"},
+      {"GET /api/search?words=a&words=b", "more than once"},
+      {"GET /api/search?words=a%00b", "NUL"},
+      {"GET /api/search?words=a&limit=0", "'0', is no number from 1 to 100"},
+      {"GET /api/search?words=a&limit=101", "'101', is no number"},
+      {"GET /api/search?words=a&from=-1", "'-1', is no number from 0"},
+      {"GET /api/search?words=a&from=1e9", "'1e9', is no number"},
+      {"GET /api/search?below=letters", "its full path is wanted"},
+      {"GET /api/search?type=text", "'text' is no type"},
+      {"GET /api/search?larger=big", "'big' is no size"},
+      {"GET /api/search?newer=%C3", "'\xC3' is no date"},
+      {"GET /api/search?words=a&sort=up", "'up' is no order"},
+      {"GET /api/folders?limit=1001", "'1001', is no number"},
+      {"GET /api/status?all", "no argument 'all'"},
+      {"POST /api/pause?hours=0", "'0' is no number of hours"},
+      {"POST /api/resume?hours=1", "no argument 'hours'"},
+  };
+  for (const auto& [line, message] : cases) {
+    const Reply reply = web_.Ask(line, web_.Key());
+    EXPECT_EQ(reply.status, 400) << line << reply.head;
+    EXPECT_NE(reply.body["error"]["message"].asString().find(message), std::string::npos)
+        << line << vexlo::JsonToString(reply.body);
+  }
+}
+
+TEST_F(WebTest, RefusesRequestsThatAreTooLong) {
+  const std::string much(size_t{40} << 10, 'a');
+  EXPECT_EQ(web_.Ask("GET /api/search?words=" + much, web_.Key()).status, 414);
+  EXPECT_EQ(web_.Ask("GET /", "X-Much: " + much + "\r\n").status, 431);
+  EXPECT_EQ(web_.Ask("GET /", "").status, 200);
+}
+
+TEST_F(WebTest, TurnsPages) {
+  std::set<std::string> paths;
+  for (int from = 0; from < kFiles; from += 20) {
+    const Json::Value reply =
+        web_.Get("/api/search?words=harbour&sort=name&limit=20&from=" + std::to_string(from));
+    EXPECT_EQ(reply["total"].asInt(), kFiles);
+    EXPECT_EQ(reply["data"].size(), static_cast<size_t>(std::min(20, kFiles - from)));
+    EXPECT_EQ(reply["data"][0]["name"].asString(), "letter" + std::to_string(100 + from) + ".txt");
+    EXPECT_EQ(reply["data"][0]["snippet"].asString(), "the \x02harbour\x03");
+    paths.merge(PathsOf(reply));
+  }
+  EXPECT_EQ(paths.size(), kFiles);
+  EXPECT_TRUE(web_.Get("/api/search?words=harbour&from=45")["data"].empty());
+}
+
+TEST_F(WebTest, KeepsNamesAsBytes) {
+  const std::string folder = stack->In() + "/caf\xE9 & co";
+  const std::set<std::string> wanted = {folder + "/na\xEFve.txt"};
+  EXPECT_EQ(PathsOf(web_.Get("/api/search?words=lighthouse")).size(), 2);
+  EXPECT_EQ(
+      PathsOf(web_.Get("/api/search?words=lighthouse&below=" + stack->In() + "/caf%e9%20%26+co")),
+      wanted);
+  EXPECT_EQ(PathsOf(web_.Get("/api/search?type=document&smaller=1k&below=" + stack->In() +
+                             "/caf%E9+%26+co")),
+            wanted);
+  EXPECT_TRUE(PathsOf(web_.Get("/api/search?words=lighthouse&larger=1k")).empty());
+}
+
+TEST_F(WebTest, PausesAndResumes) {
+  const Json::Value folders = web_.Get("/api/folders");
+  EXPECT_EQ(folders["total"].asInt(), 1);
+  EXPECT_EQ(folders["folder"][0]["full_path"].asString(), stack->In());
+  EXPECT_EQ(folders["folder"][0]["additional"]["status"]["text"].asString(), "finished");
+
+  const time_t before = time(nullptr);
+  const Reply paused = web_.Ask("POST /api/pause?hours=2", web_.Key());
+  EXPECT_EQ(paused.status, 200) << paused.head;
+  EXPECT_GE(paused.body["resume_time"].asInt64(), before + 7200);
+  EXPECT_LE(paused.body["resume_time"].asInt64(), time(nullptr) + 7200);
+  WriteText(stack->In() + "/new.txt", "the ferry");
+  EXPECT_TRUE(Stack::Await([&] {
+    return web_.Get("/api/folders")["folder"][0]["additional"]["status"]["text"] == "paused";
+  }));
+  EXPECT_FALSE(stack->IsFound("ferry"));
+
+  const Reply resumed = web_.Ask("POST /api/resume", web_.Key() + "Content-Length: 0\r\n");
+  EXPECT_EQ(resumed.body["resume_time"].asInt(), -1);
+  EXPECT_TRUE(Stack::Await([&] { return stack->IsFound("ferry"); })) << stack->Logs();
+  EXPECT_EQ(web_.Ask("POST /api/pause", web_.Key()).body["resume_time"].asInt(), 0);
+  EXPECT_EQ(web_.Ask("POST /api/resume", web_.Key()).body["resume_time"].asInt(), -1);
+}
+
+TEST_F(WebTest, IsThereForOthersWhileClientsStall) {
+  const auto begin = Stack::Clock::now();
+  std::vector<std::unique_ptr<Client>> stalled;
+  stalled.reserve(200);
+  for (int i = 0; i < 200; ++i) {
+    stalled.push_back(std::make_unique<Client>(web_.Port()));
+    stalled.back()->Send(i % 2 == 0 ? "" : "GET /api/status HTTP/1.1\r\nX-Slow: ");
+  }
+  EXPECT_EQ(web_.Get("/api/search?words=harbour")["total"].asInt(), kFiles);
+  EXPECT_LT(Stack::Clock::now() - begin, std::chrono::seconds(10));
+  EXPECT_EQ(web_.End(SIGINT), 0);
+}
+
+TEST_F(WebTest, AnswersWhatItCanWhileTheEngineHangs) {
+  stack->Signal("kavoelasticd", SIGSTOP);
+  std::vector<std::unique_ptr<Client>> searches;
+  searches.reserve(10);
+  for (int i = 0; i < 10; ++i) {  // As many as two threads and the queue for them take.
+    searches.push_back(std::make_unique<Client>(web_.Port()));
+    searches.back()->Send("GET /api/search?words=harbour HTTP/1.1\r\n" + web_.Host() + web_.Key() +
+                          "\r\n");
+  }
+  EXPECT_TRUE(Stack::Await(
+      [&] { return web_.Ask("GET /api/search?words=harbour", web_.Key()).status == 503; }));
+  EXPECT_EQ(web_.Get("/api/folders")["total"].asInt(), 1);
+  for (const Json::Value& daemon : web_.Get("/api/status")["daemons"]) {
+    EXPECT_EQ(daemon["running"].asBool(), daemon["name"] != "kavoelasticd")
+        << daemon["name"].asString();
+  }
+  stack->Signal("kavoelasticd", SIGCONT);
+  const auto found = std::count_if(searches.begin(), searches.end(), [](const auto& search) {
+    return search->Receive().find("\"total\":45") != std::string::npos;
+  });
+  EXPECT_GE(found, 8) << "searches that have waited";
+
+  stack->Signal("kavoelasticd", SIGSTOP);
+  const Client search(web_.Port());
+  search.Send("GET /api/search?words=harbour HTTP/1.1\r\n" + web_.Host() + web_.Key() + "\r\n");
+  web_.Get("/api/folders");
+  const auto begin = Stack::Clock::now();
+  EXPECT_EQ(web_.End(SIGINT), 0);
+  EXPECT_LT(Stack::Clock::now() - begin, std::chrono::seconds(20));
+  stack->Signal("kavoelasticd", SIGCONT);
+}
+
+TEST_F(WebTest, ListensOnThisMachineOnly) {
+  const std::string taken = "127.0.0.1:" + std::to_string(web_.Port());
+  const std::tuple<std::string, int, std::string> cases[] = {
+      {"0.0.0.0:0", 2, "can be reached from other machines"},
+      {"[::]:0", 2, "ssh -L"},
+      {"192.168.1.1:80", 2, "can be reached from other machines"},
+      {"[::ffff:127.0.0.1]:0", 2, "can be reached"},
+      {"example.com:80", 2, "is no address"},
+      {"127.0.0.1", 2, "is no address"},
+      {"127.0.0.1:", 2, "is no address"},
+      {"127.0.0.1:65536", 2, "is no address"},
+      {taken, 3, "another program listens on " + taken},
+  };
+  for (const auto& [place, status, message] : cases) {
+    Program program("true", FILEINDEX_PROGRAM " web --listen '" + place + "' 2>&1");
+    EXPECT_EQ(program.End(), status) << place;
+    EXPECT_NE(program.text.find(message), std::string::npos) << program.text;
+  }
+}
+
+TEST_F(WebTest, WorksInABrowser) {
+  if (system("command -v python3 chromium >/dev/null") != 0) {  // NOLINT(concurrency-mt-unsafe)
+    GTEST_SKIP() << "without the programs python3 and chromium the page itself is not tested";
+  }
+  Program script("true",
+                 "python3 " WEB_PAGE_SCRIPT " '" + web_.Url() + "' '" + stack->In() + "' 2>&1");
+  EXPECT_EQ(script.End(), 0) << script.text;
+  EXPECT_EQ(web_.Get("/api/status")["resume_time"].asInt(), -1);
+}
+
+}  // namespace

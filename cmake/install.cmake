@@ -46,6 +46,12 @@ foreach(program evnotifyd fileindex_cli fileindexd kavocontentextractd kavoelast
   endif()
 endforeach()
 
+if(fileindex_is_local)
+  file(GLOB fileindex_units CONFIGURE_DEPENDS ${PROJECT_SOURCE_DIR}/packaging/systemd/*)
+  install(FILES ${fileindex_units} DESTINATION lib/systemd/system)
+  install(FILES ${PROJECT_SOURCE_DIR}/packaging/sysusers.d/fileindex.conf DESTINATION lib/sysusers.d)
+endif()
+
 install(TARGETS ${fileindex_libraries} EXPORT fileindexTargets
   LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
 install(EXPORT fileindexTargets NAMESPACE fileindex:: DESTINATION ${fileindex_package})

@@ -89,6 +89,7 @@ class Stack {
     const auto pid = static_cast<id_t>(programs_.at(name)->pid);
     return waitid(P_PID, pid, &info, WEXITED | WNOHANG | WNOWAIT) == 0 && info.si_pid != 0;
   }
+  pid_t Pid(const std::string& name) const { return programs_.at(name)->pid; }
   void Signal(const std::string& name, int signal) { kill(programs_.at(name)->pid, signal); }
   // The exit status, or 128 and the signal.
   int End(const std::string& name, int signal) {

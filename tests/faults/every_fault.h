@@ -73,14 +73,47 @@ struct FaultyWork {
   std::function<void(bool done, bool lasts)> judge;
 };
 
+// Bits of a child's exit status.
+inline constexpr int kFailed = 1;
+inline constexpr int kNotReached = 2;
+
+// The part of RunWithEveryFault() in the process of its own, which ends here.
+[[noreturn]] inline void RunInChild(const FaultyWork& work, const FailNth& order, bool is_harmless,
+                                    unsigned seconds) {
+  alarm(seconds);
+  const int before = CountFailures();
+  const size_t descriptors = OpenDescriptors();
+  bool done = false;
+  std::string reason;
+  Arm(order);
+  try {
+    done = work.run();
+  } catch (const std::exception& error) {
+    Disarm();
+    reason = error.what();
+  }
+  const char* const failed = Disarm();
+  SCOPED_TRACE(std::string(failed == nullptr ? "nothing" : failed) + " failed; " +
+               (done ? "done" : "not done: " + reason));
+  EXPECT_TRUE(done || (failed != nullptr && !is_harmless));
+  work.judge(done, order.lasting);
+  EXPECT_EQ(OpenDescriptors(), descriptors);
+  try {
+    EXPECT_TRUE(work.run());
+    work.judge(/*done=*/true, order.lasting);
+  } catch (const std::exception& error) {
+    ADD_FAILURE() << "when the fault is gone: " << error.what();
+  }
+  fflush(stdout);
+  _exit((CountFailures() > before ? kFailed : 0) | (failed == nullptr ? kNotReached : 0));
+}
+
 // For every kind, once and lasting, and every N: in a process of its own, runs the work with the
 // Nth call failing, judges, finds that no descriptor stays open, and that the work can be done in
 // the same process once the fault is gone. A process that takes `seconds` is killed and a failure.
 // Returns how many faults there were.
 inline unsigned RunWithEveryFault(const FaultyWork& work, unsigned usual_step = 1,
                                   unsigned seconds = 60) {
-  constexpr int kFailed = 1;  // Bits of the exit status.
-  constexpr int kNotReached = 2;
   constexpr int kEnoughFailures = 5;
   std::minstd_rand random(FaultsFromEnvironment("FAULTS_SEED", 1));
   unsigned faults = 0;
@@ -98,32 +131,7 @@ inline unsigned RunWithEveryFault(const FaultyWork& work, unsigned usual_step = 
         fflush(stdout);
         const pid_t child = fork();
         if (child == 0) {
-          alarm(seconds);
-          const int before = CountFailures();
-          const size_t descriptors = OpenDescriptors();
-          bool done = false;
-          std::string reason;
-          Arm({kind.calls, kind.error, at, lasts != 0});
-          try {
-            done = work.run();
-          } catch (const std::exception& error) {
-            Disarm();
-            reason = error.what();
-          }
-          const char* const failed = Disarm();
-          SCOPED_TRACE(std::string(failed == nullptr ? "nothing" : failed) + " failed; " +
-                       (done ? "done" : "not done: " + reason));
-          EXPECT_TRUE(done || (failed != nullptr && !kind.is_harmless));
-          work.judge(done, lasts != 0);
-          EXPECT_EQ(OpenDescriptors(), descriptors);
-          try {
-            EXPECT_TRUE(work.run());
-            work.judge(/*done=*/true, lasts != 0);
-          } catch (const std::exception& error) {
-            ADD_FAILURE() << "when the fault is gone: " << error.what();
-          }
-          fflush(stdout);
-          _exit((CountFailures() > before ? kFailed : 0) | (failed == nullptr ? kNotReached : 0));
+          RunInChild(work, {kind.calls, kind.error, at, lasts != 0}, kind.is_harmless, seconds);
         }
         int status = -1;
         waitpid(child, &status, 0);

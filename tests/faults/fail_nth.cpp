@@ -118,7 +118,6 @@ const char* Disarm() {
 // NOLINTBEGIN(bugprone-macro-parentheses): these are types.
 #define REAL(result, name, parameters) \
   static const auto real = reinterpret_cast<result(*) parameters>(dlsym(RTLD_NEXT, #name))
-// NOLINTEND(bugprone-macro-parentheses)
 
 // A function that fails as `called` with the value `failure`.
 #define FALLIBLE(result, failure, called, name, parameters, arguments) \
@@ -151,6 +150,7 @@ const char* Disarm() {
 #define NOTHING
 #define FOLDER int folder,
 #define FOLDER_ARGUMENT folder,
+// NOLINTEND(bugprone-macro-parentheses)
 OPEN("open", open, NOTHING, NOTHING)
 OPEN("open", open64, NOTHING, NOTHING)
 OPEN("open", openat, FOLDER, FOLDER_ARGUMENT)
@@ -211,7 +211,7 @@ FALLIBLE(int, -1, "poll", epoll_wait, (int fd, epoll_event* events, int count, i
          (fd, events, count, timeout))
 
 // dlsym() itself takes memory, so these go by the C library's other names.
-// NOLINTBEGIN(bugprone-reserved-identifier)
+// NOLINTBEGIN(bugprone-reserved-identifier,readability-identifier-naming)
 extern "C" {
 void* __libc_malloc(size_t size);
 void* __libc_calloc(size_t count, size_t size);
@@ -282,4 +282,4 @@ EXPORTED int __libc_start_main(Main main, int argc, char** argv, void (*init)(),
 // Thousands of errors are no matter for the system's log.
 EXPORTED void syslog(int /*priority*/, const char* /*format*/, ...) {}
 #endif
-// NOLINTEND(bugprone-reserved-identifier)
+// NOLINTEND(bugprone-reserved-identifier,readability-identifier-naming)

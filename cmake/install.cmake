@@ -46,6 +46,12 @@ foreach(program evnotifyd fileindex_cli fileindexd kavocontentextractd kavoelast
   endif()
 endforeach()
 
+if(fileindex_is_local)
+  file(GLOB fileindex_units CONFIGURE_DEPENDS ${PROJECT_SOURCE_DIR}/packaging/systemd/*)
+  install(FILES ${fileindex_units} DESTINATION lib/systemd/system)
+  install(FILES ${PROJECT_SOURCE_DIR}/packaging/sysusers.d/fileindex.conf DESTINATION lib/sysusers.d)
+endif()
+
 install(TARGETS ${fileindex_libraries} EXPORT fileindexTargets
   LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
 install(EXPORT fileindexTargets NAMESPACE fileindex:: DESTINATION ${fileindex_package})
@@ -64,6 +70,11 @@ install(FILES ${PROJECT_BINARY_DIR}/fileindex.pc DESTINATION ${CMAKE_INSTALL_LIB
 
 install(FILES ${PROJECT_SOURCE_DIR}/README.md ${PROJECT_SOURCE_DIR}/LICENSE
   DESTINATION ${CMAKE_INSTALL_DOCDIR})
+
+if(fileindex_is_local)
+  install(FILES ${PROJECT_SOURCE_DIR}/packaging/sysctl.d/30-fileindex.conf DESTINATION lib/sysctl.d)
+  install(FILES ${PROJECT_SOURCE_DIR}/packaging/tmpfiles.d/fileindex.conf DESTINATION lib/tmpfiles.d)
+endif()
 
 if(TARGET fileindex_manual)
   include(cmake/manual.cmake)

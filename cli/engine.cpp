@@ -2,13 +2,22 @@
 
 #include <unistd.h>
 
+#include <cerrno>
+#include <string>
+
 #include "cli/shares.h"
 #include "cli/text.h"
+#include "common/json.h"
 #include "fileindex/comm.h"
 #include "fileindex/paths.h"
+#include "kavo/sock_connection.h"
 
 namespace vexlo::cli {
 namespace {
+
+// Where anybody may search.
+constexpr fileindex::FixedPath kSearchSocket("/var/run/kavoelasticd.search.sock");
+constexpr int kConnectSeconds = 10;
 
 [[noreturn]] void FailWithoutEngine() {
   throw Failure("the search engine kavoelasticd does not run (nobody answers on '" +
@@ -50,6 +59,27 @@ void WithEngine(const std::function<void()>& work) {
     ExplainEngineError(error);
     throw;
   }
+}
+
+Json::Value AskSearch(const Json::Value& request, Json::Value* reply) {
+  if (access(fileindex::kElasticdSocketPath.Get().c_str(), W_OK) == 0 || errno != EACCES) {
+    return AskEngine(request, reply);
+  }
+  const std::string path = kSearchSocket.Get();
+  if (access(path.c_str(), W_OK) != 0 && errno == EACCES) {
+    throw Failure("only the user who runs the search engine can search: it is not root's");
+  }
+  kavodaemon::DomainSockConnection connection(path);
+  std::string text;
+  if (!connection.Connect(kConnectSeconds) || !connection.Send(JsonToString(request)) ||
+      !connection.Recv(text) || !JsonFromString(*reply, text) || !reply->isObject()) {
+    throw Failure("the search engine kavoelasticd gives no answer on '" + path + "'");
+  }
+  if ((*reply)["success"] != true) {
+    throw Failure("the search engine says: " + ForTerminal((*reply)["error"]["msg"].asString()) +
+                  " (error " + std::to_string((*reply)["error"]["code"].asInt()) + ")");
+  }
+  return (*reply)["data"];
 }
 
 Json::Value AskEngine(const Json::Value& request, Json::Value* reply) {

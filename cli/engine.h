@@ -22,6 +22,10 @@ void WithEngine(const std::function<void()>& work);
 // any other.
 void ExplainEngineError(const Error& error);
 
+// The same for a search, which anybody may ask: who may not ask the engine everything gets what he
+// may read.
+Json::Value AskSearch(const Json::Value& request, Json::Value* reply);
+
 // Sends one request within WithEngine(). The reply's "data".
 Json::Value AskEngine(const Json::Value& request, Json::Value* reply = nullptr);
 

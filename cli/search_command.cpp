@@ -52,7 +52,7 @@ ExitStatus RunSearch(const Arguments& arguments, const Console& console) {
   Json::Value request = MakeSearchRequest(arguments);
   request["data"]["snippet"] = console.out_is_terminal || arguments.Has("--json");
   Json::Value reply;
-  const Json::Value hits = AskEngine(request, &reply);
+  const Json::Value hits = AskSearch(request, &reply);
   for (const Json::Value& hit : hits) {
     PrintHit(arguments, console, hit);
   }
@@ -63,7 +63,8 @@ ExitStatus RunSearch(const Arguments& arguments, const Console& console) {
   }
   if (console.err_is_terminal || hits.empty()) {
     const uint64_t total = reply["total"].asUInt64();
-    console.err << Counted(total, "file") << " found";
+    console.err << (reply["total_is_least"] == true ? "at least " : "") << Counted(total, "file")
+                << " found";
     if (total > hits.size()) {
       console.err << ", the first " << Grouped(hits.size()) << " shown";
     }

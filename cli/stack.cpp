@@ -123,7 +123,10 @@ void Stack::Stop() {
 void Stack::Spawn(Child& child) {
   const std::string log = LogFile(child);
   std::error_code error;
-  std::filesystem::create_directories(std::filesystem::path(log).parent_path(), error);
+  const std::filesystem::path folder = std::filesystem::path(log).parent_path();
+  std::filesystem::create_directories(folder, error);
+  // The lines name files that others may not see.
+  std::filesystem::permissions(folder, std::filesystem::perms::owner_all, error);
   const std::string program = ProgramFolder() + "/" + child.place.name;
   const pid_t parent = getpid();
   const pid_t pid = fork();

@@ -87,7 +87,7 @@ Json::Value Search(const HttpRequest& request) {
   search["data"]["snippet"] = true;
   search["data"]["from"] = Json::UInt64{from};
   Json::Value reply;
-  AskEngine(search, &reply);
+  AskSearch(search, &reply);
   return reply;
 }
 

@@ -29,6 +29,8 @@ constexpr size_t kFirstBytes = size_t{16} * 1024;
 // Requests up to here are not charged: of as many as there are connections they are little.
 constexpr size_t kFreeBytes = size_t{64} * 1024;
 constexpr size_t kAdvanceBytes = size_t{64} * 1024;
+// Of a request that will be refused.
+constexpr size_t kStrangerBytes = size_t{64} * 1024;
 constexpr int kReadsATurn = 16;
 constexpr int kAcceptsATurn = 64;
 constexpr int kEventsATurn = 64;
@@ -74,6 +76,27 @@ void RemoveStale(const std::string& path) {
 // What recv() and send() say of a connection that has nothing for now.
 bool IsForNow() { return errno == EAGAIN || errno == EWOULDBLOCK; }
 
+// False when the system does not say.
+bool FindPeer(int fd, Peer& peer) {
+  struct ucred known {};
+  socklen_t length = sizeof(known);
+  if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &known, &length) != 0) {
+    return false;
+  }
+  peer.uid = known.uid;
+  peer.gid = known.gid;
+  length = 0;
+  // Says by ERANGE how much room the groups need.
+  if (getsockopt(fd, SOL_SOCKET, SO_PEERGROUPS, nullptr, &length) == 0) {
+    return true;
+  }
+  peer.groups.resize(length / sizeof(gid_t));
+  return errno == ERANGE &&
+         getsockopt(fd, SOL_SOCKET, SO_PEERGROUPS, peer.groups.data(), &length) == 0;
+}
+
+bool IsOwn(const Peer& peer) { return peer.uid == 0 || peer.uid == geteuid(); }
+
 ssize_t ReceiveSome(int fd, char* buffer, size_t size) {
   ssize_t count = 0;
   do {
@@ -107,6 +130,18 @@ bool SendFrame(int fd, const std::string& body, size_t& sent) {
 
 }  // namespace
 
+std::string RefusalSentence(Refusal refusal, const std::string& server) {
+  switch (refusal) {
+    case Refusal::kTooLong:
+      return "the request is too long";
+    case Refusal::kNotAdmitted:
+      return "only root and the user of " + server + " may ask this";
+    case Refusal::kHandlerFailed:
+      break;
+  }
+  return "the request made " + server + " fail";
+}
+
 enum class FrameServer::Received {
   kPart,
   kWhole,
@@ -126,6 +161,9 @@ struct FrameServer::Connection {
   };
 
   UniqueFd fd;
+  Peer peer;
+  bool admitted = false;
+  bool has_place = false;  // Counted in places_.
   State state = State::kReceiving;
   uint32_t watched = 0;  // The events that epoll waits for; 0 when it is not in epoll.
   Clock::time_point deadline;
@@ -173,8 +211,8 @@ FrameServer::FrameServer(FrameServerOptions options)
       scratch_(kScratchBytes),
       next_deadline_(Clock::time_point::max()),
       memory_(options_.max_total_bytes, options_.max_request_bytes) {
-  VEXLO_CHECK((!options_.handler && !options_.file_handler) || options_.workers == 0 ||
-                  options_.max_connections == 0 ||
+  VEXLO_CHECK((!options_.handler && !options_.file_handler && !options_.peer_handler) ||
+                  options_.workers == 0 || options_.max_connections == 0 ||
                   options_.max_total_bytes / 2 < options_.max_request_bytes,
               ERR_BAD_PARAMETER, "a server's options make no sense, path=" + options_.socket_path);
   epoll_ = UniqueFd(epoll_create1(EPOLL_CLOEXEC));
@@ -310,18 +348,46 @@ void FrameServer::Accept() {
       }
       return;
     }
-    {
-      const std::lock_guard<std::mutex> lock(mutex_);
-      ++open_;
-    }
-    const int number = fd.Get();
-    auto connection = std::make_unique<Connection>();
-    connection->fd = std::move(fd);
-    Connection& added = *connection;
-    connections_[number] = std::move(connection);
-    SetDeadline(added, now_ + options_.idle_timeout);
-    Read(added);  // Mostly the request is there already.
+    Admit(std::move(fd));
     UpdateAccepting();
+  }
+}
+
+void FrameServer::Admit(UniqueFd fd) {
+  auto connection = std::make_unique<Connection>();
+  if (!FindPeer(fd.Get(), connection->peer) || !TakePlace(*connection)) {
+    return;
+  }
+  connection->admitted =
+      IsOwn(connection->peer) || (options_.admits && options_.admits(connection->peer));
+  const int number = fd.Get();
+  connection->fd = std::move(fd);
+  Connection& added = *connection;
+  connections_[number] = std::move(connection);
+  SetDeadline(added, now_ + options_.idle_timeout);
+  Read(added);  // Mostly the request is there already.
+}
+
+// False when its user has as many connections as one may have.
+bool FrameServer::TakePlace(Connection& connection) {
+  const std::lock_guard<std::mutex> lock(mutex_);
+  if (!IsOwn(connection.peer)) {
+    size_t& places = places_[connection.peer.uid];
+    if (places >= options_.max_connections_per_user) {
+      return false;
+    }
+    ++places;
+    connection.has_place = true;
+  }
+  ++open_;
+  return true;
+}
+
+// Called with the lock.
+void FrameServer::GiveUpPlace(const Connection& connection) {
+  --open_;
+  if (connection.has_place && --places_[connection.peer.uid] == 0) {
+    places_.erase(connection.peer.uid);
   }
 }
 
@@ -408,7 +474,7 @@ FrameServer::Received FrameServer::ReceiveHeader(Connection& connection) {
   }
   memcpy(&connection.length, connection.header, kHeaderBytes);
   size -= of_header;
-  if (connection.length > options_.max_request_bytes) {
+  if (connection.length > (connection.admitted ? options_.max_request_bytes : kStrangerBytes)) {
     connection.length -= std::min<uint64_t>(size, connection.length);
     return Received::kTooLong;
   }
@@ -451,7 +517,8 @@ bool FrameServer::Grow(Connection& connection) {
 }
 
 void FrameServer::Refuse(Connection& connection) {
-  const std::string reply = options_.refusal ? options_.refusal(Refusal::kTooLong) : "";
+  const Refusal reason = connection.admitted ? Refusal::kTooLong : Refusal::kNotAdmitted;
+  const std::string reply = options_.refusal ? options_.refusal(reason) : "";
   size_t sent = 0;
   // A fresh socket takes a text of this kind whole.
   if (reply.empty() || !SendFrame(connection.fd.Get(), reply, sent) || connection.length == 0) {
@@ -531,7 +598,7 @@ void FrameServer::Close(Connection& connection) {
   const std::lock_guard<std::mutex> lock(mutex_);
   memory_.GiveBack(connection.share);
   unsent_bytes_ -= connection.reply.size();
-  --open_;
+  GiveUpPlace(*node.mapped());
 }
 
 // Puts the deadline off for every so many bytes: a byte now and then would hold a connection for
@@ -668,27 +735,27 @@ void FrameServer::Work() {
     lock.unlock();
 
     RequestMemory::Share share = std::exchange(connection->share, {});
-    std::optional<std::string> reply =
-        Answer(std::move(connection->request), std::move(connection->file));
+    std::optional<std::string> reply = Answer(*connection);
     size_t unsent = 0;
+    bool is_done = false;
     if (reply && SendFrame(connection->fd.Get(), *reply, connection->sent) &&
         connection->sent < kHeaderBytes + reply->size()) {
       unsent = reply->size();
       connection->reply = *std::move(reply);
     } else {
-      connection.reset();
+      is_done = true;
+      connection->fd.Reset();
     }
 
     lock.lock();
     --busy_;
     memory_.GiveBack(share);
-    if (connection != nullptr && unsent_bytes_ + unsent <= options_.max_total_bytes) {
+    if (!is_done && unsent_bytes_ + unsent <= options_.max_total_bytes) {
       unsent_bytes_ += unsent;
       returned_.push_back(std::move(connection));
       Wake();
     } else {
-      connection.reset();
-      --open_;
+      GiveUpPlace(*connection);
       if (wake_wanted_) {
         Wake();
       }
@@ -696,17 +763,28 @@ void FrameServer::Work() {
   }
 }
 
+std::string FrameServer::Handle(const std::string& request, Connection& connection) {
+  if (options_.file_handler) {
+    return options_.file_handler(request, std::move(connection.file));
+  }
+  return options_.peer_handler ? options_.peer_handler(request, connection.peer)
+                               : options_.handler(request);
+}
+
 // The request goes with the handler's call, before the reply is sent.
-std::optional<std::string> FrameServer::Answer(std::string request, UniqueFd file) {
+std::optional<std::string> FrameServer::Answer(Connection& connection) {
+  const Refusal reason = connection.admitted ? Refusal::kHandlerFailed : Refusal::kNotAdmitted;
+  const std::string request = std::move(connection.request);
   try {
-    return options_.file_handler ? options_.file_handler(request, std::move(file))
-                                 : options_.handler(request);
+    if (connection.admitted) {
+      return Handle(request, connection);
+    }
   } catch (const std::exception& error) {
     LogLine(VEXLO_SOURCE, __LINE__, std::string("the handler failed, reason=") + error.what());
   } catch (...) {
     LogLine(VEXLO_SOURCE, __LINE__, "the handler failed");
   }
-  std::string refusal = options_.refusal ? options_.refusal(Refusal::kHandlerFailed) : "";
+  std::string refusal = options_.refusal ? options_.refusal(reason) : "";
   return refusal.empty() ? std::nullopt : std::optional(std::move(refusal));
 }
 

@@ -27,17 +27,36 @@ namespace vexlo::daemon {
 enum class Refusal {
   kTooLong,        // Over max_request_bytes; nothing of it was kept.
   kHandlerFailed,  // The handler threw. Logged.
+  kNotAdmitted,    // The client's user may not ask anything.
+};
+
+// What is said of it to people, about "the engine" or another `server`.
+std::string RefusalSentence(Refusal refusal, const std::string& server);
+
+// Whose process a client is, as the kernel knew it when it connected.
+struct Peer {
+  uid_t uid = 0;
+  gid_t gid = 0;
+  std::vector<gid_t> groups;  // Further ones.
 };
 
 struct FrameServerOptions {
   std::string socket_path;  // Up to 107 bytes.
   mode_t mode = 0600;       // Of the socket.
 
+  // Root and the user that the server runs as may ask everything. So may whom this admits; unset,
+  // nobody else, whatever way they got at the socket. Called on the thread in Run().
+  std::function<bool(const Peer& peer)> admits;
+  // Connections of each user who is neither; further ones are closed.
+  size_t max_connections_per_user = 16;
+
   // Called on several threads at once, as many as there are workers.
   std::function<std::string(const std::string& request)> handler;
   // Instead of `handler`: gets also the descriptor that came with the first byte of the request, if
   // one did (SCM_RIGHTS; of several the first). Without this a descriptor that is sent is closed.
   std::function<std::string(const std::string& request, UniqueFd file)> file_handler;
+  // Instead of `handler`: gets also who asks.
+  std::function<std::string(const std::string& request, const Peer& peer)> peer_handler;
   // The reply to a request that is refused; when unset, or when it returns "", the connection is
   // closed without one.
   std::function<std::string(Refusal)> refusal;
@@ -130,6 +149,9 @@ class FrameServer {
   // The loop.
   void Handle(int fd, uint32_t events);
   void Accept();
+  void Admit(UniqueFd fd);
+  bool TakePlace(Connection& connection);
+  void GiveUpPlace(const Connection& connection);
   void UpdateAccepting();
   void Read(Connection& connection);
   Received Receive(Connection& connection);
@@ -155,7 +177,8 @@ class FrameServer {
 
   // The workers.
   void Work();
-  std::optional<std::string> Answer(std::string request, UniqueFd file);
+  std::optional<std::string> Answer(Connection& connection);
+  std::string Handle(const std::string& request, Connection& connection);
   void Wake();
 
   const FrameServerOptions options_;
@@ -182,9 +205,10 @@ class FrameServer {
   std::deque<std::unique_ptr<Connection>> jobs_;
   std::vector<std::unique_ptr<Connection>> returned_;
   RequestMemory memory_;
-  size_t unsent_bytes_ = 0;  // Of replies in returned_ and connections_.
-  size_t open_ = 0;          // Connections, whoever owns them.
-  size_t busy_ = 0;          // Workers in the handler or at its reply.
+  size_t unsent_bytes_ = 0;                   // Of replies in returned_ and connections_.
+  size_t open_ = 0;                           // Connections, whoever owns them.
+  std::unordered_map<uid_t, size_t> places_;  // Of them those of other users.
+  size_t busy_ = 0;                           // Workers in the handler or at its reply.
   bool wake_wanted_ = false;
   bool ending_ = false;
 

@@ -1,6 +1,7 @@
 #include "daemons/common/run_daemon.h"
 
 #include <fcntl.h>
+#include <linux/capability.h>
 #include <poll.h>
 #include <sys/eventfd.h>
 #include <sys/file.h>
@@ -13,6 +14,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <climits>
 #include <csignal>
 #include <cstddef>
 #include <cstdint>
@@ -20,9 +22,13 @@
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <iterator>
 #include <stdexcept>
 #include <system_error>
 #include <thread>
+
+#include "daemons/common/sandbox.h"
+#include "kavo/local/shares.h"
 
 namespace vexlo::daemon {
 namespace {
@@ -112,6 +118,16 @@ void Notify(const std::string& state) {
   }
 }
 
+// Half of what the service manager lets pass without a sign of life; -1 where it wants none.
+int WatchdogMilliseconds() {
+  // NOLINTNEXTLINE(concurrency-mt-unsafe): nobody sets the environment.
+  const char* const microseconds = getenv("WATCHDOG_USEC");
+  const char* const pid = getenv("WATCHDOG_PID");  // NOLINT(concurrency-mt-unsafe)
+  const bool is_meant = pid == nullptr || pid == std::to_string(getpid());
+  const long long count = microseconds == nullptr || !is_meant ? 0 : atoll(microseconds);
+  return count <= 0 ? -1 : static_cast<int>(std::clamp<long long>(count / 2000, 1, INT_MAX));
+}
+
 // Takes the signals out of every thread's way, and waits for them on one of its own.
 class SignalThread {
  public:
@@ -141,13 +157,16 @@ class SignalThread {
 
  private:
   void Wait() {
+    const int pause = WatchdogMilliseconds();
     struct pollfd fds[] = {{signal_fd_.Get(), POLLIN, 0}, {quit_.Get(), POLLIN, 0}};
     while (fds[1].revents == 0) {
       struct signalfd_siginfo info {};
       while (read(signal_fd_.Get(), &info, sizeof(info)) == static_cast<ssize_t>(sizeof(info))) {
         Take(static_cast<int>(info.ssi_signo));
       }
-      poll(fds, 2, -1);
+      if (poll(fds, 2, pause) == 0) {
+        Notify("WATCHDOG=1");
+      }
     }
   }
 
@@ -190,6 +209,71 @@ bool IsJournal(int fd) {
   struct stat there {};
   return stream != nullptr && fstat(fd, &there) == 0 &&
          std::to_string(there.st_dev) + ":" + std::to_string(there.st_ino) == stream;
+}
+
+// With what is below them.
+constexpr const char* kWrittenFolders[] = {"/tmp", "/var/lib/kavo", "/var/packages/Vexlo/etc",
+                                           "/var/run"};
+constexpr char kStateFolder[] = "/var/lib/kavo";
+// The folders below the root that daemons write to.
+constexpr const char* kStateFolders[] = {
+    "/tmp",
+    "/var/lib/kavo",
+    "/var/lib/kavo/elastic",
+    "/var/lib/kavo/evnotify",
+    "/var/lib/kavo/extract",
+    "/var/lib/kavo/fileindex",
+    "/var/lib/kavo/fileindex/db",
+    "/var/lib/kavo/fileindex/queue",
+    "/var/lib/kavo/fileindexd",
+    "/var/packages/Vexlo/etc",
+    "/var/run",
+};
+
+// Whether root can write there by owning it. A root folder of an ordinary user's is another matter.
+bool OwnsStateFolders() {
+  return std::all_of(std::begin(kStateFolders), std::end(kStateFolders), [](const char* folder) {
+    struct stat info {};
+    return stat((kavo::local::Root() + folder).c_str(), &info) != 0 || info.st_uid == geteuid();
+  });
+}
+
+// What is in there tells of everybody's files. The sockets, which others may see, are not.
+void CloseStateFolder() {
+  const std::string folder = kavo::local::Root() + kStateFolder;
+  std::error_code ignored;
+  std::filesystem::create_directories(folder, ignored);
+  struct stat info {};
+  if (stat(folder.c_str(), &info) == 0 && info.st_uid == geteuid() && (info.st_mode & 077U) != 0 &&
+      chmod(folder.c_str(), info.st_mode & 07700U) == 0) {
+    syslog(LOG_NOTICE, "closed to other users: %s", folder.c_str());
+  }
+}
+
+bool KeepToState() {
+  std::vector<std::string> folders;
+  folders.reserve(std::size(kWrittenFolders) + 1);
+  for (const char* const folder : kWrittenFolders) {
+    folders.push_back(kavo::local::Root() + folder);
+    std::error_code ignored;
+    std::filesystem::create_directories(folders.back(), ignored);
+  }
+  folders.emplace_back("/dev/null");  // What programs are started with.
+  return ForbidWriting(folders) != PathRule::kFailed;
+}
+
+void GiveUpRights(const DaemonOptions& options) {
+  std::vector<int> capabilities = options.capabilities;
+  if (geteuid() == 0 && !OwnsStateFolders()) {
+    syslog(LOG_NOTICE,
+           "the folders below '%s' are another user's: the right to write to any file is kept",
+           kavo::local::Root().c_str());
+    capabilities.push_back(CAP_DAC_OVERRIDE);
+  }
+  if (!KeepCapabilities(capabilities) || (kCanBeConfined && !ForbidAdministration()) ||
+      (kCanBeConfined && options.keeps_to_state && !KeepToState())) {
+    Throw("rights cannot be given up");
+  }
 }
 
 void OpenLog(const DaemonOptions& options) {
@@ -237,6 +321,11 @@ int RunDaemon(const DaemonOptions& options, int argc, char** argv,
     }
     AllowManyFiles();
     const PidFile pid_file(options.pid_file);
+    CloseStateFolder();
+    if (options.prepare) {
+      options.prepare();
+    }
+    GiveUpRights(options);
     Daemon daemon(options);
     const SignalThread signals(options, daemon.StopFd());
     work(daemon);

@@ -23,6 +23,15 @@ struct DaemonOptions {
   std::string pid_file;  // Its folder is made when it is missing.
   // Shown behind the name by --help, and by a command line that `arguments` refuses.
   std::string usage;
+  // Of a superuser's capabilities those (CAP_...) that the work needs; it keeps no others. Files of
+  // its own it needs none for.
+  std::vector<int> capabilities;
+  // Whether it writes below the root's folders of state alone, and so can be kept from writing
+  // elsewhere.
+  bool keeps_to_state = true;
+  // Called while there is one thread and nothing has been given up: for a process of the daemon's
+  // that needs other rights. May be unset.
+  std::function<void()> prepare;
   // Takes the command line, less the program's name and --help; false for one that is wrong. A path
   // among it must be made absolute here, as the work runs in "/". Unset, no argument is right.
   std::function<bool(const std::vector<std::string>&)> arguments;
@@ -37,7 +46,8 @@ class Daemon {
   // Readable, and stays so, when the work must end; for poll() and epoll, never read from.
   int StopFd() const { return stop_.Get(); }
 
-  // Tells the service manager ($NOTIFY_SOCKET) and the log that clients may come now.
+  // Tells the service manager ($NOTIFY_SOCKET) and the log that clients may come now. The thread
+  // that waits for signals gives the signs of life that the manager wants ($WATCHDOG_USEC).
   void Ready();
 
   // Ends the process without destructors, for work that cannot be brought to an end; with kEnded
@@ -56,6 +66,14 @@ class Daemon {
 // Runs work(daemon) on the calling thread, in the foreground, and returns the exit status. Called
 // once, by main(), before there are other threads: SIGTERM, SIGINT and SIGHUP stay blocked in all
 // of them, and one thread waits for them. SIGPIPE is ignored.
+//
+// Before the work it gives up the capabilities that are not wanted, what ForbidAdministration()
+// has, and where the kernel can do it, to write elsewhere than in its folders. CAP_DAC_OVERRIDE
+// stays, and the log says so, where a superuser runs it on folders of state that are another
+// user's.
+//
+// The folder of all daemons' state, "/var/lib/kavo" below the root, is made when it is missing, and
+// closed to other users.
 //
 // While it runs it holds an flock on the pid file; where another process does, it says so and
 // returns kAlreadyRunning. So whatever belongs to a daemon of this name (its socket, its files) is

@@ -1,5 +1,7 @@
 #include "daemons/evnotifyd/options.h"
 
+#include <linux/capability.h>
+
 #include <charconv>
 #include <cstdint>
 #include <optional>
@@ -45,6 +47,9 @@ bool ReadArguments(const std::vector<std::string>& arguments, FeederOptions& opt
 daemon::DaemonOptions EvnotifydOptions(FeederOptions& options) {
   daemon::DaemonOptions daemon;
   daemon.name = "evnotifyd";
+  daemon.keeps_to_state = false;  // Whoever registers a queue says where it lies.
+  // The latter for fanotify, where a share has more folders than inotify takes.
+  daemon.capabilities = {CAP_DAC_READ_SEARCH, CAP_SYS_ADMIN};
   daemon.usage =
       "[--rescan SECONDS] [--max-watches N]\n\n"
       "Watches the folders that are registered and appends what happens there to their queues.\n"

@@ -13,11 +13,13 @@
 #include "common/check.h"
 #include "common/json.h"
 #include "common/string.h"
+#include "daemons/common/unique_fd.h"
 #include "fileindex/comm.h"
 #include "fileindex/elastic_control/schema.h"
 #include "fileindex/paths.h"
 #include "kavo/content_extract.h"
 #include "kavo/local/content.h"
+#include "kavo/local/open.h"
 #include "kavo/sock_connection.h"
 
 namespace vexlo::fileindexd {
@@ -73,8 +75,11 @@ std::vector<IndexedPath> Query(const std::string& id, Json::Value query,
   return found;
 }
 
+// False with errno; ENOTDIR, too, where a folder on the way is a link by now, which ParseFile()
+// does not follow: what stood there is gone.
 bool Stat(const std::string& path, struct stat* info) {
-  return fstatat(AT_FDCWD, path.c_str(), info, AT_SYMLINK_NOFOLLOW) == 0;
+  const daemon::UniqueFd file(kavo::local::OpenInShare(path, O_PATH));
+  return file.Get() >= 0 && fstat(file.Get(), info) == 0;
 }
 
 bool Parse(const std::string& path, bool content, Json::Value* fields) {
@@ -233,7 +238,7 @@ bool IsGone(const std::string& path) {
 std::string EngineRun() {
   // Each run makes its socket anew.
   struct stat info {};
-  if (!Stat(fileindex::kElasticdSocketPath.Get(), &info)) {
+  if (lstat(fileindex::kElasticdSocketPath.Get().c_str(), &info) != 0) {
     return "";
   }
   return std::to_string(info.st_ino) + "-" + std::to_string(info.st_ctim.tv_sec) + "." +

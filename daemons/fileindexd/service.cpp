@@ -1,5 +1,7 @@
 #include "daemons/fileindexd/service.h"
 
+#include <linux/capability.h>
+
 #include <charconv>
 #include <cstdio>
 #include <utility>
@@ -257,9 +259,7 @@ void Serve(daemon::Daemon& daemon, const ServiceOptions& options) {
   };
   // A client waits for an answer for ever, also where its connection is closed.
   server_options.refusal = [](daemon::Refusal refusal) {
-    return JsonToString(Refusal(refusal == daemon::Refusal::kTooLong
-                                    ? "the command is too long"
-                                    : "the command made the daemon fail"));
+    return JsonToString(Refusal(RefusalSentence(refusal, "the daemon")));
   };
   server_options.workers = 2;
   server_options.max_request_bytes = kMostCommandBytes;
@@ -276,6 +276,7 @@ void Serve(daemon::Daemon& daemon, const ServiceOptions& options) {
 daemon::DaemonOptions FileindexdOptions(ServiceOptions* options) {
   daemon::DaemonOptions daemon_options;
   daemon_options.name = "fileindexd";
+  daemon_options.capabilities = {CAP_DAC_READ_SEARCH};
   daemon_options.pid_file = kPidFile.Get();
   daemon_options.usage =
       "[--cycle MILLISECONDS]\n\nKeeps the indexes of the shares up to date with what is queued "

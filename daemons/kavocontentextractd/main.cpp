@@ -7,10 +7,15 @@
 
 int main(int argc, char** argv) {
   // How the daemon starts itself; nobody else is told of it.
-  if (argc == 3 && strcmp(argv[1], "--worker") == 0) {
+  if (argc == 5 && strcmp(argv[1], "--worker") == 0) {
     size_t memory = 0;
-    std::from_chars(argv[2], argv[2] + strlen(argv[2]), memory);
-    return vexlo::extractd::RunWorker(memory);
+    vexlo::daemon::Account account;
+    const auto read = [](const char* word, auto& number) {
+      return std::from_chars(word, word + strlen(word), number).ec == std::errc();
+    };
+    return read(argv[2], memory) && read(argv[3], account.uid) && read(argv[4], account.gid)
+               ? vexlo::extractd::RunWorker(memory, account)
+               : vexlo::daemon::kUsage;
   }
   vexlo::extractd::Settings settings;
   return RunDaemon(vexlo::extractd::ExtractdOptions(&settings), argc, argv,

@@ -8,9 +8,11 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstring>
+#include <iterator>
 #include <optional>
 #include <system_error>
 #include <utility>
@@ -26,6 +28,8 @@ using Clock = std::chrono::steady_clock;
 constexpr char kEnding[] = "kavocontentextractd ends";
 // From the end of a worker's socket to that of the worker.
 constexpr int kEndMilliseconds = 500;
+// Of a worker that cannot be confined.
+constexpr size_t kMaxComplaintBytes = 256;
 
 // The C library's errors come as return values here.
 class SpawnSetup {
@@ -101,8 +105,12 @@ class Pool::Worker {
     if (theirs.Get() == kWorkerSocket) {  // A duplicate onto itself would be closed by the exec.
       theirs = daemon::UniqueFd(fcntl(theirs.Get(), F_DUPFD_CLOEXEC, kWorkerSocket + 1));
     }
-    std::string words[] = {"kavocontentextractd", "--worker", std::to_string(options.memory)};
-    char* arguments[] = {words[0].data(), words[1].data(), words[2].data(), nullptr};
+    std::string words[] = {"kavocontentextractd", "--worker", std::to_string(options.memory),
+                           std::to_string(options.account.uid),
+                           std::to_string(options.account.gid)};
+    char* arguments[std::size(words) + 1] = {};
+    std::transform(std::begin(words), std::end(words), arguments,
+                   [](std::string& word) { return word.data(); });
     SpawnSetup setup;
     pid_t pid = -1;
     int error = setup.Prepare(theirs.Get());
@@ -113,10 +121,14 @@ class Pool::Worker {
     }
     theirs.Reset();
     auto worker = std::make_unique<Worker>(std::move(ours), pid);
-    std::string ready;
-    if (!kavo::local::ReceiveFrame(worker->socket_.Get(), 0, ready, nullptr,
+    std::string complaint;
+    if (!kavo::local::ReceiveFrame(worker->socket_.Get(), kMaxComplaintBytes, complaint, nullptr,
                                    Clock::now() + options.start_limit)) {
       text = "a worker does not get ready, reason=" + std::generic_category().message(errno);
+      return nullptr;
+    }
+    if (!complaint.empty()) {
+      text = "a worker cannot be confined, reason=" + complaint;
       return nullptr;
     }
     return worker;

@@ -14,6 +14,7 @@
 #include <string>
 #include <vector>
 
+#include "daemons/common/sandbox.h"
 #include "daemons/common/unique_fd.h"
 
 namespace vexlo::extractd {
@@ -26,16 +27,15 @@ inline constexpr int kOutOfMemory = 3;
 inline constexpr size_t kMaxReplyBytes = size_t{8} << 20;
 
 // What a sanitizer takes of the address space is no fault of the files.
-#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
-inline constexpr size_t kUsualMemory = 0;
-#else
-inline constexpr size_t kUsualMemory = 512;
-#endif
+inline constexpr size_t kUsualMemory = daemon::kCanBeConfined ? 512 : 0;
+// The user "nobody" of every system.
+inline constexpr daemon::Account kNobody = {65534, 65534};
 
 struct PoolOptions {
-  std::string program;                           // Started as "PROGRAM --worker MIB".
+  std::string program;                           // Started as "PROGRAM --worker MIB UID GID".
   size_t workers = 2;                            // At most; started when they are needed.
   size_t memory = kUsualMemory;                  // Address space of each in MiB; 0 for no limit.
+  daemon::Account account = kNobody;             // What workers of a superuser run as.
   std::chrono::milliseconds deadline{10000};     // For one file.
   std::chrono::milliseconds start_limit{10000};  // Until a new worker is ready.
   std::chrono::milliseconds wait_limit{4000};    // For one to come free.

@@ -1,7 +1,9 @@
 #include "daemons/kavocontentextractd/service.h"
 
 #include <fcntl.h>
+#include <linux/capability.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -28,6 +30,8 @@ constexpr size_t kMaxRequestBytes = size_t{256} << 10;
 // A thread each for a file in work, and some more, so that those that wait for a worker are told in
 // time that there is none.
 constexpr size_t kThreads = 32;
+// Whom a superuser's workers become.
+constexpr char kWorkerUser[] = "kavo-extract";
 
 std::string TextOf(const Json::Value& object, const char* member) {
   const Json::Value& value = object[member];
@@ -82,6 +86,17 @@ std::optional<Fault> DeathOf(const Pool::Outcome& outcome, const PoolOptions& op
     return Fault(reason::kCrash, "the worker's reply is no error");
   }
   return std::nullopt;
+}
+
+// One that no other service runs as: nobody's processes may be in other hands already.
+daemon::Account WorkerAccount() {
+  const std::optional<daemon::Account> own = daemon::FindAccount(kWorkerUser);
+  if (!own && geteuid() == 0) {
+    LogLine(VEXLO_SOURCE, __LINE__,
+            std::string("there is no user ") + kWorkerUser +
+                ": files are read as nobody, which other services may run as too");
+  }
+  return own.value_or(kNobody);
 }
 
 }  // namespace
@@ -155,6 +170,7 @@ Json::Value Service::Stats() {
 daemon::DaemonOptions ExtractdOptions(Settings* settings) {
   daemon::DaemonOptions options;
   options.name = "kavocontentextractd";
+  options.capabilities = {CAP_KILL, CAP_SETGID, CAP_SETUID};  // For workers of another user.
   options.pid_file = kavo::local::Root() + "/var/run/kavocontentextractd.pid";
   options.usage =
       "[--deadline SECONDS] [--memory MIB] [--workers N]\n\n"
@@ -194,6 +210,7 @@ void Serve(daemon::Daemon& daemon, const Settings& settings, const std::string& 
   options.program = program;
   options.deadline = std::chrono::seconds(settings.deadline);
   options.memory = settings.memory;
+  options.account = WorkerAccount();
   options.workers = settings.workers > 0
                         ? settings.workers
                         : std::clamp<size_t>(std::thread::hardware_concurrency(), 2, 8);
@@ -208,9 +225,7 @@ void Serve(daemon::Daemon& daemon, const Settings& settings, const std::string& 
   };
   server_options.stopping = [&service] { service.Stop(); };
   server_options.refusal = [](daemon::Refusal refusal) {
-    return Refusal(reason::kUnavailable, refusal == daemon::Refusal::kTooLong
-                                             ? "the request is too long"
-                                             : "the request made the daemon fail");
+    return Refusal(reason::kUnavailable, RefusalSentence(refusal, "the daemon"));
   };
   daemon::FrameServer server(std::move(server_options));
   daemon.Ready();

@@ -15,6 +15,9 @@
 namespace vexlo::elasticd {
 namespace {
 
+// Hits of a page, for those who only search.
+constexpr size_t kMostShown = 10000;
+
 // What a request gives as "data": an empty object where there is none.
 const Json::Value& DataOf(const Json::Value& request) {
   static const Json::Value kNone(Json::objectValue);
@@ -95,8 +98,26 @@ Engine::~Engine() {
 }
 
 Json::Value Engine::Handle(const Json::Value& request) {
+  return Answer([&] { return Dispatch(request); });
+}
+
+Json::Value Engine::HandleSearch(const Json::Value& request, const JudgePaths& judge) {
+  return Answer([&] {
+    if (!request.isObject() || request.isMember("compound") ||
+        RequiredText(request, "command") != "search") {
+      throw Failure(Code::kBadRequest, "only searches are answered here");
+    }
+    const Json::Value& data = DataOf(request);
+    if (PageNumber(data, "from", 0) + PageNumber(data, "size", 0) > kMostShown) {
+      throw Failure(Code::kBadRequest, "the page ends behind the hit number 10000");
+    }
+    return Search(data, judge);
+  });
+}
+
+Json::Value Engine::Answer(const std::function<Json::Value()>& work) {
   try {
-    return Dispatch(request);
+    return work();
   } catch (const Failure& failure) {
     return Refusal(failure.GetCode(), failure.what());
   } catch (const std::exception& error) {
@@ -133,7 +154,7 @@ Json::Value Engine::Dispatch(const Json::Value& request) {
     return Success();
   }
   if (command == "search") {
-    return Search(data);
+    return Search(data, nullptr);
   }
   if (command == "index_list") {
     return WithData(IndexList());
@@ -434,7 +455,7 @@ Json::Value Engine::IndexList() {
   return list;
 }
 
-Json::Value Engine::Search(const Json::Value& data) {
+Json::Value Engine::Search(const Json::Value& data, const JudgePaths& judge) {
   const SearchRequest request = ParseSearch(data);
   std::vector<std::string> ids;
   for (const Json::Value& id : data["ids"]) {
@@ -454,13 +475,15 @@ Json::Value Engine::Search(const Json::Value& data) {
   reply["data"] = Json::arrayValue;
   std::vector<std::pair<SearchHit, const std::string*>> hits;
   size_t total = 0;
+  bool is_least = false;
   const size_t shown_from = ids.size() == 1 ? request.from : 0;
   for (const std::string& id : ids) {
     SearchPage page;
     try {
       WithStore(id, [&](Store& store) {
-        store.ReadCommitted(
-            [&](Session& session) { page = elasticd::Search(session, request, shown_from); });
+        store.ReadCommitted([&](Session& session) {
+          page = elasticd::Search(session, request, shown_from, judge);
+        });
       });
     } catch (const Failure& failure) {
       if (named) {
@@ -471,6 +494,7 @@ Json::Value Engine::Search(const Json::Value& data) {
       skipped["code"] = static_cast<int>(failure.GetCode());
     }
     total += page.total;
+    is_least = is_least || page.is_least;
     for (SearchHit& hit : page.hits) {
       hits.emplace_back(std::move(hit), &id);
     }
@@ -483,6 +507,9 @@ Json::Value Engine::Search(const Json::Value& data) {
     reply["data"].append(std::move(hits[i].first.shown));
   }
   reply["total"] = static_cast<Json::UInt64>(total);
+  if (is_least) {
+    reply["total_is_least"] = true;
+  }
   return reply;
 }
 

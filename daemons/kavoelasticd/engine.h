@@ -16,6 +16,7 @@
 #include <string>
 
 #include "daemons/kavoelasticd/gate.h"
+#include "daemons/kavoelasticd/readable.h"
 #include "daemons/kavoelasticd/registry.h"
 #include "daemons/kavoelasticd/store.h"
 
@@ -44,6 +45,10 @@ class Engine {
   // {"success": false, "error": {"code", "msg"}}.
   Json::Value Handle(const Json::Value& request);
 
+  // The same for somebody who may search and nothing else, and finds what the judge says may be
+  // read: any other command is refused, and so are pages of over 10,000 hits.
+  Json::Value HandleSearch(const Json::Value& request, const JudgePaths& judge);
+
   // Commits what was written longer ago than `idle` to any index, and tidies such indexes up in
   // steps. To be called again and again by whoever runs the engine until it says that nothing is
   // left to do; then once AwaitChange() has returned. Never throws.
@@ -56,6 +61,7 @@ class Engine {
   using SlotPtr = std::shared_ptr<Slot>;
   using StoreUse = std::function<void(Store&)>;
 
+  static Json::Value Answer(const std::function<Json::Value()>& work);
   Json::Value Dispatch(const Json::Value& request);
   Json::Value Compound(const Json::Value& list);
   // Items of one index, all with that id, or any without one. `results` has a place for each.
@@ -68,7 +74,7 @@ class Engine {
   void IndexResume(const Json::Value& data);
   void IndexConfigSet(const Json::Value& data);
   Json::Value IndexList();
-  Json::Value Search(const Json::Value& data);
+  Json::Value Search(const Json::Value& data, const JudgePaths& judge);
 
   // Calls `use` with the open store. Throws kIndexMissing, kIndexPaused, kIndexDamaged, and what
   // `use` throws.

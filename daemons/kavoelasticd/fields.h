@@ -8,6 +8,8 @@ constexpr char kExtensionField[] = "KAVOMDExtension";
 constexpr char kSizeField[] = "KAVOMDFSSize";
 constexpr char kModifiedField[] = "KAVOMDFSContentChangeDate";
 constexpr char kIsDirField[] = "KAVOMDIsDir";
+// What the index daemon knew of the file: {"ctime":NANOSECONDS, ..}.
+constexpr char kStampField[] = "FileIndexStamp";
 
 }  // namespace vexlo::elasticd
 

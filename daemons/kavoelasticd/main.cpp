@@ -1,11 +1,17 @@
+#include <unistd.h>
+
 #include <chrono>
 #include <condition_variable>
 #include <functional>
 #include <mutex>
+#include <optional>
 #include <stop_token>
+#include <string>
 #include <thread>
+#include <vector>
 
 #include "daemons/kavoelasticd/engine.h"
+#include "daemons/kavoelasticd/judge.h"
 #include "daemons/kavoelasticd/request_stats.h"
 #include "daemons/kavoelasticd/server.h"
 #include "kavo/local/shares.h"
@@ -31,14 +37,24 @@ void CommitIdle(const std::stop_token& stop, vexlo::elasticd::Engine& engine) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  return RunDaemon(
-      vexlo::elasticd::ElasticdOptions(), argc, argv, [](vexlo::daemon::Daemon& daemon) {
-        vexlo::elasticd::Engine engine(kavo::local::Root() + "/var/lib/kavo/elastic/indexes.json");
-        const std::jthread committer(CommitIdle, std::ref(engine));
-        vexlo::elasticd::RequestStats stats;
-        vexlo::elasticd::Serve(daemon, [&](const Json::Value& request) {
-          return stats.Answer(request,
-                              [&](const Json::Value& asked) { return engine.Handle(asked); });
-        });
-      });
+  std::optional<vexlo::elasticd::Judge> judge;
+  vexlo::daemon::DaemonOptions options = vexlo::elasticd::ElasticdOptions();
+  options.prepare = [&judge] { judge.emplace(); };
+  return RunDaemon(options, argc, argv, [&judge](vexlo::daemon::Daemon& daemon) {
+    vexlo::elasticd::Engine engine(kavo::local::Root() + "/var/lib/kavo/elastic/indexes.json");
+    const std::jthread committer(CommitIdle, std::ref(engine));
+    const auto search = [&](const Json::Value& request, const vexlo::daemon::Peer& peer) {
+      const bool sees_all = peer.uid == 0 || peer.uid == geteuid();
+      const auto ask = [&](const std::vector<std::string>& paths) {
+        return judge->Ask(peer, paths);
+      };
+      return engine.HandleSearch(
+          request, sees_all ? vexlo::elasticd::JudgePaths() : vexlo::elasticd::JudgePaths(ask));
+    };
+    vexlo::elasticd::RequestStats stats;
+    const auto answer = [&](const Json::Value& request) {
+      return stats.Answer(request, [&](const Json::Value& asked) { return engine.Handle(asked); });
+    };
+    vexlo::elasticd::Serve(daemon, answer, search, judge->IsThere());
+  });
 }

@@ -384,15 +384,18 @@ std::string SnippetOf(Session& session, StoredDocument* document,
 }
 
 void Show(Session& session, const SearchRequest& request, const Selection& selection,
-          const std::vector<Wanted>& wanted, SearchHit* hit) {
+          const std::vector<Wanted>& wanted, bool is_judged, SearchHit* hit) {
   auto document = session.Load(hit->id);
   if (!document) {
     return;
   }
   hit->path = document->path;
-  hit->shown = session.Fields(&*document, selection);
+  const bool shows_text = !is_judged || IsOfFile(session, *document, hit->changed);
+  hit->shown = shows_text ? session.Fields(&*document, selection) : Json::Value(Json::objectValue);
   hit->shown["path"] = document->path;
-  hit->shown["score"] = hit->score;
+  if (!is_judged) {  // How often a word stands in others' files shows in it.
+    hit->shown["score"] = hit->score;
+  }
   const auto number = [&](const char* field) -> Json::Value {
     const auto id = session.IdOf(field);
     const Item* const item = id ? document->record.Find(*id) : nullptr;
@@ -402,7 +405,7 @@ void Show(Session& session, const SearchRequest& request, const Selection& selec
   hit->shown["size"] = number(kSizeField);
   hit->shown["modified"] = number(kModifiedField);
   hit->shown["is_dir"] = number(kIsDirField).isBool() && number(kIsDirField).asBool();
-  if (request.snippet) {
+  if (request.snippet && shows_text) {
     hit->shown["snippet"] = SnippetOf(session, &*document, wanted);
   }
 }
@@ -474,13 +477,17 @@ bool ComesBefore(const SearchRequest& request, const SearchHit& a, const SearchH
   return request.descending && request.order != Order::kRelevance ? order > 0 : order < 0;
 }
 
-SearchPage Search(Session& session, const SearchRequest& request, size_t shown_from) {
+SearchPage Search(Session& session, const SearchRequest& request, size_t shown_from,
+                  const JudgePaths& judge) {
   if (request.only_noise) {
     return {};
   }
   SearchPage page;
   page.hits = FindHits(session, request);
   page.total = page.hits.size();
+  if (judge) {
+    KeepReadable(session, request, judge, &page);
+  }
   const size_t count = std::min(page.hits.size(), request.from + request.count);
   std::partial_sort(
       page.hits.begin(), page.hits.begin() + static_cast<std::ptrdiff_t>(count), page.hits.end(),
@@ -492,7 +499,7 @@ SearchPage Search(Session& session, const SearchRequest& request, size_t shown_f
   }
   const std::vector<Wanted> wanted = WantedOf(session, request);
   for (size_t i = shown_from; i < count; ++i) {
-    Show(session, request, selection, wanted, &page.hits[i]);
+    Show(session, request, selection, wanted, /*is_judged=*/judge != nullptr, &page.hits[i]);
   }
   return page;
 }

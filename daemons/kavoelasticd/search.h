@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "daemons/kavoelasticd/readable.h"
 #include "daemons/kavoelasticd/session.h"
 
 namespace vexlo::elasticd {
@@ -50,11 +51,13 @@ struct SearchHit {
   std::string name_key;  // The folded name, for that order.
   std::optional<int64_t> size;
   std::optional<int64_t> modified;
-  Json::Value shown;  // What the reply has beside the index.
+  int64_t changed = 0;  // As KeepReadable() has it.
+  Json::Value shown;    // What the reply has beside the index.
 };
 
 struct SearchPage {
   size_t total = 0;
+  bool is_least = false;        // There may be more than the total.
   std::vector<SearchHit> hits;  // The first from + count, in order.
 };
 
@@ -62,8 +65,10 @@ struct SearchPage {
 SearchRequest ParseSearch(const Json::Value& data);
 
 // Searches one index. `shown` is filled from the hit number `shown_from` on. The session is to be
-// in a transaction, or parts of the answer may be of different moments.
-SearchPage Search(Session& session, const SearchRequest& request, size_t shown_from);
+// in a transaction, or parts of the answer may be of different moments. With a judge only what may
+// be read is found, and nothing of its text is shown when the file at its path is another by now.
+SearchPage Search(Session& session, const SearchRequest& request, size_t shown_from,
+                  const JudgePaths& judge = nullptr);
 
 // Whether `a` comes before `b` in the order asked for.
 bool ComesBefore(const SearchRequest& request, const SearchHit& a, const SearchHit& b);

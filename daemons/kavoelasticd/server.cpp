@@ -2,7 +2,10 @@
 
 #include <malloc.h>
 
+#include <atomic>
 #include <cstddef>
+#include <optional>
+#include <thread>
 #include <utility>
 
 #include "common/error.h"
@@ -18,7 +21,7 @@ constexpr size_t kLongBytes = size_t{1} << 20;
 std::string SocketPath() { return kavo::local::Root() + "/var/run/kavoelasticd.sock"; }
 
 // Never one of the codes that make callers wait and try again: none of these passes by waiting.
-std::string ErrorText(ErrorCode code, const char* message) {
+std::string ErrorText(ErrorCode code, const std::string& message) {
   Json::Value reply(Json::objectValue);
   reply["success"] = false;
   reply["error"]["code"] = static_cast<int>(code);
@@ -26,10 +29,29 @@ std::string ErrorText(ErrorCode code, const char* message) {
   return JsonToString(reply);
 }
 
+std::string SearchSocketPath() { return kavo::local::Root() + "/var/run/kavoelasticd.search.sock"; }
+
 std::string RefusalText(daemon::Refusal refusal) {
-  return refusal == daemon::Refusal::kTooLong
-             ? ErrorText(ERR_BAD_PARAMETER, "the request is too long")
-             : ErrorText(ERR_INTERNAL, "the request made the engine fail");
+  return ErrorText(refusal == daemon::Refusal::kHandlerFailed ? ERR_INTERNAL : ERR_BAD_PARAMETER,
+                   RefusalSentence(refusal, "the engine"));
+}
+
+// A server of its own, so that nobody who only searches takes places and threads of those who
+// index.
+daemon::FrameServerOptions SearchOptions(const SearchHandler& handler, bool is_open) {
+  daemon::FrameServerOptions options;
+  options.socket_path = SearchSocketPath();
+  options.mode = is_open ? 0666 : 0600;
+  options.admits = [is_open](const daemon::Peer& /*peer*/) { return is_open; };
+  options.peer_handler = [&handler](const std::string& request, const daemon::Peer& peer) {
+    return AnswerText([&](const Json::Value& value) { return handler(value, peer); }, request);
+  };
+  options.refusal = RefusalText;
+  options.workers = 2;
+  options.max_connections = 256;
+  options.max_request_bytes = size_t{64} << 10;
+  options.max_total_bytes = size_t{64} << 20;
+  return options;
 }
 
 }  // namespace
@@ -53,6 +75,7 @@ std::string AnswerText(const Handler& handler, const std::string& request) {
 daemon::DaemonOptions ElasticdOptions() {
   daemon::DaemonOptions options;
   options.name = "kavoelasticd";
+  options.keeps_to_state = false;  // Whoever makes or moves an index says where it lies.
   options.usage =
       "\n\nKeeps the full-text indexes of the shares. Runs in the foreground until SIGTERM or "
       "SIGINT and "
@@ -62,14 +85,26 @@ daemon::DaemonOptions ElasticdOptions() {
   return options;
 }
 
-void Serve(daemon::Daemon& daemon, const Handler& handler) {
+void Serve(daemon::Daemon& daemon, const Handler& handler, const SearchHandler& search_handler,
+           bool is_open) {
   daemon::FrameServerOptions options;
   options.socket_path = SocketPath();
   options.handler = [&handler](const std::string& request) { return AnswerText(handler, request); };
   options.refusal = RefusalText;
   daemon::FrameServer server(std::move(options));
+  std::optional<daemon::FrameServer> search_server;
+  std::thread search_thread;
+  std::atomic<bool> searches_ended = true;
+  if (search_handler) {
+    search_server.emplace(SearchOptions(search_handler, is_open));
+    search_thread = std::thread([&] { searches_ended = search_server->Run(daemon.StopFd()); });
+  }
   daemon.Ready();
-  if (!server.Run(daemon.StopFd())) {
+  const bool requests_ended = server.Run(daemon.StopFd());
+  if (search_thread.joinable()) {
+    search_thread.join();
+  }
+  if (!requests_ended || !searches_ended) {
     daemon.EndAtOnce("a request takes too long");
   }
 }

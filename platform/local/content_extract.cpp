@@ -23,6 +23,7 @@
 
 #include "kavo/local/content.h"
 #include "kavo/local/frames.h"
+#include "kavo/local/open.h"
 #include "kavo/local/shares.h"
 #include "platform/local/fd.h"
 
@@ -127,9 +128,9 @@ static_assert(std::is_sorted(std::begin(kTextExtensions), std::end(kTextExtensio
 // Reading for an index is no use of the file, so its access time is left alone where that is
 // allowed.
 int OpenQuietly(const std::string& path) {
-  constexpr int kFlags = O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC;
-  const int fd = open(path.c_str(), kFlags | O_NOATIME);
-  return fd < 0 && errno == EPERM ? open(path.c_str(), kFlags) : fd;
+  constexpr int kFlags = O_RDONLY | O_NONBLOCK | O_NOCTTY;
+  const int fd = kavo::local::OpenInShare(path, kFlags | O_NOATIME);
+  return fd < 0 && errno == EPERM ? kavo::local::OpenInShare(path, kFlags) : fd;
 }
 
 // Nothing when the file is longer than `most` bytes, or cannot be read.
@@ -332,9 +333,12 @@ namespace KAVO::CONTENT_EXTRACT {
 
 void ParseFile(const std::string& path, const Json::Value& options, Json::Value& metadata) {
   struct statx info {};
-  if (statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, STATX_BASIC_STATS | STATX_BTIME, &info) !=
-      0) {
-    Fail(path);
+  {
+    const ScopedFd file(kavo::local::OpenInShare(path, O_PATH));
+    if (file.Get() < 0 || statx(file.Get(), "", AT_EMPTY_PATH | AT_SYMLINK_NOFOLLOW,
+                                STATX_BASIC_STATS | STATX_BTIME, &info) != 0) {
+      Fail(path);
+    }
   }
   Json::Value fields = AttributesOf(path, info);
   if (options["need_meta"].isBool() && options["need_meta"].asBool() && S_ISREG(info.stx_mode)) {

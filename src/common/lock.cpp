@@ -24,13 +24,61 @@ useconds_t RandomPause() {
   return static_cast<useconds_t>(generator() % 10) * kPauseStepMicroseconds;
 }
 
+// Whether everybody may make a file there and nobody remove another's: /tmp.
+bool IsInSharedFolder(const std::string& path) {
+  const size_t slash = path.rfind('/');
+  const std::string folder = slash == std::string::npos ? "." : path.substr(0, slash + 1);
+  struct stat info {};
+  return stat(folder.c_str(), &info) == 0 && (info.st_mode & S_ISVTX) != 0 &&
+         (info.st_mode & S_IWOTH) != 0;
+}
+
+// Lets root, who is not to be kept from its work, remove what another user has put in a shared
+// folder under the lock's name: a link (a second name of some file is one), or a file of that
+// user's. True when the path is free by it.
+bool RemovePlanted(const std::string& path) {
+  struct stat info {};
+  if (geteuid() != 0 || !IsInSharedFolder(path) || lstat(path.c_str(), &info) != 0 ||
+      (S_ISREG(info.st_mode) && info.st_nlink == 1 && info.st_uid == 0) ||
+      unlink(path.c_str()) != 0) {
+    return false;
+  }
+  LogLine(VEXLO_SOURCE, __LINE__,
+          "what another user put at a lock's path is removed, path=" + path +
+              ", uid=" + std::to_string(info.st_uid));
+  return true;
+}
+
 // Opening without O_CREAT first: with fs.protected_regular set, the kernel refuses even root an
 // O_CREAT on another user's file in a sticky directory such as /tmp.
-int OpenLockFile(const char* path) {
+int OpenWithoutLinks(const char* path) {
   // O_NONBLOCK keeps a FIFO planted at the path from holding us up; it means nothing to a file.
   constexpr int kFlags = O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK;
   const int fd = open(path, kFlags);
   return fd < 0 && errno == ENOENT ? open(path, kFlags | O_CREAT, 0644) : fd;
+}
+
+// A second name in a shared folder leads to a file that has nothing to do with the lock, and which
+// somebody else may lock for reasons of their own.
+int OpenLockFile(const std::string& path) {
+  for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
+    const int fd = OpenWithoutLinks(path.c_str());
+    struct stat info {};
+    const bool is_second_name =
+        fd >= 0 && fstat(fd, &info) == 0 && info.st_nlink > 1 && IsInSharedFolder(path);
+    if ((fd >= 0 || errno != ELOOP) && !is_second_name) {
+      return fd;
+    }
+    const int error = is_second_name ? EMLINK : ELOOP;
+    if (fd >= 0) {
+      close(fd);
+    }
+    if (!RemovePlanted(path)) {
+      errno = error;
+      break;
+    }
+  }
+  return -1;
 }
 
 bool IsStillAt(int fd, const char* path) {
@@ -65,8 +113,9 @@ LockMutex::~LockMutex() {
 }
 
 LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(path) {
-  for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
-    fd_ = OpenLockFile(path_.c_str());
+  for (int attempt = 0; attempt < kMaxAttempts || (attempt == kMaxAttempts && RemovePlanted(path_));
+       ++attempt) {
+    fd_ = OpenLockFile(path_);
     VEXLO_CHECK_AT((LogSite{VEXLO_SOURCE, __LINE__, __func__,
                             "0 > (fd_ = open(path_.c_str(), O_RDONLY | O_CREAT, 0644))"}),
                    0 > fd_, ERR_LOCK, "open failed, path=" + path_ + ", reason=" + strerror(errno));
@@ -92,7 +141,7 @@ LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(pat
 LockFile::LockFile(const std::string& path, bool exclusive, std::try_to_lock_t)
     : fd_(-1), path_(path) {
   for (int attempt = 0; attempt < kMaxAttempts; ++attempt) {
-    const int fd = OpenLockFile(path_.c_str());
+    const int fd = OpenLockFile(path_);
     if (fd < 0) {
       return;
     }

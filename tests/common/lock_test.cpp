@@ -1,7 +1,9 @@
 #include "common/lock.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 
 #include <functional>
 #include <memory>
@@ -99,6 +101,54 @@ TEST(Lock, WhatCannotBeOpenedOrLockedFailsAtOnce) {
   EXPECT_EQ(Failure(kPath, true), "No locks available");
   EXPECT_TRUE(pauses.empty());
   EXPECT_FALSE(kFolder.Names().contains("victim"));
+}
+
+// A folder like /tmp, in which somebody else comes first.
+TEST(Lock, NobodyKeepsRootFromALockInASharedFolder) {
+  if (geteuid() != 0) {
+    GTEST_SKIP() << "only root can be somebody else as well";
+  }
+  constexpr uid_t kSomebody = 4711;
+  const TempFolder shared;
+  ASSERT_EQ(chmod(shared.Path().c_str(), 01777), 0);
+  const std::string lock = shared / "lock";
+  const std::string victim = kFolder / "victim";
+  const auto links = [&] { return symlink(victim.c_str(), lock.c_str()) == 0; };
+  const auto names = [&] { return link(victim.c_str(), lock.c_str()) == 0; };
+  const auto pipes = [&] { return mkfifo(lock.c_str(), 0666) == 0; };
+  const auto writes = [&] { return WriteText(lock, "theirs"), true; };
+  const struct {
+    const char* name;
+    std::function<bool()> plants;
+    std::string for_all;  // Why anybody else fails; "" when they do not.
+    uid_t owner;
+    bool holds;  // For ever.
+    bool fails;  // Even root.
+  } rows[] = {
+      {"a link", links, "Too many levels of symbolic links", kSomebody, false, false},
+      {"a name of another file", names, "Too many links", 0, false, false},
+      {"a pipe", pipes, "", kSomebody, false, false},
+      {"their file", writes, "", kSomebody, false, false},
+      {"their file, held", writes, "Exceed max retry", kSomebody, true, false},
+      {"our file, held", writes, "Exceed max retry", 0, true, true},
+  };
+  for (const auto& row : rows) {
+    SCOPED_TRACE(row.name);
+    WriteText(victim, "precious");
+    ASSERT_TRUE(row.plants() && lchown(lock.c_str(), row.owner, row.owner) == 0);
+    const int held = open(lock.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
+    ASSERT_TRUE(!row.holds || flock(held, LOCK_EX) == 0);
+    ASSERT_EQ(seteuid(kSomebody + 1), 0);
+    const std::string reason = Failure(lock, /*exclusive=*/true);
+    ASSERT_EQ(seteuid(0), 0);
+    EXPECT_TRUE(row.for_all.empty() ? reason.empty()
+                                    : reason.find(row.for_all) != std::string::npos)
+        << reason;
+    EXPECT_EQ(!Failure(lock, /*exclusive=*/true).empty(), row.fails);
+    EXPECT_EQ(ReadText(victim), "precious");
+    close(held);
+    unlink(lock.c_str());
+  }
 }
 
 TEST(Lock, LocksTheFileThatThePathNamesNow) {

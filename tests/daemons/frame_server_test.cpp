@@ -7,11 +7,13 @@
 #include <sys/stat.h>
 
 #include <filesystem>
+#include <functional>
 #include <future>
 #include <optional>
 
 #include "common/error.h"
 #include "kavo/local/frames.h"
+#include "support/as_user.h"
 #include "support/faults.h"
 #include "support/raw_client.h"
 #include "support/syslog_capture.h"
@@ -117,6 +119,45 @@ TEST_F(FrameServerTest, GivesTheHandlerTheFileThatComesWithARequest) {
     EXPECT_EQ(reply, request.size() == 4 ? "cont" : "content");
   }
   EXPECT_EQ(Ask("no file"), "none");
+}
+
+TEST_F(FrameServerTest, AsksWhoAsks) {
+  if (geteuid() != 0) {
+    GTEST_SKIP() << "only root can start processes of other users";
+  }
+  constexpr uid_t kGuest = 4711;
+  constexpr uid_t kStranger = 4811;
+  ASSERT_EQ(chmod(folder_.Path().c_str(), 0755), 0);
+  options_.mode = 0666;
+  options_.handler = nullptr;
+  options_.max_connections_per_user = 3;
+  options_.admits = [](const Peer& peer) { return peer.uid == kGuest; };
+  options_.peer_handler = [](const std::string& request, const Peer& peer) {
+    std::string text = request + " " + std::to_string(peer.uid) + " " + std::to_string(peer.gid);
+    for (const gid_t group : peer.groups) {
+      text += "+" + std::to_string(group);
+    }
+    return text;
+  };
+  Start();
+  const auto ask = [this] { return Ask("who"); };
+  const std::string refused = "refused " + std::to_string(static_cast<int>(Refusal::kNotAdmitted));
+  EXPECT_TRUE(Ask("who").starts_with("who 0 0"));
+  EXPECT_EQ(HearAs(kGuest, ask), "who 4711 4711+4712+4713");
+  EXPECT_EQ(HearAs(kStranger, ask), refused);
+  EXPECT_EQ(HearAs(kStranger, [this] { return Ask(std::string(100000, 'x')); }), refused)
+      << "little is read of what will be refused";
+  const auto ask_beside = [&](size_t others) {
+    std::vector<RawClient> held;
+    held.reserve(others);
+    for (size_t i = 0; i < others; ++i) {
+      held.emplace_back(path_);
+    }
+    return Ask("who");
+  };
+  EXPECT_EQ(HearAs(kGuest, [&] { return ask_beside(2); }), "who 4711 4711+4712+4713");
+  EXPECT_EQ(HearAs(kGuest, [&] { return ask_beside(3); }), "<failed>");
+  EXPECT_TRUE(Ask("who").starts_with("who 0 0")) << "one user does not shut out another";
 }
 
 TEST_F(FrameServerTest, StalledConnectionsCostNoThread) {

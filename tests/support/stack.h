@@ -81,6 +81,7 @@ class Stack {
         name, std::make_unique<Program>("exec 2>>'" + root_ / ("logs/" + name) + "'", command));
     EXPECT_TRUE(Await([&] { return IsAnswering(name); })) << name << "\n" << Logs();
   }
+  pid_t Pid(const std::string& name) const { return programs_.at(name)->pid; }
   void Signal(const std::string& name, int signal) { kill(programs_.at(name)->pid, signal); }
   // The exit status, or 128 and the signal.
   int End(const std::string& name, int signal) {

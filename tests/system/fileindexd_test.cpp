@@ -637,7 +637,7 @@ TEST_F(Fileindexd, TakesCareOfTheStatusBits) {
 TEST_F(Fileindexd, WaitsForTheEngineAndForSpace) {
   Write("a", "alpha");
   WriteText(kRoot.MakeFolder("usr/kavo/bin") + "/kavoqpxnotify",
-            "#!/bin/sh\necho told >> " + (kRoot / "told") + "\n");
+            "#!/bin/sh\necho told >> " + (kRoot / "tmp/told") + "\n");
   chmod((kRoot / "usr/kavo/bin/kavoqpxnotify").c_str(), 0755);
   {
     FakeEngine full(kRoot / "var/run/kavoelasticd.sock");
@@ -650,7 +650,7 @@ TEST_F(Fileindexd, WaitsForTheEngineAndForSpace) {
       ASSERT_TRUE(AwaitState("failing"));
       Command(R"({"type":"worker_create","data":{"share_name":"docs"}})");
     }
-    EXPECT_EQ(ReadText(kRoot / "told"), "told\n");
+    EXPECT_EQ(ReadText(kRoot / "tmp/told"), "told\n");
   }
   StartEngine();
   Command(R"({"type":"worker_create","data":{"share_name":"docs"}})");
@@ -687,7 +687,7 @@ TEST_F(Fileindexd, AnswersEveryCommandAtOnce) {
   }
   for (const uint64_t length : {uint64_t{1} << 62, UINT64_MAX, uint64_t{100} << 20}) {
     const RawClient client(SocketPath(), LengthBytes(length) + "{");
-    EXPECT_NE(client.Receive(100).find("the command is too long"), std::string::npos) << length;
+    EXPECT_NE(client.Receive(100).find("the request is too long"), std::string::npos) << length;
   }
   ASSERT_TRUE(AwaitState("idle"));
   Program tool("exec 2>&1", FILEINDEX_PROGRAM " status --all");

@@ -47,12 +47,18 @@ class VEXLO_EXPORT LockMutex {
 // queue is renamed to its snapshot), the lock is given up and taken anew on the file that stands
 // there now, so two holders never coexist.
 //
+// In a folder where everybody may make files, such as /tmp, others may get at the path first. A
+// link there is never followed. Root removes one, and removes a file of another user's when it
+// cannot be locked in the time below; for anybody else it is an error. Whoever may read a file may
+// hold its lock, so one that root made can be held by others for ever, and each attempt is an error
+// then.
+//
 // Two LockFiles on one path exclude each other within a process too: never nest them. A LockFile is
 // not shared between threads, and its descriptor is not inherited by programs that are started.
 class VEXLO_EXPORT LockFile {
  public:
   // Tries up to 64 times with pauses of 0 to 0.9 s (about 29 s on average), shared unless
-  // `exclusive`. Throws Error 506 when the path cannot be opened (a symbolic link is refused) or
+  // `exclusive`. Throws Error 506 when the path cannot be opened (a link is refused) or
   // locked, or the tries are used up.
   LockFile(const std::string& path, bool exclusive);
   // Takes the lock if it is free now; IsHeld() says whether it was. Where it was not, errno is

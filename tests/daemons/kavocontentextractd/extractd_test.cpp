@@ -26,6 +26,7 @@ namespace {
 
 const PrivateRoot kRoot;
 constexpr bool kLimitsMemory = *WORKER_MEMORY == '\0';
+constexpr bool kIsConfined = kLimitsMemory;  // Sanitizers stand in the way of both.
 
 std::string LinkOf(const std::filesystem::path& link) {
   std::error_code error;
@@ -264,6 +265,9 @@ TEST_F(ExtractdTest, GivesWorkersNothingTheyDoNotNeed) {
   const std::string status = ReadText(proc + "/status");
   EXPECT_NE(status.find("NoNewPrivs:\t1"), std::string::npos);
   EXPECT_EQ(status.find("Uid:\t0"), std::string::npos) << status;
+  EXPECT_NE(status.find("CapPrm:\t0000000000000000"), std::string::npos) << status;
+  // Mode 2 is a filter.
+  EXPECT_EQ(status.find("Seccomp:\t2") != std::string::npos, kIsConfined) << status;
   for (const auto& fd : std::filesystem::directory_iterator(proc + "/fd")) {
     const std::string link = LinkOf(fd.path());
     EXPECT_TRUE(link == "/dev/null" || (fd.path().filename() == "3" && link.starts_with("socket:")))

@@ -100,6 +100,9 @@ class EngineFixture {
   }
 
   Json::Value Send(const Json::Value& request) { return engine_->Handle(request); }
+  Json::Value SearchFor(const Json::Value& request, const vexlo::elasticd::JudgePaths& judge) {
+    return engine_->HandleSearch(request, judge);
+  }
   Json::Value Send(const std::string& command, Json::Value data, const std::string& id = "i") {
     Json::Value request;
     request["command"] = command;

@@ -185,8 +185,9 @@ TEST_F(FrameServerTest, StalledConnectionsCostNoThread) {
 }
 
 TEST_F(FrameServerTest, ClosesWhoeverDoesNothing) {
-  options_.idle_timeout = milliseconds(100);
-  options_.write_timeout = milliseconds(100);
+  // Time enough for one that reads on a busy machine.
+  options_.idle_timeout = milliseconds(500);
+  options_.write_timeout = milliseconds(500);
   options_.handler = [](const std::string& request) {
     return request == "much" ? std::string(8 * kMost, 'y') : request;
   };

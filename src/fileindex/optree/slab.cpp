@@ -48,8 +48,8 @@ class OpenSlab {
 
  private:
   void Open() {
-    void* const memory = aligned_alloc(kAlignment, kSlabBytes);
-    if (memory == nullptr) {
+    void* memory = nullptr;  // aligned_alloc() takes no size that the alignment does not divide.
+    if (posix_memalign(&memory, kAlignment, kSlabBytes) != 0) {
       throw std::bad_alloc();
     }
     Close();

@@ -71,6 +71,11 @@ install(FILES ${PROJECT_BINARY_DIR}/fileindex.pc DESTINATION ${CMAKE_INSTALL_LIB
 install(FILES ${PROJECT_SOURCE_DIR}/README.md ${PROJECT_SOURCE_DIR}/LICENSE
   DESTINATION ${CMAKE_INSTALL_DOCDIR})
 
+if(fileindex_is_local)
+  install(FILES ${PROJECT_SOURCE_DIR}/packaging/sysctl.d/30-fileindex.conf DESTINATION lib/sysctl.d)
+  install(FILES ${PROJECT_SOURCE_DIR}/packaging/tmpfiles.d/fileindex.conf DESTINATION lib/tmpfiles.d)
+endif()
+
 if(TARGET fileindex_manual)
   include(cmake/manual.cmake)
 endif()

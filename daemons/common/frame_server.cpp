@@ -16,6 +16,7 @@
 #include <utility>
 
 #include "common/check.h"
+#include "daemons/common/log.h"
 #include "kavo/local/frames.h"
 
 namespace vexlo::daemon {
@@ -341,7 +342,8 @@ void FrameServer::Accept() {
         // only burn time.
         accept_after_ = now_ + kAcceptPause;
         if (now_ - last_accept_log_ > kAcceptLogPause) {
-          LogLine(VEXLO_SOURCE, __LINE__, Reason("connections must wait", options_.socket_path));
+          Log(Level::kWarning, VEXLO_SOURCE, __LINE__,
+              Reason("connections must wait", options_.socket_path));
           last_accept_log_ = now_;
         }
         UpdateAccepting();
@@ -564,7 +566,8 @@ void FrameServer::Watch(Connection& connection, uint32_t events) {
   event.data.fd = connection.fd.Get();
   if (epoll_ctl(epoll_.Get(), connection.watched == 0 ? EPOLL_CTL_ADD : EPOLL_CTL_MOD,
                 connection.fd.Get(), &event) != 0) {
-    LogLine(VEXLO_SOURCE, __LINE__, Reason("a connection is closed", options_.socket_path));
+    Log(Level::kWarning, VEXLO_SOURCE, __LINE__,
+        Reason("a connection is closed", options_.socket_path));
     Close(connection);
     return;
   }
@@ -713,8 +716,8 @@ bool FrameServer::IsStopped() {
 bool FrameServer::FinishStop() {
   const std::lock_guard<std::mutex> lock(mutex_);
   if (open_ > 0) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            "stopped with " + std::to_string(open_) + " connections not served to the end");
+    Log(Level::kWarning, VEXLO_SOURCE, __LINE__,
+        "stopped with " + std::to_string(open_) + " connections not served to the end");
   }
   jobs_.clear();
   ending_ = true;
@@ -780,9 +783,10 @@ std::optional<std::string> FrameServer::Answer(Connection& connection) {
       return Handle(request, connection);
     }
   } catch (const std::exception& error) {
-    LogLine(VEXLO_SOURCE, __LINE__, std::string("the handler failed, reason=") + error.what());
+    Log(Level::kError, VEXLO_SOURCE, __LINE__,
+        std::string("the handler failed, reason=") + error.what());
   } catch (...) {
-    LogLine(VEXLO_SOURCE, __LINE__, "the handler failed");
+    Log(Level::kError, VEXLO_SOURCE, __LINE__, "the handler failed");
   }
   std::string refusal = options_.refusal ? options_.refusal(reason) : "";
   return refusal.empty() ? std::nullopt : std::optional(std::move(refusal));

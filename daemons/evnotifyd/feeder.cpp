@@ -9,6 +9,7 @@
 #include "common/error.h"
 #include "common/file.h"
 #include "common/string.h"
+#include "daemons/common/log.h"
 
 namespace vexlo::evnotifyd {
 namespace {
@@ -167,9 +168,9 @@ void Feeder::Finish(milliseconds patience) {
     Append();
   }
   if (!backlog_.Text().empty()) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            std::to_string(backlog_.Lines()) + " lines could not be appended, queue=" + queue_ +
-                "; its folders are reindexed at the next start");
+    daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
+                std::to_string(backlog_.Lines()) + " lines could not be appended, queue=" + queue_ +
+                    "; its folders are reindexed at the next start");
   }
 }
 
@@ -265,7 +266,8 @@ void Feeder::Append() {
     pause_ = milliseconds(0);
     if (!fault_.empty()) {
       fault_.clear();
-      LogLine(VEXLO_SOURCE, __LINE__, "can be written again, queue=" + queue_);
+      daemon::Log(daemon::Level::kNotice, VEXLO_SOURCE, __LINE__,
+                  "can be written again, queue=" + queue_);
     }
     return;
   }
@@ -278,7 +280,7 @@ void Feeder::Append() {
     fault_ = "cannot be written, queue=" + queue_ + ", reason=" +
              (error == EWOULDBLOCK ? "another process holds its lock"
                                    : std::system_category().message(error));
-    LogLine(VEXLO_SOURCE, __LINE__, fault_);
+    daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__, fault_);
   }
 }
 

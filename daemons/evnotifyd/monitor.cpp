@@ -11,6 +11,7 @@
 
 #include "common/check.h"
 #include "common/error.h"
+#include "daemons/common/log.h"
 
 namespace vexlo::evnotifyd {
 namespace {
@@ -82,9 +83,9 @@ void Monitor::WatchFolder() {
   const bool was_watched = std::exchange(
       folder_watched_, inotify_add_watch(registrations_.Get(), folder_.c_str(), kFolderMask) >= 0);
   if (!folder_watched_ && was_watched) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            "registrations are looked at time after time, as they cannot be watched, path=" +
-                folder_ + ", reason=" + std::system_category().message(errno));
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                "registrations are looked at time after time, as they cannot be watched, path=" +
+                    folder_ + ", reason=" + std::system_category().message(errno));
   }
 }
 
@@ -111,12 +112,13 @@ void Monitor::Read() {
   try {
     read = kavo::local::ReadMonitorQueues();
   } catch (const kavo::local::MonitorQueuesError& error) {
-    LogLine(VEXLO_SOURCE, __LINE__, error.what());
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__, error.what());
     return;
   }
   for (const auto& [app, fault] : read.unreadable) {
     if (unreadable_[app] != fault) {
-      LogLine(VEXLO_SOURCE, __LINE__, fault + "; its queues stay as they were");
+      daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                  fault + "; its queues stay as they were");
     }
   }
   unreadable_ = read.unreadable;

@@ -10,6 +10,7 @@
 #include <utility>
 
 #include "common/check.h"
+#include "daemons/common/log.h"
 
 namespace vexlo::evnotifyd {
 namespace {
@@ -41,10 +42,10 @@ void RootPaths::Set(const std::set<std::string>& roots) {
     WatchWay(root, kMostLinks);
   }
   if (was_complete && !complete_) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            "the ways to the folders cannot be watched, and are looked at time after time, "
-            "reason=" +
-                std::system_category().message(error_));
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                "the ways to the folders cannot be watched, and are looked at time after time, "
+                "reason=" +
+                    std::system_category().message(error_));
   }
 }
 

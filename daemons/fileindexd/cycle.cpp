@@ -11,6 +11,7 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "common/string.h"
+#include "daemons/common/log.h"
 #include "daemons/fileindexd/consequence.h"
 #include "daemons/fileindexd/documents.h"
 #include "daemons/fileindexd/rename_plan.h"
@@ -619,9 +620,9 @@ void Cycle::Finish() {
   }
   for (const auto& [code, count] : failures_) {
     if (count > kMostLogged) {
-      LogLine(VEXLO_SOURCE, __LINE__,
-              share_ + ": " + std::to_string(count) +
-                  " operations failed, code=" + std::to_string(code));
+      daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
+                  share_ + ": " + std::to_string(count) +
+                      " operations failed, code=" + std::to_string(code));
     }
   }
 }
@@ -629,9 +630,9 @@ void Cycle::Finish() {
 void Cycle::Count(int code, const std::string& reason, const std::string& path) {
   stats_.CountError(code, reason);
   if (++failures_[code] <= kMostLogged) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            share_ + ": passed over, path=" + path + ", code=" + std::to_string(code) +
-                ", reason=" + reason);
+    daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
+                share_ + ": passed over, path=" + path + ", code=" + std::to_string(code) +
+                    ", reason=" + reason);
   }
 }
 

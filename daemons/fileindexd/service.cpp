@@ -10,6 +10,7 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "daemons/common/frame_server.h"
+#include "daemons/common/log.h"
 #include "daemons/fileindexd/consequence.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/paths.h"
@@ -119,7 +120,8 @@ Json::Value Service::Carry(const std::string& type, const Json::Value& data) {
       }
     });
   } else {
-    LogLine(VEXLO_SOURCE, __LINE__, "an unknown command is ignored: " + JsonToString(type));
+    daemon::Log(daemon::Level::kNotice, VEXLO_SOURCE, __LINE__,
+                "an unknown command is ignored: " + JsonToString(type));
     return Refusal("the command is not known: " + type);
   }
   return Success();
@@ -161,7 +163,8 @@ void Service::Run() {
     try {
       task();
     } catch (const std::exception& error) {
-      LogLine(VEXLO_SOURCE, __LINE__, std::string("a command failed, reason=") + error.what());
+      daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                  std::string("a command failed, reason=") + error.what());
     }
     lock.lock();
   }
@@ -171,7 +174,8 @@ void Service::StartIndexedShares() {
   try {
     pause_.Reload();
   } catch (const Error& error) {
-    LogLine(VEXLO_SOURCE, __LINE__, std::string("the pause is not known, reason=") + error.what());
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                std::string("the pause is not known, reason=") + error.what());
   }
   try {
     for (const std::string& share : fileindex::FolderMgr().GetIndexedShares()) {
@@ -181,8 +185,8 @@ void Service::StartIndexedShares() {
   } catch (const Error& error) {
     start_wait_ = NextWait(start_wait_);
     start_again_ = std::chrono::steady_clock::now() + start_wait_;
-    LogLine(VEXLO_SOURCE, __LINE__,
-            std::string("the folders are not known, reason=") + error.what());
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                std::string("the folders are not known, reason=") + error.what());
   }
 }
 

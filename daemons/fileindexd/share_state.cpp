@@ -9,6 +9,7 @@
 #include "common/error.h"
 #include "common/file.h"
 #include "common/json.h"
+#include "daemons/common/log.h"
 #include "fileindex/paths.h"
 
 namespace vexlo::fileindexd {
@@ -52,7 +53,8 @@ ShareState LoadShareState(const std::string& file) {
     VEXLO_CHECK(!JsonFromFile(value, file) || !value.isObject(), ERR_LOAD, file);
     return FromJson(value);
   } catch (const Error& error) {
-    LogLine(VEXLO_SOURCE, __LINE__, "starting without " + file + ", reason=" + error.what());
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                "starting without " + file + ", reason=" + error.what());
     return {};
   }
 }

@@ -11,6 +11,7 @@
 #include "common/error.h"
 #include "common/file.h"
 #include "common/sdk/share.h"
+#include "daemons/common/log.h"
 #include "daemons/fileindexd/consequence.h"
 #include "daemons/fileindexd/cycle.h"
 #include "fileindex/elastic_control/share_index.h"
@@ -219,7 +220,7 @@ bool Worker::MakeIndexIfAsked() {
 }
 
 void Worker::MakeIndex() {
-  LogLine(VEXLO_SOURCE, __LINE__, share_ + ": making the index anew");
+  daemon::Log(daemon::Level::kNotice, VEXLO_SOURCE, __LINE__, share_ + ": making the index anew");
   Unless(kIndexMissing, [this] { fileindex::elastic::ShareIndexDelete(share_); });
   Unless(kIndexExists, [this] { fileindex::elastic::ShareIndexCreate(share_); });
   state_ = ShareState();
@@ -231,11 +232,13 @@ Worker::Outcome Worker::Judge(int code, const std::string& reason) {
   stats_.CountError(code, reason);
   switch (OfCycle(code)) {
     case Consequence::kUnavailable:
-      LogLine(VEXLO_SOURCE, __LINE__, share_ + ": waiting for the share, reason=" + reason);
+      daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                  share_ + ": waiting for the share, reason=" + reason);
       return Outcome::kUnavailable;
     case Consequence::kNoSpace:
       if (!std::exchange(space_is_told_, true)) {
-        LogLine(VEXLO_SOURCE, __LINE__, share_ + ": waiting for space, reason=" + reason);
+        daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                    share_ + ": waiting for space, reason=" + reason);
         fileindex::SendQPXNotify();
       }
       return Outcome::kNoSpace;
@@ -251,9 +254,9 @@ Worker::Outcome Worker::Judge(int code, const std::string& reason) {
       break;
   }
   wait_ = NextWait(wait_);
-  LogLine(VEXLO_SOURCE, __LINE__,
-          share_ + ": trying again in " + std::to_string(wait_.count()) +
-              " s, code=" + std::to_string(code) + ", reason=" + reason);
+  daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+              share_ + ": trying again in " + std::to_string(wait_.count()) +
+                  " s, code=" + std::to_string(code) + ", reason=" + reason);
   return Outcome::kRetry;
 }
 

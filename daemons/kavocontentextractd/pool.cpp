@@ -18,6 +18,7 @@
 #include <utility>
 
 #include "common/check.h"
+#include "daemons/common/log.h"
 #include "kavo/local/frames.h"
 
 namespace vexlo::extractd {
@@ -230,7 +231,7 @@ std::unique_ptr<Pool::Worker> Pool::Take(bool new_worker, Outcome& refusal) {
     lock.lock();
   }
   if (worker == nullptr) {
-    LogLine(VEXLO_SOURCE, __LINE__, refusal.text);
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__, refusal.text);
     --taken_;
     came_free_.notify_one();
   } else {

@@ -11,6 +11,7 @@
 #include "common/check.h"
 #include "common/file.h"
 #include "common/json.h"
+#include "daemons/common/log.h"
 
 namespace vexlo::extractd {
 namespace {
@@ -63,9 +64,9 @@ Quarantine::Quarantine(std::string file, size_t most) : file_(std::move(file)), 
     by_file_.clear();
     const std::string aside = file_ + ".damaged";
     const bool moved = rename(file_.c_str(), aside.c_str()) == 0;
-    LogLine(VEXLO_SOURCE, __LINE__,
-            "the list of quarantined files is damaged and begun anew, path=" + file_ +
-                (moved ? ", the old one is " + aside : ""));
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                "the list of quarantined files is damaged and begun anew, path=" + file_ +
+                    (moved ? ", the old one is " + aside : ""));
   }
 }
 
@@ -110,9 +111,9 @@ void Quarantine::Save() {
     value["time"] = static_cast<Json::Int64>(entry.time);
   }
   if (!JsonToFile(document, file_)) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            "the list of quarantined files cannot be written, path=" + file_ +
-                ", reason=" + std::generic_category().message(errno));
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                "the list of quarantined files cannot be written, path=" + file_ +
+                    ", reason=" + std::generic_category().message(errno));
   }
 }
 

@@ -16,6 +16,7 @@
 #include "common/json.h"
 #include "common/string.h"
 #include "daemons/common/frame_server.h"
+#include "daemons/common/log.h"
 #include "daemons/kavocontentextractd/fault.h"
 #include "kavo/local/content.h"
 #include "kavo/local/shares.h"
@@ -92,9 +93,9 @@ std::optional<Fault> DeathOf(const Pool::Outcome& outcome, const PoolOptions& op
 daemon::Account WorkerAccount() {
   const std::optional<daemon::Account> own = daemon::FindAccount(kWorkerUser);
   if (!own && geteuid() == 0) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            std::string("there is no user ") + kWorkerUser +
-                ": files are read as nobody, which other services may run as too");
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                std::string("there is no user ") + kWorkerUser +
+                    ": files are read as nobody, which other services may run as too");
   }
   return own.value_or(kNobody);
 }
@@ -150,8 +151,8 @@ std::string Service::Extract(const std::string& path, int file) {
   }
   // One that changes under the reader is no content that could be left alone.
   if (fstat(file, &info) == 0 && KeyOf(info) == key) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            "quarantined, path=" + path + ", reason=" + fault->Reason() + ": " + fault->what());
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                "quarantined, path=" + path + ", reason=" + fault->Reason() + ": " + fault->what());
     quarantine_.Add(key, *fault, path);
   }
   return JsonToString(ReplyOf(*fault));

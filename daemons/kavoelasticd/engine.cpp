@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "common/check.h"
+#include "daemons/common/log.h"
 #include "daemons/kavoelasticd/commands.h"
 #include "daemons/kavoelasticd/disk.h"
 #include "daemons/kavoelasticd/failure.h"
@@ -92,7 +93,8 @@ Engine::~Engine() {
         slot->store->Close();
       }
     } catch (const std::exception& error) {
-      LogLine(VEXLO_SOURCE, __LINE__, "closing failed, id=" + id + ", reason=" + error.what());
+      daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                  "closing failed, id=" + id + ", reason=" + error.what());
     }
   }
 }
@@ -121,7 +123,8 @@ Json::Value Engine::Answer(const std::function<Json::Value()>& work) {
   } catch (const Failure& failure) {
     return Refusal(failure.GetCode(), failure.what());
   } catch (const std::exception& error) {
-    LogLine(VEXLO_SOURCE, __LINE__, std::string("a request failed, reason=") + error.what());
+    daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
+                std::string("a request failed, reason=") + error.what());
     return Refusal(Code::kInternal, error.what());
   }
 }
@@ -276,7 +279,8 @@ void Engine::WithStore(const std::string& id, const StoreUse& use) {
           if (failure.GetCode() != Code::kIndexDamaged) {
             throw;
           }
-          LogLine(VEXLO_SOURCE, __LINE__, "damage is met, id=" + id + ", reason=" + failure.what());
+          daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
+                      "damage is met, id=" + id + ", reason=" + failure.what());
           damaged_opening = slot->openings;
         }
       }
@@ -308,8 +312,8 @@ void Engine::Open(Slot& slot) {
 void Engine::MarkDamaged(Slot& slot, const std::string& reason) {
   slot.store.reset();
   const std::string aside = SetAside(slot.entry.path);
-  LogLine(
-      VEXLO_SOURCE, __LINE__,
+  daemon::Log(
+      daemon::Level::kError, VEXLO_SOURCE, __LINE__,
       "the index must be rebuilt, id=" + slot.id + ", set aside=" + aside + ", reason=" + reason);
   SetState(slot, State::kDamaged);
 }
@@ -541,8 +545,8 @@ bool Engine::CommitIdle(std::chrono::steady_clock::duration idle) {
     try {
       left = (slot->store != nullptr && slot->store->CommitIdle(idle)) || left;
     } catch (const std::exception& error) {
-      LogLine(VEXLO_SOURCE, __LINE__,
-              "committing failed, id=" + slot->id + ", reason=" + error.what());
+      daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
+                  "committing failed, id=" + slot->id + ", reason=" + error.what());
     }
   }
   return left;

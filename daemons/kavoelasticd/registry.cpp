@@ -10,6 +10,7 @@
 #include "common/file.h"
 #include "common/json.h"
 #include "common/string.h"
+#include "daemons/common/log.h"
 #include "daemons/kavoelasticd/disk.h"
 #include "daemons/kavoelasticd/failure.h"
 #include "daemons/kavoelasticd/store.h"
@@ -90,7 +91,8 @@ void Registry::Load() {
   if (rename(file_.c_str(), aside.c_str()) != 0) {
     throw Failure(Code::kStorage, ErrnoText("the damaged registry cannot be renamed", file_));
   }
-  LogLine(VEXLO_SOURCE, __LINE__, "the registry is damaged and set aside, path=" + aside);
+  daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
+              "the registry is damaged and set aside, path=" + aside);
 }
 
 void Registry::SettleMoves() {

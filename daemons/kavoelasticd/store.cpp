@@ -9,6 +9,7 @@
 
 #include "common/check.h"
 #include "common/json.h"
+#include "daemons/common/log.h"
 #include "daemons/kavoelasticd/disk.h"
 #include "daemons/kavoelasticd/failure.h"
 
@@ -121,8 +122,8 @@ Store::~Store() {
       writer_->Commit();
     }
   } catch (const std::exception& error) {
-    LogLine(VEXLO_SOURCE, __LINE__,
-            "changes are lost, index=" + folder_ + ", reason=" + error.what());
+    daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
+                "changes are lost, index=" + folder_ + ", reason=" + error.what());
   }
 }
 
@@ -149,8 +150,8 @@ void Store::Write(const std::function<void(Writer&, Session&)>& change) {
 
 // The write lock is held. The next Commit() tells what is lost.
 void Store::RollBack(const char* reason) {
-  LogLine(VEXLO_SOURCE, __LINE__,
-          "changes are rolled back, index=" + folder_ + ", reason=" + reason);
+  daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
+              "changes are rolled back, index=" + folder_ + ", reason=" + reason);
   writer_->Lose(reason);
   uncommitted_ = false;
 }
@@ -233,8 +234,8 @@ bool Store::CommitIdle(std::chrono::steady_clock::duration idle) {
     try {
       at_rest_ = !Rest();
     } catch (const std::exception& error) {
-      LogLine(VEXLO_SOURCE, __LINE__,
-              "tidying failed, index=" + folder_ + ", reason=" + error.what());
+      daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                  "tidying failed, index=" + folder_ + ", reason=" + error.what());
       at_rest_ = true;
     }
   }

@@ -4,6 +4,7 @@
 #include <malloc.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
@@ -24,9 +25,9 @@ bool no_memory = false;
 
 }  // namespace
 
-INTERPOSED void* aligned_alloc(size_t alignment, size_t size) noexcept {
-  void* memory = nullptr;
-  return no_memory || posix_memalign(&memory, alignment, size) != 0 ? nullptr : memory;
+INTERPOSED int posix_memalign(void** memory, size_t alignment, size_t size) noexcept {
+  *memory = no_memory ? nullptr : memalign(alignment, size);
+  return *memory == nullptr ? ENOMEM : 0;
 }
 
 namespace vexlo::fileindex {

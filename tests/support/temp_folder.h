@@ -9,6 +9,7 @@
 #include <filesystem>
 #include <fstream>
 #include <set>
+#include <sstream>
 #include <string>
 
 // Made below `parent` with mode 0755, and removed with all that it holds.
@@ -44,7 +45,9 @@ inline void WriteText(const std::string& path, const std::string& text) {
 // "<missing>" for what cannot be opened.
 inline std::string ReadText(const std::string& path) {
   std::ifstream file(path, std::ios::binary);
-  return file ? std::string(std::istreambuf_iterator<char>(file), {}) : "<missing>";
+  std::ostringstream text;
+  text << file.rdbuf();  // Ends where reading fails, as of a process that ends meanwhile.
+  return file.is_open() ? text.str() : "<missing>";
 }
 
 #endif  // SUPPORT_TEMP_FOLDER_H_

@@ -366,11 +366,18 @@ TEST_F(EvnotifydTest, AShareThatIsMountedIsReadAnew) {
     Do("share", "> d/e/f");
     AwaitLines("create share/d/e/f, write share/d/e/f", "q", count + 1);
   }
-  // Both the folder that is gone and the mounts that are left may tell of it.
+  // Both the folder that is gone and the mounts that are left may tell of it, the latter at any
+  // time.
   EXPECT_TRUE(Await([&] { return Lines("q", count + 3).starts_with("reindex share/d/"); }));
   Do("share", "> d/e/g");
-  EXPECT_TRUE(Await([&] { return Lines().ends_with(", create share/d/e/g, write share/d/e/g"); }))
-      << Lines();
+  EXPECT_TRUE(Await([&] {
+    std::string text = Lines();
+    const std::string also = ", reindex share/d/e/";
+    for (size_t at = 0; (at = text.find(also, at)) != std::string::npos;) {
+      text.erase(at, also.size());
+    }
+    return text.ends_with(", create share/d/e/g, write share/d/e/g");
+  })) << Lines();
 }
 
 TEST_F(EvnotifydTest, AQueueThatCannotBeWrittenWaitsAlone) {

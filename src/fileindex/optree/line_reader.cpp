@@ -45,6 +45,9 @@ LineReader::~LineReader() {
 }
 
 bool LineReader::NextBuffered(QueueLine& line) {
+  if (scanned_ == end_) {  // Also before the first read, when there is no buffer yet.
+    return false;
+  }
   const char* const from = buffer_.data() + scanned_;
   const auto* const newline = static_cast<const char*>(memchr(from, '\n', end_ - scanned_));
   if (newline == nullptr) {

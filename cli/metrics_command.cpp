@@ -47,10 +47,12 @@ ExitStatus CheckHealth(const Arguments& arguments, const Console& console) {
     const std::string name = ForTerminal(share["share"].asString());
     const std::string worker = share["state"].asString();
     if (arguments.Has("--ready") && (worker == "failing" || worker == "unavailable")) {
-      faults.push_back("the share " + name + " is " + worker +
-                       (share["last_error"].asString().empty()
-                            ? ""
-                            : ": " + ForTerminal(share["last_error"].asString())));
+      const std::string error = share["last_error"].asString();
+      std::string fault = "the share " + name + " is " + worker;
+      if (!error.empty()) {
+        fault.append(": ").append(ForTerminal(error));
+      }
+      faults.push_back(std::move(fault));
     }
     if (arguments.Has("--ready") && share["watch"]["state"] == "degraded") {
       faults.push_back("not all changes in the share " + name +

@@ -29,7 +29,7 @@ std::string Output(const std::string& command) {
   return output;
 }
 
-bool IsInstalled(const std::string& program) { return Output("command -v " + program) != ""; }
+bool IsInstalled(const std::string& program) { return !Output("command -v " + program).empty(); }
 
 TEST(ManualTest, PagesHaveAllCommandsAndNoFaults) {
   const TempFolder folder;

@@ -123,11 +123,15 @@ struct Differences {
   CrawlResult result;
 };
 
-// None where they are too many.
+// None where they are too many, or the index has nothing there.
 std::optional<Differences> FindDifferences(const std::string& id, const std::string& root,
                                            const WalkRules& rules, const ContentRules& content,
                                            const CrawlDeeds& deeds) {
   FolderListing listing(id, root);
+  auto indexed = listing.Next();
+  if (!indexed) {
+    return std::nullopt;
+  }
   DiskScan scan(root, rules, content, listing.Seed());
   Differences found;
   std::string unknown;  // Keys that begin so are of folders that could not be read.
@@ -136,7 +140,6 @@ std::optional<Differences> FindDifferences(const std::string& id, const std::str
     found.folders.push_back({std::move(key), is_indexed});
   };
   auto on_disk = scan.Next();
-  auto indexed = listing.Next();
   while ((on_disk || indexed) && found.folders.size() <= kMostDiffering) {
     deeds.check();
     const int order = !on_disk ? 1 : !indexed ? -1 : on_disk->key.compare(indexed->key);

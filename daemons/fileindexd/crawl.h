@@ -133,8 +133,8 @@ struct CrawlResult {
 // removes what it meets.
 //
 // With `content`, a crawl from the start begins with the digests of the folders, and goes through
-// those alone that differ, unless they are many. Without, every entry is compared: for those who
-// compare something else than what EntryHash() is made of.
+// those alone that differ, unless they are many or all is new. Without, every entry is compared:
+// for those who compare something else than what EntryHash() is made of.
 CrawlResult Crawl(const std::string& id, CrawlPoint point, const WalkRules& rules,
                   const std::optional<ContentRules>& content, const CrawlDeeds& deeds);
 

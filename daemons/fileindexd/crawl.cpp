@@ -11,45 +11,56 @@ using Clock = std::chrono::steady_clock;
 
 constexpr unsigned kPage = 2000;
 constexpr size_t kMostGone = 10000;
+constexpr size_t kMostDiffering = 10000;
 constexpr unsigned kCommitStep = 4000;
 constexpr std::chrono::seconds kCheckpointTime{2};
 constexpr unsigned kProgressStep = 256;
 constexpr unsigned kClockStep = 16;
 
-// One pass over the folder.
+// What is found in one pass over the folder, or over parts of it.
 class Pass {
  public:
-  Pass(const std::string& id, CrawlPoint* point, const WalkRules& rules, const CrawlDeeds& deeds)
+  // Without `keeps_place`, whoever goes on begins anew.
+  Pass(CrawlPoint* point, const CrawlDeeds& deeds, bool keeps_place)
       : point_(*point),
         deeds_(deeds),
-        was_cut_short_(!point->after.empty()),
-        walk_(point->root, point->after, rules),
-        listing_(id, point->root, point->after),
+        keeps_place_(keeps_place),
+        noted_before_(!point->after.empty() && point->saw_gone),
         gone_(kMostGone) {}
 
+  template <typename NextOnDisk, typename NextIndexed>
+  void Merge(DiskWalk& walk, const NextOnDisk& next_on_disk, const NextIndexed& next_indexed) {
+    MergeByPath(
+        next_on_disk, next_indexed,
+        [this](const DiskEntry& entry, const IndexedPath* indexed) {
+          deeds_.compare(entry, indexed, point_.pass == 1);
+          Advance(entry.path);
+        },
+        [&](const IndexedPath& indexed) {
+          MeetGone(walk, indexed.path);
+          Advance(indexed.path);
+        });
+    result_.unknown += walk.UnknownCount();
+    result_.last_error = walk.UnknownCount() > 0 ? walk.LastError() : result_.last_error;
+  }
+
+  // Whether the folder was met as gone, or lies below one that was.
+  bool IsGone(const std::string& folder) const { return gone_.Contains(folder + "/"); }
+
   // Whether another pass is wanted.
-  bool Run() {
-    const bool noted_before = was_cut_short_ && point_.saw_gone;
-    MergeByPath([this] { return walk_.Next(); }, [this] { return listing_.Next(); },
-                [this](const DiskEntry& entry, const IndexedPath* indexed) {
-                  deeds_.compare(entry, indexed, point_.pass == 1);
-                  Advance(entry.path);
-                },
-                [this](const IndexedPath& indexed) {
-                  MeetGone(indexed.path);
-                  Advance(indexed.path);
-                });
+  bool End() {
     deeds_.commit();
     Remove();
     deeds_.progress(done_, /*is_end=*/true);
-    return point_.pass == 1 && (noted_before || has_overflowed_);
+    return point_.pass == 1 && (noted_before_ || has_overflowed_);
   }
 
-  CrawlResult Result() const { return {walk_.UnknownCount(), walk_.LastError()}; }
+  void CountDone(uint64_t entries) { done_ += entries; }
+  CrawlResult Result() const { return result_; }
 
  private:
-  void MeetGone(const std::string& path) {
-    if (walk_.IsUnknown(path) || gone_.Contains(path)) {
+  void MeetGone(DiskWalk& walk, const std::string& path) {
+    if (walk.IsUnknown(path) || gone_.Contains(path)) {
       return;
     }
     point_.saw_gone = true;
@@ -81,7 +92,9 @@ class Pass {
       deeds_.commit();
     }
     if (is_due) {
-      point_.after = path;
+      if (keeps_place_) {
+        point_.after = path;
+      }
       deeds_.save(point_);
       saved_ = Clock::now();
     }
@@ -89,16 +102,165 @@ class Pass {
 
   CrawlPoint& point_;
   const CrawlDeeds& deeds_;
-  const bool was_cut_short_;
-  DiskWalk walk_;
-  IndexListing listing_;
+  const bool keeps_place_;
+  const bool noted_before_;
+  CrawlResult result_;
   GoneList gone_;
   bool has_overflowed_ = false;
   uint64_t done_ = 0;
   Clock::time_point saved_ = Clock::now();
 };
 
+// A folder that is not the same in index and disk, as far as can be told without looking into it.
+struct Differing {
+  std::string path;
+  bool is_indexed;  // Whether the index had anything in it.
+};
+
+struct Differences {
+  std::vector<Differing> folders;  // In the order of their keys.
+  uint64_t same = 0;               // Entries of all others.
+  CrawlResult result;
+};
+
+// None where they are too many, or the index has nothing there.
+std::optional<Differences> FindDifferences(const std::string& id, const std::string& root,
+                                           const WalkRules& rules, const ContentRules& content,
+                                           const CrawlDeeds& deeds) {
+  FolderListing listing(id, root);
+  auto indexed = listing.Next();
+  if (!indexed) {
+    return std::nullopt;
+  }
+  DiskScan scan(root, rules, content, listing.Seed());
+  Differences found;
+  std::string unknown;  // Keys that begin so are of folders that could not be read.
+  const auto add = [&](std::string key, bool is_indexed) {
+    key.pop_back();
+    found.folders.push_back({std::move(key), is_indexed});
+  };
+  auto on_disk = scan.Next();
+  while ((on_disk || indexed) && found.folders.size() <= kMostDiffering) {
+    deeds.check();
+    const int order = !on_disk ? 1 : !indexed ? -1 : on_disk->key.compare(indexed->key);
+    if (order <= 0 && on_disk->error != 0) {
+      unknown = on_disk->key;
+      ++found.result.unknown;
+      found.result.last_error = on_disk->error;
+    } else if (order > 0) {
+      if (unknown.empty() || !indexed->key.starts_with(unknown)) {
+        add(indexed->key, /*is_indexed=*/true);
+      }
+    } else {
+      const daemon::FolderDigest digest = order == 0 ? indexed->digest : daemon::FolderDigest();
+      if (on_disk->is_whole && on_disk->digest == digest) {
+        found.same += digest.count;
+        deeds.progress(found.same, /*is_end=*/false);
+      } else {
+        add(on_disk->key, /*is_indexed=*/order == 0);
+      }
+    }
+    if (order <= 0) {
+      on_disk = scan.Next();
+    }
+    if (order >= 0) {
+      indexed = listing.Next();
+    }
+  }
+  const bool is_all = !scan.HasGivenUp() && found.folders.size() <= kMostDiffering;
+  return is_all ? std::optional(std::move(found)) : std::nullopt;
+}
+
+// The folder's own entry, and its own document.
+void CompareRoot(Pass& pass, const std::string& id, const std::string& root,
+                 const WalkRules& rules) {
+  DiskWalk walk(root, "", rules);
+  bool is_seen = false;
+  bool is_asked = false;
+  const auto next_on_disk = [&] {
+    auto entry = std::exchange(is_seen, true) ? std::nullopt : walk.Next();
+    return entry && entry->path == root ? std::move(entry) : std::nullopt;
+  };
+  const auto next_indexed = [&] {
+    return std::exchange(is_asked, true) ? std::nullopt : FindDocument(id, root);
+  };
+  pass.Merge(walk, next_on_disk, next_indexed);
+}
+
+// What stands directly in the folder.
+void CompareFolder(Pass& pass, const std::string& id, const Differing& folder,
+                   const WalkRules& rules) {
+  DiskWalk walk(folder.path, /*after=*/folder.path, rules);
+  std::vector<IndexedPath> page;
+  size_t next = 0;
+  bool is_last = !folder.is_indexed;
+  std::string after;
+  pass.Merge(
+      walk, [&] { return walk.Next(); },
+      [&]() -> std::optional<IndexedPath> {
+        if (next == page.size() && !is_last) {
+          page = ListIn(id, folder.path, after, kPage);
+          next = 0;
+          is_last = page.size() < kPage;
+          after = page.empty() ? "" : page.back().path;
+        }
+        return next < page.size() ? std::optional(std::move(page[next++])) : std::nullopt;
+      });
+}
+
+// Carries out a crawl from its start by the digests; none where too much differs. Where it is cut
+// short, what it has done differs no more.
+std::optional<CrawlResult> CrawlDifferences(const std::string& id, CrawlPoint point,
+                                            WalkRules rules, const ContentRules& content,
+                                            const CrawlDeeds& deeds) {
+  const auto found = FindDifferences(id, point.root, rules, content, deeds);
+  if (!found) {
+    return std::nullopt;
+  }
+  rules.enters = false;
+  for (;; point.pass = 2) {
+    Pass pass(&point, deeds, /*keeps_place=*/false);
+    pass.CountDone(found->same);
+    CompareRoot(pass, id, point.root, rules);
+    for (const Differing& folder : found->folders) {
+      deeds.check();
+      if (!pass.IsGone(folder.path)) {
+        CompareFolder(pass, id, folder, rules);
+      }
+    }
+    if (!pass.End()) {
+      CrawlResult result = pass.Result();
+      result.unknown += found->result.unknown;
+      result.last_error = result.last_error == 0 ? found->result.last_error : result.last_error;
+      return result;
+    }
+  }
+}
+
 }  // namespace
+
+FolderListing::FolderListing(std::string id, std::string root)
+    : id_(std::move(id)), root_(std::move(root)) {
+  next_page_ = std::async(std::launch::async, ListFolders, id_, root_, "", kPage);
+  TakePage();
+}
+
+void FolderListing::TakePage() {
+  FolderPage page = next_page_.get();
+  seed_ = page.seed;
+  page_ = std::move(page.folders);
+  next_ = 0;
+  if (page_.size() == kPage) {
+    next_page_ = std::async(std::launch::async, ListFolders, id_, root_, page_.back().key, kPage);
+  }
+}
+
+std::optional<IndexedFolder> FolderListing::Next() {
+  if (next_ == page_.size() && next_page_.valid()) {
+    TakePage();
+  }
+  return next_ < page_.size() ? std::optional(std::move(page_[next_++])) : std::nullopt;
+}
 
 IndexListing::IndexListing(std::string id, std::string root, std::string after)
     : id_(std::move(id)),
@@ -157,11 +319,19 @@ std::vector<GoneList::Gone> GoneList::Take() {
 }
 
 CrawlResult Crawl(const std::string& id, CrawlPoint point, const WalkRules& rules,
-                  const CrawlDeeds& deeds) {
+                  const std::optional<ContentRules>& content, const CrawlDeeds& deeds) {
+  if (content && point.after.empty() && point.pass == 1) {
+    if (const auto result = CrawlDifferences(id, point, rules, *content, deeds)) {
+      return *result;
+    }
+  }
   for (;;) {
-    Pass pass(id, &point, rules, deeds);
-    const bool wants_another = pass.Run();
-    if (!wants_another) {
+    Pass pass(&point, deeds, /*keeps_place=*/true);
+    DiskWalk walk(point.root, point.after, rules);
+    IndexListing listing(id, point.root, point.after);
+    pass.Merge(
+        walk, [&] { return walk.Next(); }, [&] { return listing.Next(); });
+    if (!pass.End()) {
       return pass.Result();
     }
     point.pass = 2;

@@ -11,6 +11,7 @@
 #include <utility>
 #include <vector>
 
+#include "daemons/fileindexd/disk_scan.h"
 #include "daemons/fileindexd/disk_walk.h"
 #include "daemons/fileindexd/documents.h"
 #include "daemons/fileindexd/share_state.h"
@@ -63,6 +64,27 @@ class IndexListing {
   std::future<std::vector<IndexedPath>> next_page_;  // Waited for where it is dropped.
 };
 
+// The folders at and below one whose digests the index has, page by page, in the order of their
+// keys; each page is asked for while the one before is gone through.
+class FolderListing {
+ public:
+  // Waits for the first page. Throws as ListFolders() does.
+  FolderListing(std::string id, std::string root);
+  uint64_t Seed() const { return seed_; }
+  // Throws as ListFolders() does.
+  std::optional<IndexedFolder> Next();
+
+ private:
+  void TakePage();
+
+  const std::string id_;
+  const std::string root_;
+  uint64_t seed_ = 0;
+  std::vector<IndexedFolder> page_;
+  size_t next_ = 0;                    // In the page.
+  std::future<FolderPage> next_page_;  // Waited for where it is dropped.
+};
+
 // Paths that the index has and the disk has not, until they are deleted. What lies below one of
 // them goes with it.
 class GoneList {
@@ -109,8 +131,12 @@ struct CrawlResult {
 // path now is found there before it is lost here. What was noted goes at the pass's end. Where that
 // is too much to be noted, or was noted by a run that was cut short, a second pass over everything
 // removes what it meets.
+//
+// With `content`, a crawl from the start begins with the digests of the folders, and goes through
+// those alone that differ, unless they are many or all is new. Without, every entry is compared:
+// for those who compare something else than what EntryHash() is made of.
 CrawlResult Crawl(const std::string& id, CrawlPoint point, const WalkRules& rules,
-                  const CrawlDeeds& deeds);
+                  const std::optional<ContentRules>& content, const CrawlDeeds& deeds);
 
 }  // namespace vexlo::fileindexd
 

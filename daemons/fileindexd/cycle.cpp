@@ -390,7 +390,12 @@ void Cycle::Reconcile(const std::string& root, const Json::Value& types, const c
     stats_.SetProgress(is_end ? found : found - std::min<uint64_t>(found, indexer_.InWork()),
                        found);
   };
-  const CrawlResult result = Crawl(id_, point, rules, deeds);
+  std::optional<ContentRules> content;
+  if (types.isNull() && !inodes_count_) {
+    content = {[this](const std::string& path) { return scope_.WantsContent(path); },
+               [this](const std::string& folder) { return scope_.ContentsIn(folder); }};
+  }
+  const CrawlResult result = Crawl(id_, point, rules, content, deeds);
   if (result.unknown > 0) {
     Count(ERR_SYSTEM,
           std::to_string(result.unknown) + " folders or files cannot be read, the last: " +

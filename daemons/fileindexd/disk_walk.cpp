@@ -22,9 +22,6 @@ constexpr size_t kBufferBytes = 65536;
 constexpr size_t kMostHeld = 200000;
 constexpr int kOpenFlags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
 
-// Nothing is there, or no folder: what was there is gone, which is an answer.
-bool MeansGone(int error) { return error == ENOENT || error == ENOTDIR || error == ELOOP; }
-
 // Keeps the least `count` keys; true when others were dropped.
 bool KeepLeast(std::vector<std::string>* keys, size_t count) {
   if (keys->size() <= count) {
@@ -37,6 +34,8 @@ bool KeepLeast(std::vector<std::string>* keys, size_t count) {
 }
 
 }  // namespace
+
+bool MeansGone(int error) { return error == ENOENT || error == ENOTDIR || error == ELOOP; }
 
 DiskWalk::DiskWalk(const std::string& root, std::string after, WalkRules rules, size_t portion)
     : after_(std::move(after)), rules_(std::move(rules)), portion_(portion), buffer_(kBufferBytes) {
@@ -125,7 +124,8 @@ void DiskWalk::Enter(Frame& frame, const std::string& name) {
   Frame below;
   below.path = frame.path + "/" + name;
   const std::string prefix = below.path + "/";
-  const bool is_behind = prefix > after_ || after_.starts_with(prefix);
+  const bool is_behind =
+      (prefix > after_ || after_.starts_with(prefix)) && (rules_.enters || frame.is_above_root);
   // A link would be met as a folder that the policy is asked about, and is none.
   if (!is_behind || prefix.size() >= PATH_MAX || !MayEnter(frame, name, below.path)) {
     frame.may_enter.erase(name);

@@ -29,7 +29,11 @@ struct WalkRules {
   Question leads;   // Whether something below it is covered.
   // Whether the policy lets it in. Asked for the root, for folders, and for what is mounted.
   Question allows;
+  bool enters = true;  // Whether folders below the root are gone into.
 };
+
+// Whether the errno says that nothing is there, or no folder: an answer, and no failure.
+bool MeansGone(int error);
 
 // The order is that of full paths as bytes: "a", "a.txt", "a/b". A folder's own path so stands
 // apart from what is in it, where names come between that have a byte below "/".

@@ -101,8 +101,12 @@ void AddCopies(Json::Value* fields) {
 }
 
 std::vector<IndexedPath> QueryBelow(const std::string& id, const std::string& folder,
-                                    const std::string& after, unsigned count, Load load) {
+                                    const std::string& after, unsigned count, Load load,
+                                    bool flat = false) {
   Json::Value query;
+  if (flat) {
+    query["flat"] = true;
+  }
   query["qsl"]["prefix"][field::KAVOMDPath] = folder + "/";
   query["size"] = count;
   if (!after.empty()) {
@@ -161,6 +165,38 @@ std::optional<IndexedPath> FindDocument(const std::string& id, const std::string
 std::vector<IndexedPath> ListBelow(const std::string& id, const std::string& folder,
                                    const std::string& after, unsigned count) {
   return QueryBelow(id, folder, after, count, Load::kPathAndStamp);
+}
+
+std::vector<IndexedPath> ListIn(const std::string& id, const std::string& folder,
+                                const std::string& after, unsigned count) {
+  return QueryBelow(id, folder, after, count, Load::kPathAndStamp, /*flat=*/true);
+}
+
+FolderPage ListFolders(const std::string& id, const std::string& folder, const std::string& after,
+                       unsigned count) {
+  Json::Value request;
+  request["command"] = "folder_digests";
+  request["data"]["id"] = id;
+  request["data"]["below"] = folder;
+  request["data"]["size"] = count;
+  if (!after.empty()) {
+    request["data"]["after"] = after;
+  }
+  Json::Value response;
+  Send(&response, request);
+  const Json::Value& data = response["data"];
+  VEXLO_CHECK(!data.isObject() || !data["seed"].isUInt64() || !data["folders"].isArray(),
+              ERR_BAD_RESPONSE, "the engine's reply has no folders");
+  FolderPage page;
+  page.seed = data["seed"].asUInt64();
+  page.folders.reserve(data["folders"].size());
+  for (const Json::Value& each : data["folders"]) {
+    VEXLO_CHECK(!each.isArray() || each.size() != 3 || !each[0].isString() || !each[1].isUInt64() ||
+                    !each[2].isUInt64(),
+                ERR_BAD_RESPONSE, "the engine's reply has something else than folders");
+    page.folders.push_back({each[0].asString(), {each[1].asUInt64(), each[2].asUInt64()}});
+  }
+  return page;
 }
 
 Json::Value MakePut(const std::string& id, const std::string& path, bool content) {

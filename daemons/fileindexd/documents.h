@@ -5,11 +5,13 @@
 
 #include <json/value.h>
 
+#include <cstdint>
 #include <functional>
 #include <optional>
 #include <string>
 #include <vector>
 
+#include "daemons/common/entry_digest.h"
 #include "daemons/fileindexd/stamp.h"
 
 namespace vexlo::fileindexd {
@@ -29,6 +31,25 @@ std::optional<IndexedPath> FindDocument(const std::string& id, const std::string
 // the order of their paths as bytes.
 std::vector<IndexedPath> ListBelow(const std::string& id, const std::string& folder,
                                    const std::string& after, unsigned count);
+
+// The same of documents that stand directly in the folder.
+std::vector<IndexedPath> ListIn(const std::string& id, const std::string& folder,
+                                const std::string& after, unsigned count);
+
+// What stands directly in each folder, as the index has it.
+struct IndexedFolder {
+  std::string key;  // Its path with "/" behind it.
+  daemon::FolderDigest digest;
+};
+struct FolderPage {
+  uint64_t seed = 0;  // Of the hashes.
+  std::vector<IndexedFolder> folders;
+};
+
+// Up to `count` of the folders at and below `folder` with documents in them, those behind the key
+// `after` ("" for the first ones), in the order of their keys as bytes.
+FolderPage ListFolders(const std::string& id, const std::string& folder, const std::string& after,
+                       unsigned count);
 
 // The request that puts what the path holds now in the place of its document; the one that removes
 // the document when nothing is there any more. A file whose content cannot be read is indexed by

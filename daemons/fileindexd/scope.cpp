@@ -7,6 +7,7 @@
 #include "common/file.h"
 #include "common/sdk/share.h"
 #include "common/string.h"
+#include "fileindex/util/file_type.h"
 #include "fileindex/util/path_policy.h"
 #include "fileindex/util/share_path.h"
 
@@ -42,6 +43,26 @@ bool Scope::LeadsToFolder(const std::string& path) const {
   return std::any_of(full_paths_.begin(), full_paths_.end(), [&](const std::string& folder) {
     return folder != path && IsSameOrBelow(folder, path);
   });
+}
+
+std::optional<ContentByType> Scope::ContentsIn(const std::string& folder) const {
+  const auto config = folders_.GetMostSuitableCfg(folder);
+  // An indexed folder may have become a file since, which goes by the settings made for it.
+  const std::string prefix = folder + "/";
+  const auto first = std::lower_bound(full_paths_.begin(), full_paths_.end(), prefix);
+  const auto last = std::lower_bound(first, full_paths_.end(), folder + "0");
+  if (config == nullptr || std::any_of(first, last, [&](const std::string& indexed) {
+        return indexed.find('/', prefix.size()) == std::string::npos;
+      })) {
+    return std::nullopt;
+  }
+  ContentByType contents{};
+  contents[fileindex::FILE_TYPE_DOCUMENT] = config->IsDocument();
+  contents[fileindex::FILE_TYPE_AUDIO] = config->IsAudio();
+  contents[fileindex::FILE_TYPE_VIDEO] = config->IsVideo();
+  contents[fileindex::FILE_TYPE_PHOTO] = config->IsPhoto();
+  contents[fileindex::FILE_TYPE_OTHER] = true;
+  return contents;
 }
 
 bool Scope::HaveSameSettings(const std::string& a, const std::string& b) const {

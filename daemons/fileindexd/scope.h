@@ -2,9 +2,11 @@
 #ifndef DAEMONS_FILEINDEXD_SCOPE_H_
 #define DAEMONS_FILEINDEXD_SCOPE_H_
 
+#include <optional>
 #include <string>
 #include <vector>
 
+#include "daemons/fileindexd/disk_scan.h"
 #include "fileindex/folder_mgr.h"
 
 namespace vexlo::fileindexd {
@@ -28,6 +30,8 @@ class Scope {
   bool LeadsToFolder(const std::string& path) const;
   // Whether what stands in the file is to be indexed, too.
   bool WantsContent(const std::string& path) const { return folders_.IsFullPathNeedMeta(path); }
+  // The same for the files directly in a covered folder; none where it depends on more.
+  std::optional<ContentByType> ContentsIn(const std::string& folder) const;
   // Whether files of every type are treated alike at both paths.
   bool HaveSameSettings(const std::string& a, const std::string& b) const;
 

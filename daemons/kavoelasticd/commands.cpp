@@ -76,8 +76,11 @@ Json::Value GetByQuery(Session& session, const Json::Value& data) {
   if (!query["after"].isNull() && !query["after"].isString()) {
     throw Failure(Code::kBadRequest, "after is no path");
   }
+  if (!query["flat"].isNull() && !query["flat"].isBool()) {
+    throw Failure(Code::kBadRequest, "flat is neither true nor false");
+  }
   const Page page = {query["after"].asString(), PageNumber(query, "from", 0),
-                     PageNumber(query, "size", kDefaultPage)};
+                     PageNumber(query, "size", kDefaultPage), query["flat"].asBool()};
   const Selection selection = session.Select(names);
   Json::Value hits(Json::arrayValue);
   for (const int64_t id : Find(session, conditions, page)) {

@@ -11,6 +11,7 @@
 #include "daemons/kavoelasticd/commands.h"
 #include "daemons/kavoelasticd/disk.h"
 #include "daemons/kavoelasticd/failure.h"
+#include "daemons/kavoelasticd/folder_sums.h"
 #include "daemons/kavoelasticd/search.h"
 
 namespace vexlo::elasticd {
@@ -151,6 +152,13 @@ Json::Value Engine::Dispatch(const Json::Value& request) {
       store.Read([&](Session& session) { hits = GetByQuery(session, data); });
     });
     return WithData(std::move(hits));
+  }
+  if (command == "folder_digests") {
+    Json::Value digests;
+    WithStore(RequiredText(data, "id"), [&](Store& store) {
+      store.Read([&](Session& session) { digests = GetFolderDigests(session, data); });
+    });
+    return WithData(std::move(digests));
   }
   if (command == "commit") {
     WithStore(RequiredText(data, "id"), [](Store& store) { store.Commit(); });

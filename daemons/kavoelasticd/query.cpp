@@ -199,6 +199,33 @@ bool Fits(Session& session, StoredDocument* document, const Condition& condition
   });
 }
 
+// Those directly in the folder that the prefix, up to its last "/", is.
+std::vector<int64_t> FindFlat(Session& session, const std::string& prefix, const std::string& end,
+                              const Page& page) {
+  std::vector<int64_t> ids;
+  size_t passed = 0;
+  std::string begin = page.after < prefix ? prefix : page.after + '\0';
+  for (bool is_end = false; !is_end;) {
+    Sql rows(session.db, "SELECT id, path FROM docs WHERE path >= ? AND path < ? ORDER BY path");
+    rows.Blob(begin).Blob(end);
+    is_end = true;
+    while (ids.size() < page.size && rows.Row()) {
+      const std::string_view path = rows.BytesAt(1);
+      const size_t slash = path.find('/', prefix.size());
+      if (slash == std::string_view::npos) {
+        if (passed++ >= page.from) {
+          ids.push_back(rows.IntAt(0));
+        }
+        continue;
+      }
+      begin = std::string(path.substr(0, slash)) + '0';  // What follows "/".
+      is_end = false;
+      break;
+    }
+  }
+  return ids;
+}
+
 // One condition on the path: the order of the index is the order that is asked for.
 std::vector<int64_t> FindByPath(Session& session, const Condition& condition, const Page& page) {
   std::vector<int64_t> ids;
@@ -215,6 +242,8 @@ std::vector<int64_t> FindByPath(Session& session, const Condition& condition, co
       Sql rows(session.db, "SELECT id FROM docs WHERE path = ? LIMIT ? OFFSET ?");
       collect(rows.Blob(text));
     }
+  } else if (page.flat && EndOfPrefix(text, &end)) {
+    return FindFlat(session, text, end, page);
   } else if (EndOfPrefix(text, &end)) {
     Sql rows(session.db,
              "SELECT id FROM docs WHERE path >= ? AND path < ? ORDER BY path LIMIT ? OFFSET ?");
@@ -278,6 +307,9 @@ std::vector<int64_t> Find(Session& session, const Conditions& conditions, const 
   if (conditions.size() == 1 && conditions[0].field == session.schema.Key() &&
       conditions[0].value.isString()) {
     return FindByPath(session, conditions[0], page);
+  }
+  if (page.flat) {
+    throw Failure(Code::kUnknownQuery, "flat is for a prefix of the path alone");
   }
   const auto driver = std::min_element(
       conditions.begin(), conditions.end(),

@@ -30,6 +30,9 @@ struct Page {
   std::string after = {};  // Only paths behind this one; "" for all.
   size_t from = 0;
   size_t size = 0;
+  // Only paths without a "/" behind the prefix, which is the one condition. Folders between them
+  // are passed over at one look each.
+  bool flat = false;
 };
 
 // The documents for which all hold, in the order of their paths as bytes, `size` of them from the

@@ -7,6 +7,7 @@
 
 #include "common/json.h"
 #include "daemons/kavoelasticd/failure.h"
+#include "daemons/kavoelasticd/folder_sums.h"
 #include "daemons/kavoelasticd/pack.h"
 
 namespace vexlo::elasticd {
@@ -27,7 +28,8 @@ StoredDocument Stored(const Sql& row) {
 
 }  // namespace
 
-std::string FormatVersion() { return "2, Unicode " U_UNICODE_VERSION; }
+std::string FormatVersion() { return "3, Unicode " U_UNICODE_VERSION; }
+std::string FormatBeforeFolderSums() { return "2, Unicode " U_UNICODE_VERSION; }
 
 int64_t BodyId(int64_t document, uint32_t field) {
   static_assert(kBodyFields == 1 << 16);
@@ -66,8 +68,8 @@ void Session::MakeTables(const IndexInfo& info) {
       // Under their own number, as a page of any other table is left half empty by texts.
       "CREATE TABLE bodies(id INTEGER PRIMARY KEY, text BLOB NOT NULL);"
       "CREATE TABLE exact(field INTEGER, value BLOB, id INTEGER,"
-      " PRIMARY KEY(field, value, id)) WITHOUT ROWID;"
-      "CREATE VIRTUAL TABLE texts USING fts5(" +
+      " PRIMARY KEY(field, value, id)) WITHOUT ROWID;" +
+      std::string(kMakeFolderSums) + "CREATE VIRTUAL TABLE texts USING fts5(" +
       Columns('t', schema.TextColumns().size()) + contentless +
       ";CREATE VIRTUAL TABLE words USING fts5(name,rest,other," + contentless +
       ";CREATE VIRTUAL TABLE grams USING fts5(" + Columns('g', schema.GramColumns().size()) +
@@ -96,6 +98,14 @@ void Session::MakeTables(const IndexInfo& info) {
   for (const auto& [name, field] : schema.Listed()) {
     Sql(db, "INSERT INTO fields(name) VALUES(?)").Blob(name).Run();
   }
+  db.Run("COMMIT");
+}
+
+void Session::AddFolderSums() {
+  db.Run("BEGIN IMMEDIATE");
+  db.Run(kMakeFolderSums);
+  FillFolderSums(*this);
+  Sql(db, "UPDATE meta SET v = ? WHERE k = 'version'").Blob(FormatVersion()).Run();
   db.Run("COMMIT");
 }
 

@@ -85,8 +85,14 @@ void Store::CheckDatabase(Connection& db, const std::string& token) {
   if (!tables.Row() || tables.IntAt(0) != 10) {
     Damaged("the database in " + folder_ + " is not an index");
   }
-  if (Meta(db, "version") != FormatVersion()) {
+  const std::string version = Meta(db, "version");
+  lacks_folder_sums_ = version == FormatBeforeFolderSums();
+  if (version != FormatVersion() && !lacks_folder_sums_) {
     Damaged("the index in " + folder_ + " is of another version");
+  }
+  Sql sums(db, "SELECT 1 FROM sqlite_master WHERE name = 'folders'");
+  if (sums.Row() == lacks_folder_sums_) {
+    Damaged("the database in " + folder_ + " is not an index of its version");
   }
   if (Meta(db, "token") != token) {
     Damaged("the index in " + folder_ + " is another one");
@@ -106,6 +112,10 @@ void Store::OpenWriter(const std::string& token) {
     write_session_->db.Run(
         "PRAGMA synchronous=FULL; PRAGMA cache_size=-32768; PRAGMA wal_autocheckpoint=4000;"
         "PRAGMA journal_size_limit=67108864");
+    if (lacks_folder_sums_) {
+      write_session_->AddFolderSums();
+      lacks_folder_sums_ = false;
+    }
   } catch (const SqlError& error) {
     // A page that cannot be read is as gone as one that makes no sense.
     if (error.OfReading()) {

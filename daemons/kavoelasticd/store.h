@@ -67,7 +67,8 @@ class Store {
   const std::string folder_;
   std::string language_;
   std::unique_ptr<Schema> schema_;
-  std::mutex write_mutex_;  // Guards the writer and its session.
+  bool lacks_folder_sums_ = false;  // Until it is opened to be written.
+  std::mutex write_mutex_;          // Guards the writer and its session.
   std::unique_ptr<Session> write_session_;
   std::unique_ptr<Writer> writer_;
   std::chrono::steady_clock::time_point last_change_;

@@ -51,7 +51,7 @@ struct Writer::Change {
   std::vector<uint32_t> new_bodies = {};
 };
 
-Writer::Writer(Session& session) : session_(session), texts_(session) {
+Writer::Writer(Session& session) : session_(session), texts_(session), sums_(session) {
   session_.SetBeforeTexts([this] { WriteTexts(); });
 }
 
@@ -69,6 +69,7 @@ void Writer::Lose(const std::string& reason) {
   in_list_ = false;
   gone_.reset();
   texts_.Clear();
+  sums_.Clear();
   session_.ForgetFields();
   if (session_.db.InTransaction()) {
     session_.db.Run("ROLLBACK");
@@ -188,6 +189,7 @@ void Writer::Delete(const std::string& doc_id) {
   if (auto found = session_.LoadByPath(doc_id)) {
     Begin();
     RemoveDocument(std::move(*found));
+    WriteSums();
   }
 }
 
@@ -205,6 +207,7 @@ size_t Writer::DeleteWhere(const Conditions& conditions) {
         ++deleted;
       }
     }
+    WriteSums();
     if (ids.size() < kDeleteSlice) {
       return deleted;
     }
@@ -223,6 +226,7 @@ void Writer::RemoveDocument(StoredDocument document) {
       .Blob(change.before.path)
       .Run();
   Sql(session_.db, "DELETE FROM docs WHERE id = ?").Int(change.after.id).Run();
+  sums_.Change(change.before, {});
   gone_ = gone_ ? std::optional(*gone_ + 1) : std::nullopt;
   ++changes_;
 }
@@ -477,9 +481,18 @@ void Writer::Apply(Change& change) {
     WriteRows(change, filters_differ);
   }
   WriteBodies(change);
+  sums_.Change(change.before, change.after);
+  WriteSums();
   ++changes_;
   if (!in_list_ && texts_.Bytes() >= kBatchBytes) {
     WriteTexts();
+  }
+}
+
+// Those of a list go together.
+void Writer::WriteSums() {
+  if (!in_list_) {
+    sums_.Write();
   }
 }
 
@@ -493,6 +506,7 @@ void Writer::List(size_t count, const std::function<void(size_t)>& item,
     for (size_t i = 0; i < count; ++i) {
       item(i);
     }
+    sums_.Write();
   } catch (const SqlError& error) {
     UndoTo("list", mark, error);
     changes_ = changes;
@@ -512,6 +526,7 @@ void Writer::ListOneByOne(size_t count, const std::function<void(size_t)>& item,
     const size_t mark = SetSavepoint("item");
     try {
       item(i);
+      sums_.Write();
     } catch (const SqlError& error) {
       UndoTo("item", mark, error);
       refused(i, error);
@@ -531,6 +546,7 @@ void Writer::UndoTo(const std::string& name, size_t mark, const SqlError& error)
     throw SqlError(error);
   }
   session_.db.Run("ROLLBACK TO " + name);
+  sums_.Clear();
   session_.ForgetFields();
   gone_.reset();
 }

@@ -10,6 +10,7 @@
 #include <optional>
 #include <string>
 
+#include "daemons/kavoelasticd/folder_sums.h"
 #include "daemons/kavoelasticd/query.h"
 #include "daemons/kavoelasticd/session.h"
 #include "daemons/kavoelasticd/text_batch.h"
@@ -73,6 +74,7 @@ class Writer {
   void FillBodies(int64_t id, StoredDocument* document, unsigned table);
   void Reindex(Change& change, const TextTable& table);
   void WriteTexts();
+  void WriteSums();
   size_t SetSavepoint(const std::string& name);
   void UndoTo(const std::string& name, size_t mark, const SqlError& error);
   unsigned ChangedTables(Change& change);
@@ -85,6 +87,7 @@ class Writer {
 
   Session& session_;
   TextBatch texts_;
+  FolderSums sums_;  // Nothing waits there between two calls.
   bool in_list_ = false;
   std::optional<int64_t> gone_;  // Rows of that table, once they are counted.
   size_t changes_ = 0;

@@ -10,6 +10,7 @@
 #include <random>
 #include <set>
 
+#include "fileindex/util/file_type.h"
 #include "support/faults.h"
 #include "support/temp_folder.h"
 
@@ -121,6 +122,87 @@ TEST(DiskWalk, WhatIsNoFolderOrMissingIsNoFailure) {
     DiskWalk walk(root, "", Everything());
     EXPECT_EQ(PathsOf(walk), want) << root;
     EXPECT_FALSE(walk.IsUnknown(root)) << root;
+  }
+}
+
+// What the two give of one tree must add up to the same, or a comparison of the two never ends.
+TEST(DiskScan, AddsUpWhatTheWalkGives) {
+  const vexlo::fileindexd::ContentByType by_type = {true, false, true, false, true};
+  for (unsigned seed = 0; seed < 60; ++seed) {
+    SCOPED_TRACE(seed);
+    std::mt19937 random(seed);
+    const TempFolder folder;
+    MakeRandomTree(folder.Path(), random);
+    for (int i = 0; i < 3000 && seed == 0; ++i) {  // More than are looked at at once.
+      WriteText(folder / ("many" + std::to_string(i)), "");
+    }
+    fs::create_symlink("a", folder / "link");
+    fs::create_directory(folder / ".git");
+    const std::string refused = folder / "a";
+    const auto covers = [&](const std::string& path) { return path != folder / "b"; };
+    const WalkRules rules = {covers, [](const std::string&) { return true; },
+                             [&](const std::string& path) { return path != refused; }};
+    const auto wants = [&](const std::string& path) {
+      return by_type.at(static_cast<size_t>(vexlo::fileindex::GetFileTypeByFullPath(path)));
+    };
+    std::map<std::string, vexlo::daemon::FolderDigest> want;
+    DiskWalk walk(folder.Path(), "", rules);
+    while (const auto entry = walk.Next()) {
+      const std::string key = entry->path.substr(0, entry->path.rfind('/') + 1);
+      if (entry->path != folder.Path()) {
+        want[key].Add(vexlo::daemon::EntryHash(
+            seed, entry->path.substr(key.size()),
+            {entry->info.st_size,
+             entry->info.st_mtim.tv_sec * 1'000'000'000 + entry->info.st_mtim.tv_nsec,
+             entry->info.st_ctim.tv_sec * 1'000'000'000 + entry->info.st_ctim.tv_nsec,
+             wants(entry->path)}));
+      }
+    }
+    vexlo::fileindexd::DiskScan scan(
+        folder.Path(), rules, {wants, [&](const std::string&) { return std::optional(by_type); }},
+        seed);
+    std::map<std::string, vexlo::daemon::FolderDigest> got;
+    std::string last;
+    while (const auto each = scan.Next()) {
+      EXPECT_GT(each->key, last);
+      last = each->key;
+      EXPECT_EQ(each->error, 0);
+      // Of a folder that is not covered itself nobody knows what is.
+      EXPECT_EQ(each->is_whole, covers(each->key.substr(0, each->key.size() - 1))) << each->key;
+      if (each->digest.count > 0 && each->is_whole) {
+        got[each->key] = each->digest;
+      }
+    }
+    std::erase_if(want, [&](const auto& each) { return each.first == folder / "b/"; });
+    EXPECT_EQ(got, want);
+  }
+}
+
+TEST(DiskScan, TellsWhatCouldNotBeLookedAt) {
+  const TempFolder folder;
+  fs::create_directory(folder / "a");
+  fs::create_directory(folder / "b");
+  const struct {
+    const char* function;
+    int nth;
+    std::string want;  // Each folder, with "?" for one that is unknown and "-" for a part.
+  } cases[] = {
+      {"getdents64", 1, "/?"}, {"getdents64", 3, "/ /a/? /b/"}, {"fstatat", 1, "/- /a/ /b/"}};
+  for (const auto& c : cases) {
+    const ScopedFault fault(c.function, EIO, c.nth);
+    vexlo::fileindexd::DiskScan scan(
+        folder.Path(), Everything(),
+        {[](const std::string&) { return true; },
+         [](const std::string&) { return std::optional(vexlo::fileindexd::ContentByType{}); }},
+        0);
+    std::string got;
+    while (const auto each = scan.Next()) {
+      got += (got.empty() ? "" : " ") + each->key.substr(folder.Path().size()) +
+             (each->error == EIO ? "?"
+              : each->is_whole   ? ""
+                                 : "-");
+    }
+    EXPECT_EQ(got, c.want) << c.function << c.nth;
   }
 }
 

@@ -2,12 +2,15 @@
 // afterwards, it must answer as the map does. A text index that forgets something else than what it
 // learnt shows here.
 #include <gtest/gtest.h>
+#include <sqlite3.h>
 
 #include <map>
 #include <random>
 #include <string>
 
+#include "daemons/common/entry_digest.h"
 #include "daemons/kavoelasticd/engine_fixture.h"
+#include "daemons/kavoelasticd/session.h"
 
 namespace {
 
@@ -70,10 +73,75 @@ class Oracle {
     for (const auto& [path, document] : documents_) {
       EXPECT_EQ(found[i++], document) << path;
     }
+    CompareFolders();
   }
 
  private:
   static constexpr char kAll[] = R"({"size":100})";
+
+  // The digests of the folders, and what stands directly in each, are those of the map.
+  void CompareFolders() {
+    const Json::Value reply = engine_.Send("folder_digests", Parsed(R"({"below":"/"})"))["data"];
+    std::map<std::string, vexlo::daemon::FolderDigest> want;
+    std::map<std::string, std::string> paths;
+    for (const auto& [path, document] : documents_) {
+      const std::string folder = path.substr(0, path.rfind('/') + 1);
+      const Json::Value& stamp = document["FileIndexStamp"];
+      vexlo::daemon::EntryFacts facts;
+      facts.is_settled = stamp.isObject() && stamp["ctime"].isInt64() && !stamp["young"].asBool();
+      if (facts.is_settled) {
+        facts.size = stamp["size"].asInt64();
+        facts.mtime_ns = stamp["mtime"].asInt64();
+        facts.ctime_ns = stamp["ctime"].asInt64();
+        facts.content = stamp["content"].asBool();
+      }
+      want[folder].Add(
+          vexlo::daemon::EntryHash(reply["seed"].asUInt64(), path.substr(folder.size()), facts));
+      paths[folder] += (paths[folder].empty() ? "" : " ") + path;
+    }
+    std::map<std::string, vexlo::daemon::FolderDigest> got;
+    for (const Json::Value& folder : reply["folders"]) {
+      got[folder[0].asString()] = {folder[1].asUInt64(), folder[2].asUInt64()};
+      EXPECT_EQ(engine_.Query(R"({"prefix":{"KAVOMDPath":")" + folder[0].asString() + "\"}}",
+                              R"({"size":100,"flat":true})"),
+                paths[folder[0].asString()]);
+    }
+    EXPECT_EQ(got, want);
+  }
+
+  // What an engine that knew of no digests has left.
+  void ForgetFolders() {
+    EXPECT_EQ(engine_.Do("index_pause"), "ok");
+    sqlite3* db = nullptr;
+    ASSERT_EQ(sqlite3_open((engine_.Folder() / "i/index.db").c_str(), &db), SQLITE_OK);
+    const std::string version = vexlo::elasticd::FormatBeforeFolderSums();
+    EXPECT_EQ(sqlite3_exec(
+                  db,
+                  ("DROP TABLE folders; UPDATE meta SET v = '" + version + "' WHERE k = 'version'")
+                      .c_str(),
+                  nullptr, nullptr, nullptr),
+              SQLITE_OK);
+    sqlite3_close(db);
+    EXPECT_EQ(engine_.Do("index_resume"), "ok");
+  }
+
+  // Of a file as the index daemon tells it, or what may be taken for it and is none.
+  std::string Stamp() {
+    const std::string stamp = R"({"ctime":)" + std::to_string(random_() % 3) +
+                              R"(,"inode":18446744073709551615,"mtime":-1700000000000000000)";
+    switch (random_() % 5) {
+      case 0:
+        return stamp + R"(,"content":true,"size":7})";
+      case 1:
+        return stamp + R"(,"young":true,"size":7})";
+      case 2:
+        return R"({"ctime":"x"})";
+      case 3:
+        return "[5]";
+      default:
+        return stamp + R"(,"size":)" + std::to_string(random_() % 2) + "}";
+    }
+  }
 
   std::string Path() {
     const std::string folders[] = {"/a", "/b", "/a/b", "/c"};
@@ -98,7 +166,8 @@ class Oracle {
       case 2:
         return R"({"KAVOMDTextContent":")" + text + R"(","Quiet text":")" + word + "\"}";
       default:
-        return R"({"KAVOMDFSSize":)" + std::to_string(random_() % 3) + "}";
+        return R"({"KAVOMDFSSize":)" + std::to_string(random_() % 3) + R"(,"FileIndexStamp":)" +
+               Stamp() + "}";
     }
   }
 
@@ -140,6 +209,9 @@ class Oracle {
   void Other(const std::string& path) {
     if (random_() % 4 == 0) {
       engine_.Restart();
+    }
+    if (random_() % 8 == 0) {
+      ForgetFolders();
     }
     const std::string below = path.substr(0, path.rfind('/')) + "/";
     if (random_() % 4 == 0) {

@@ -1,0 +1,96 @@
+// What stands in each folder of a tree, as digests to be compared with those of an index.
+#ifndef DAEMONS_FILEINDEXD_DISK_SCAN_H_
+#define DAEMONS_FILEINDEXD_DISK_SCAN_H_
+
+#include <array>
+#include <condition_variable>
+#include <cstddef>
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <thread>
+#include <vector>
+
+#include "daemons/common/entry_digest.h"
+#include "daemons/fileindexd/disk_walk.h"
+
+namespace vexlo::fileindexd {
+
+// Whether files are indexed with what stands in them, by their FileType.
+using ContentByType = std::array<bool, 5>;
+
+// What a scan asks besides, on the thread that calls Next().
+struct ContentRules {
+  std::function<bool(const std::string& path)> wants;
+  // The same for the files directly in a folder; none where it depends on more than their type.
+  std::function<std::optional<ContentByType>(const std::string& folder)> in;
+};
+
+struct ScannedFolder {
+  std::string key;  // Its path with "/" behind it.
+  daemon::FolderDigest digest;
+  // Whether the digest stands for all that DiskWalk gives directly in the folder.
+  bool is_whole = true;
+  int error = 0;  // An errno: nothing is known of what is in the folder, and below it.
+};
+
+// Looks at every file, on the caller's thread and one of its own, and keeps no names of files; so
+// it takes little more than the calls of the kernel do. Nothing is followed that DiskWalk does not
+// follow, and the same is left out.
+class DiskScan {
+ public:
+  DiskScan(const std::string& root, WalkRules rules, ContentRules content, uint64_t seed);
+  // Waits for what is under way.
+  ~DiskScan();
+  DiskScan(const DiskScan&) = delete;
+  DiskScan& operator=(const DiskScan&) = delete;
+
+  // The next folder, in the order of their keys as bytes: each right before those below it.
+  std::optional<ScannedFolder> Next();
+
+  // Whether it has ended early, as more folders wait than are to be kept in mind.
+  bool HasGivenUp() const { return has_given_up_; }
+
+ private:
+  struct Folder;
+  struct Batch;
+  struct Level;
+  using FolderPtr = std::shared_ptr<Folder>;
+
+  void Open(int parent, const std::string& name, std::string path);
+  void Read(const FolderPtr& folder);
+  void Meet(const FolderPtr& folder, std::string_view name, unsigned type, Level* level,
+            Batch* batch);
+  void MeetFolder(const FolderPtr& folder, std::string path, Level* level, Batch* batch);
+  bool WalkOn();
+  void Hand(Batch batch);
+  void Help(std::unique_lock<std::mutex>& lock);
+  void LookAt(const Batch& batch, std::unique_lock<std::mutex>& lock);
+  void Work();
+
+  const WalkRules rules_;
+  const ContentRules content_;
+  const uint64_t seed_;
+  std::vector<Level> levels_;
+  size_t waiting_below_ = 0;  // Names in all levels.
+  bool has_given_up_ = false;
+  std::vector<char> buffer_;
+  std::string name_;
+
+  std::deque<FolderPtr> ahead_;  // Opened and not given yet.
+  std::mutex mutex_;             // Guards the rest, and what is counted in a folder.
+  std::condition_variable has_batch_;
+  std::condition_variable is_done_;
+  std::deque<Batch> batches_;
+  bool ending_ = false;
+  std::thread thread_;  // Last: it uses the others.
+};
+
+}  // namespace vexlo::fileindexd
+
+#endif  // DAEMONS_FILEINDEXD_DISK_SCAN_H_

@@ -11,6 +11,7 @@
 #include <utility>
 
 #include "common/check.h"
+#include "common/error.h"
 #include "common/json.h"
 #include "common/string.h"
 #include "daemons/common/unique_fd.h"
@@ -28,6 +29,9 @@ namespace {
 namespace field = fileindex::elastic::field;
 
 constexpr char kDelete[] = "document_del_by_id";
+constexpr int kNotKnown = 2000;  // The engine's answer to a command that it does not know.
+// Some hundredths of a second, in which other clients wait.
+constexpr unsigned kMovesInRequest = 5000;
 constexpr unsigned kMovePage = 2000;
 // While the engine carries out one request it reads the next, and this side lists a third page.
 constexpr size_t kMostMovesUnderWay = 2;
@@ -115,6 +119,12 @@ std::vector<IndexedPath> QueryBelow(const std::string& id, const std::string& fo
   return Query(id, std::move(query), load);
 }
 
+FailedItem FailureOf(size_t at, const Json::Value& result) {
+  const Json::Value& code = result["error"]["code"];
+  const Json::Value& reason = result["error"]["msg"];
+  return {at, code.isInt() ? code.asInt() : 0, reason.isString() ? reason.asString() : ""};
+}
+
 // Requests on their way, each on a thread of its own.
 class MovesUnderWay {
  public:
@@ -152,6 +162,39 @@ class MovesUnderWay {
   const Failed& failed_;
   std::deque<Sent> sent_;  // Waited for where they are dropped.
 };
+
+// For an engine that does not know how to move all below a folder.
+void MovePages(const std::string& id, const std::string& path, const std::string& path_old,
+               const std::function<void()>& check,
+               const std::function<void(const std::string& path, const FailedItem& item)>& failed) {
+  MovesUnderWay moves(failed);
+  std::vector<IndexedPath> page;
+  std::string after;
+  do {
+    check();
+    // What has moved lies before this page, so nothing need be committed for it to be right.
+    page = QueryBelow(id, path_old, after, kMovePage, Load::kPath);
+    if (!page.empty()) {
+      after = page.back().path;
+    }
+    Json::Value requests(Json::arrayValue);
+    std::vector<std::string> paths;
+    paths.reserve(page.size());
+    for (IndexedPath& document : page) {
+      const std::string moved = path + document.path.substr(path_old.size());
+      Json::Value item = MakeItem("document_set_by_id", id, document.path);
+      Json::Value& fields = item["data"]["data"];
+      fields[field::KAVOMDPath] = moved;
+      fields[field::KAVOMDParent] = fields[field::KAVOMDSearchAncestor] = Dirname(moved);
+      requests.append(std::move(item));
+      paths.push_back(std::move(document.path));
+    }
+    if (!paths.empty()) {
+      moves.Send(std::move(requests), std::move(paths));
+    }
+  } while (page.size() == kMovePage);
+  moves.AwaitAll();
+}
 
 }  // namespace
 
@@ -292,10 +335,7 @@ std::vector<FailedItem> SendList(Json::Value requests) {
   for (Json::ArrayIndex i = 0; i < results.size(); ++i) {
     const Json::Value& result = results[i];
     if (!result["success"].isBool() || !result["success"].asBool()) {
-      const Json::Value& code = result["error"]["code"];
-      const Json::Value& reason = result["error"]["msg"];
-      failed.push_back(
-          {i, code.isInt() ? code.asInt() : 0, reason.isString() ? reason.asString() : ""});
+      failed.push_back(FailureOf(i, result));
     }
   }
   return failed;
@@ -321,33 +361,36 @@ Json::Value MakeMove(const std::string& id, const std::string& path, const std::
 void MoveBelow(const std::string& id, const std::string& path, const std::string& path_old,
                const std::function<void()>& check,
                const std::function<void(const std::string& path, const FailedItem& item)>& failed) {
-  MovesUnderWay moves(failed);
-  std::vector<IndexedPath> page;
-  std::string after;
+  Json::Value request;
+  request["command"] = "document_move_below";
+  Json::Value& data = request["data"];
+  data["id"] = id;
+  data["from"] = path_old;
+  data["to"] = path;
+  data["folder_field"].append(field::KAVOMDParent);
+  data["folder_field"].append(field::KAVOMDSearchAncestor);
+  data["size"] = kMovesInRequest;
   do {
     check();
-    // What has moved lies before this page, so nothing need be committed for it to be right.
-    page = QueryBelow(id, path_old, after, kMovePage, Load::kPath);
-    if (!page.empty()) {
-      after = page.back().path;
+    Json::Value response;
+    try {
+      Send(&response, request);
+    } catch (const Error& error) {
+      if (error.GetErrorCode() != kNotKnown) {
+        throw;
+      }
+      MovePages(id, path, path_old, check, failed);
+      return;
     }
-    Json::Value requests(Json::arrayValue);
-    std::vector<std::string> paths;
-    paths.reserve(page.size());
-    for (IndexedPath& document : page) {
-      const std::string moved = path + document.path.substr(path_old.size());
-      Json::Value item = MakeItem("document_set_by_id", id, document.path);
-      Json::Value& fields = item["data"]["data"];
-      fields[field::KAVOMDPath] = moved;
-      fields[field::KAVOMDParent] = fields[field::KAVOMDSearchAncestor] = Dirname(moved);
-      requests.append(std::move(item));
-      paths.push_back(std::move(document.path));
+    const Json::Value& answer = response["data"];
+    VEXLO_CHECK(!answer.isObject() || !answer["failed"].isArray(), ERR_BAD_RESPONSE,
+                "the engine's reply has no list");
+    for (const Json::Value& item : answer["failed"]) {
+      const Json::Value& document = item["doc_id"];
+      failed(document.isString() ? document.asString() : "", FailureOf(0, item));
     }
-    if (!paths.empty()) {
-      moves.Send(std::move(requests), std::move(paths));
-    }
-  } while (page.size() == kMovePage);
-  moves.AwaitAll();
+    data["after"] = answer["after"];
+  } while (data["after"].isString());
 }
 
 }  // namespace vexlo::fileindexd

@@ -19,6 +19,9 @@ bool IsWrite(const std::string& command);
 // SqlError.
 void RunWrite(Writer& writer, const std::string& command, const Json::Value& data);
 
+// document_move_below, which IsWrite() leaves out: what it answers with. Throws as RunWrite() does.
+Json::Value MoveBelow(Writer& writer, const Json::Value& data);
+
 // document_get_by_query: the list of documents.
 Json::Value GetByQuery(Session& session, const Json::Value& data);
 

@@ -146,6 +146,14 @@ Json::Value Engine::Dispatch(const Json::Value& request) {
     NoteChange();
     return Success();
   }
+  if (command == "document_move_below") {
+    Json::Value answer;
+    WithStore(RequiredText(data, "id"), [&](Store& store) {
+      store.Write([&](Writer& writer, Session& /*session*/) { answer = MoveBelow(writer, data); });
+    });
+    NoteChange();
+    return WithData(std::move(answer));
+  }
   if (command == "document_get_by_query") {
     Json::Value hits;
     WithStore(RequiredText(data, "id"), [&](Store& store) {

@@ -1,6 +1,7 @@
 #include "daemons/kavoelasticd/writer.h"
 
 #include <algorithm>
+#include <map>
 #include <optional>
 #include <utility>
 #include <vector>
@@ -183,6 +184,92 @@ void Writer::Set(const std::string& doc_id, const Json::Value& data) {
     }
   }
   Apply(change);
+}
+
+// Whether a move to another folder changes no row of the document but its path: the fields that are
+// its folder are those, and are found by the path alone.
+bool Writer::FollowsPath(const Record& record, const std::vector<uint32_t>& folder_fields) {
+  size_t following = 0;
+  for (const Item& item : record.Items()) {
+    if (item.kind == Kind::kParent) {
+      const Field& field = session_.FieldOf(item.field);
+      const unsigned by_path = FoundByPath(field) ? static_cast<unsigned>(kExactTable) : 0;
+      if ((TablesOf(field) & ~by_path) != 0 || std::find(folder_fields.begin(), folder_fields.end(),
+                                                         item.field) == folder_fields.end()) {
+        return false;
+      }
+      ++following;
+    }
+  }
+  return following == folder_fields.size();
+}
+
+std::vector<Writer::Moving> Writer::ListMoving(const FolderMove& move) {
+  std::vector<uint32_t> fields;
+  fields.reserve(move.folder_fields.size());
+  bool all_known = true;  // A field without a number is in no document yet.
+  for (const std::string& name : move.folder_fields) {
+    const auto id = session_.IdOf(name);
+    all_known = all_known && id;
+    fields.push_back(id.value_or(0));
+  }
+  std::sort(fields.begin(), fields.end());
+  fields.erase(std::unique(fields.begin(), fields.end()), fields.end());
+  const std::string below = move.from + "/";
+  const std::string end = move.from + "0";  // What follows "/".
+  const std::string begin = move.after < below ? below : move.after + '\0';
+  Sql rows(session_.db,
+           "SELECT d.id, d.path, r.record FROM docs d CROSS JOIN records r ON r.id = d.id"
+           " WHERE d.path >= ? AND d.path < ? ORDER BY d.path LIMIT ?");
+  rows.Blob(begin).Blob(end).Int(static_cast<int64_t>(move.size));
+  std::vector<Moving> page;
+  while (rows.Row()) {
+    Moving moving = {rows.IntAt(0), rows.StringAt(1)};
+    const Record record = Record::Decode(rows.StringAt(2));
+    moving.follows_path = all_known && FollowsPath(record, fields);
+    moving.hash = sums_.HashOf(moving.path, record);
+    page.push_back(std::move(moving));
+  }
+  return page;
+}
+
+std::string Writer::MoveBelow(
+    const FolderMove& move,
+    const std::function<void(const std::string& path, const Failure&)>& refused) {
+  const std::vector<Moving> page = ListMoving(move);
+  if (page.empty()) {
+    return "";
+  }
+  std::map<size_t, Failure> failures;
+  const auto move_one = [&](size_t i) {
+    const std::string path = move.to + page[i].path.substr(move.from.size());
+    failures.erase(i);
+    if (page[i].follows_path) {
+      MoveRow(page[i].id, path);
+      sums_.Move(path, page[i].path, page[i].hash);
+      ++changes_;
+      return;
+    }
+    Json::Value data(Json::objectValue);
+    for (const std::string& name : move.folder_fields) {
+      data[name] = Dirname(path);
+    }
+    data[session_.schema.Key()] = path;
+    try {
+      Set(page[i].path, data);
+    } catch (const Failure& failure) {
+      if (!failure.IsAnswer()) {
+        throw;
+      }
+      failures.emplace(i, failure);
+    }
+  };
+  List(page.size(), move_one,
+       [&](size_t i, const Failure& failure) { failures.insert_or_assign(i, failure); });
+  for (const auto& [i, failure] : failures) {
+    refused(page[i].path, failure);
+  }
+  return page.size() < move.size ? "" : page.back().path;
 }
 
 void Writer::Delete(const std::string& doc_id) {
@@ -442,17 +529,21 @@ void Writer::WriteRows(Change& change, bool filters_differ) {
     docs.Int(change.after.id).Run();
   }
   if (moved) {
-    const auto move = [&] {
-      return Sql(db, "UPDATE docs SET path = ? WHERE id = ?")
-          .Blob(change.after.path)
-          .Int(change.after.id)
-          .RunUnlessTaken();
-    };
+    MoveRow(change.after.id, change.after.path);
+  }
+}
+
+void Writer::MoveRow(int64_t id, const std::string& path) {
+  const auto move = [&] {
+    return Sql(session_.db, "UPDATE docs SET path = ? WHERE id = ?")
+        .Blob(path)
+        .Int(id)
+        .RunUnlessTaken();
+  };
+  if (!move()) {
+    MakeRoom(path);
     if (!move()) {
-      MakeRoom(change.after.path);
-      if (!move()) {
-        throw Failure(Code::kInternal, "a path is taken by no document: " + change.after.path);
-      }
+      throw Failure(Code::kInternal, "a path is taken by no document: " + path);
     }
   }
 }

@@ -9,6 +9,7 @@
 #include <functional>
 #include <optional>
 #include <string>
+#include <vector>
 
 #include "daemons/kavoelasticd/folder_sums.h"
 #include "daemons/kavoelasticd/query.h"
@@ -16,6 +17,16 @@
 #include "daemons/kavoelasticd/text_batch.h"
 
 namespace vexlo::elasticd {
+
+// What was below one folder gets the same place below another one.
+struct FolderMove {
+  // Paths without a slash at the end. Neither folder lies in the other.
+  std::string from;
+  std::string to;
+  std::vector<std::string> folder_fields;  // Are set to the folder of the new path.
+  std::string after;                       // Only documents behind this path; "" for all.
+  size_t size = 0;                         // As many at most.
+};
 
 // - Changes gather in one transaction until Commit(). What was committed is on disk: the log is
 //   synced before Commit() returns. What was not is gone after a crash.
@@ -37,6 +48,12 @@ class Writer {
   void Set(const std::string& doc_id, const Json::Value& data);
   void Delete(const std::string& doc_id);
   size_t DeleteWhere(const Conditions& conditions);
+  // Does for each document below the folder, in the order of their paths, what a List() of Set()
+  // with its new path and folder does; `refused` gets the paths of those that do not move. The path
+  // of the last one that was looked at; "" when none is left behind it.
+  std::string MoveBelow(
+      const FolderMove& move,
+      const std::function<void(const std::string& path, const Failure&)>& refused);
 
   // Throws kLost when changes were rolled back before, once; what is left is committed even so.
   void Commit();
@@ -62,6 +79,12 @@ class Writer {
 
  private:
   struct Change;
+  struct Moving {
+    int64_t id;
+    std::string path;
+    bool follows_path = false;  // See FollowsPath().
+    uint64_t hash = 0;          // See FolderSums.
+  };
   void Begin();
   void ListOneByOne(size_t count, const std::function<void(size_t)>& item,
                     const std::function<void(size_t, const Failure&)>& refused);
@@ -82,6 +105,9 @@ class Writer {
   void WriteBodies(Change& change);
   void WriteExact(Change& change);
   void WriteRows(Change& change, bool filters_differ);
+  bool FollowsPath(const Record& record, const std::vector<uint32_t>& folder_fields);
+  std::vector<Moving> ListMoving(const FolderMove& move);
+  void MoveRow(int64_t id, const std::string& path);
   void MakeRoom(const std::string& path);
   void CheckRequired(const Json::Value& data, bool whole) const;
 

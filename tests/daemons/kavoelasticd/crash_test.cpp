@@ -216,6 +216,34 @@ TEST(Crash, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/v"}})"), "/v/0 /v/1 /v/3 /v/6 /v/before");
 }
 
+TEST(Crash, ADocumentWhoseMoveTheDatabaseRefusesStaysAlone) {
+  EngineFixture engine;
+  const SyslogCapture log;
+  // What says where it was is written anew.
+  for (const char* path : {"/v/a/1", "/v/a/bad", "/v/a/x", "/w/1"}) {
+    engine.Add(path,
+               R"({"KAVOMDTitle":"kept","Note":"/v/a","Quiet":")" + std::string(path) + "\"}");
+  }
+  engine.Do("index_pause");
+  sqlite3* db = nullptr;
+  ASSERT_EQ(sqlite3_open((engine.Folder() / "i/index.db").c_str(), &db), SQLITE_OK);
+  ASSERT_EQ(
+      sqlite3_exec(db,
+                   "CREATE TRIGGER refuse BEFORE UPDATE ON records WHEN instr(new.record, 'bad')"
+                   " BEGIN SELECT RAISE(ABORT, 'refused'); END",
+                   nullptr, nullptr, nullptr),
+      SQLITE_OK);
+  sqlite3_close(db);
+  engine.Do("index_resume");
+  const Json::Value answer = engine.Send(
+      "document_move_below",
+      Parsed(
+          R"({"from":"/v/a","to":"/w","folder_field":["KAVOMDParent","KAVOMDSearchAncestor"]})"));
+  ASSERT_EQ(answer["data"]["failed"].size(), 1U) << answer;
+  EXPECT_EQ(answer["data"]["failed"][0]["doc_id"], "/v/a/bad");
+  EXPECT_EQ(engine.Search(R"({"words":"kept","sort":"path"})"), "/v/a/bad /w/1 /w/x");
+}
+
 TEST(Crash, AChangeOfTheRegistryThatCannotBeWrittenChangesNothing) {
   EngineFixture engine;
   const SyslogCapture log;

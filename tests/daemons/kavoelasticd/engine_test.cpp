@@ -40,6 +40,7 @@ TEST(Engine, AnswersEveryRequest) {
   const char* const kDelete = "document_del_by_query";
   const char* const kUpsert = "document_upsert_by_id";
   const char* const kSet = "document_set_by_id";
+  const char* const kMove = "document_move_below";
   const std::string mappings = R"("mappings":{"property_id":"P",)";
   const struct {
     const char* name;
@@ -73,6 +74,15 @@ TEST(Engine, AnswersEveryRequest) {
        "2000"},
       {"SetMissing", kSet, R"({"doc_id":"/v/b","data":{}})", "2006"},
       {"SetPathToNothing", kSet, R"({"doc_id":"/v/a","data":{"KAVOMDPath":""}})", "2007"},
+      {"MoveWithoutPlace", kMove, R"({"from":"/v"})", "2000"},
+      {"MoveToItself", kMove, R"({"from":"/v","to":"/v"})", "2000"},
+      {"MoveIntoItself", kMove, R"({"from":"/v","to":"/v/w"})", "2000"},
+      {"MoveOutOfItself", kMove, R"({"from":"/v/w","to":"/v"})", "2000"},
+      {"MoveBelowASlash", kMove, R"({"from":"/v/","to":"/w"})", "2000"},
+      {"MoveNothingAtATime", kMove, R"({"from":"/v","to":"/w","size":0})", "2000"},
+      {"MoveTooMany", kMove, R"({"from":"/v","to":"/w","size":10001})", "2000"},
+      {"MoveFieldsAreNoList", kMove, R"({"from":"/v","to":"/w","folder_field":"x"})", "2000"},
+      {"MoveNothing", kMove, R"({"from":"/v/a","to":"/v/b"})", "ok"},
       {"NoDocument", kUpsert, R"({"doc_id":"/v/b"})", "2007"},
       {"SizeIsNoNumber", kUpsert, R"({"doc_id":"/v/b","data":{"KAVOMDFSSize":"big"}})", "2007"},
       {"DeleteMissingIsDone", "document_del_by_id", R"({"doc_id":"/v/b"})", "ok"},
@@ -162,6 +172,99 @@ TEST(Engine, SettingRemovesNullsAndTakesLists) {
             "ok");
   Check(engine, {{"Ancestor", R"({"term":{"KAVOMDSearchAncestor":"/v"}})", "/w/c"},
                  {"Name", R"({"term":{"KAVOMDFSName":"b"}})", "/w/c"}});
+}
+
+// Beside an index whose documents are moved one by one.
+TEST(Engine, MovingAFolderIsMovingEachDocumentInIt) {
+  const std::pair<const char*, const char*> documents[] = {
+      {"/v/a", "{}"},
+      {"/v/a!/beside", "{}"},
+      {"/v/a.txt", "{}"},
+      {"/v/a/0 replaces", R"({"KAVOMDTitle":"new"})"},
+      {"/v/a/1", R"({"KAVOMDTitle":"alpha"})"},
+      {"/v/a/b/2", R"({"Note":"/v/a/b"})"},  // Says where it was, and goes on to say so.
+      {"/v/a/b/3", R"({"KAVOMDSearchAncestor":"/elsewhere","KAVOMDIdentifier":"/v/a/b"})"},
+      {"/v/a/b/4", R"({"KAVOMDTitle":"/w/b"})"},
+      {"/v/a/bad\xff", R"({"KAVOMDTextContent":"beta"})"},
+      {"/v/a0", "{}"},
+      {"/w/0 replaces", R"({"KAVOMDTitle":"old"})"},
+      {"/w/b/stays", "{}"}};
+  for (const std::string extra : {"", "KAVOMDDisplayName", "Unheard of", "KAVOMDPath"}) {
+    SCOPED_TRACE(extra);
+    EngineFixture one_by_one;
+    EngineFixture at_once;
+    std::vector<std::string> fields = {"KAVOMDParent", "KAVOMDSearchAncestor"};
+    if (!extra.empty()) {
+      fields.push_back(extra);
+    }
+    Json::Value move = Parsed(R"({"from":"/v/a","to":"/w","size":3})");
+    for (const std::string& name : fields) {
+      move["folder_field"].append(name);
+    }
+    for (const auto& [path, more] : documents) {
+      one_by_one.Add(path, more);
+      at_once.Add(path, more);
+    }
+    for (const auto& [document, more] : documents) {
+      const std::string path = document;
+      if (path.starts_with("/v/a/")) {
+        const std::string to = "/w" + path.substr(4);
+        Json::Value data;
+        for (const std::string& name : fields) {
+          data[name] = to.substr(0, to.rfind('/'));
+        }
+        data["KAVOMDPath"] = to;
+        EXPECT_EQ(Answer(one_by_one.Send(WriteRequest("document_set_by_id", path, data))), "ok");
+      }
+    }
+    std::string portions;
+    do {
+      const Json::Value answer = at_once.Send("document_move_below", move)["data"];
+      EXPECT_EQ(answer["failed"], Json::Value(Json::arrayValue));
+      move["after"] = answer["after"];
+      portions += answer["after"].asString() + " ";
+    } while (move["after"].isString());
+    EXPECT_EQ(portions, "/v/a/b/2 /v/a/bad\xff  ");
+    for (const bool restarted : {false, true}) {
+      for (const std::string query :
+           {R"({"prefix":{"KAVOMDPath":"/"}})", R"({"term":{"KAVOMDParent":"/w/b"}})",
+            R"({"term":{"KAVOMDParent":"/v/a"}})", R"({"term":{"KAVOMDSearchAncestor":"/w"}})",
+            R"({"term":{"KAVOMDSearchAncestor":"/v/a"}})", R"({"term":{"Note":"v a b"}})",
+            R"({"term":{"KAVOMDIdentifier":"/v/a/b"}})", R"({"term":{"KAVOMDTitle":"new"}})",
+            R"({"term":{"KAVOMDTitle":"old"}})", R"({"term":{"KAVOMDDisplayName":"w b"}})"}) {
+        EXPECT_EQ(at_once.Documents(query, R"({"size":100})"),
+                  one_by_one.Documents(query, R"({"size":100})"))
+            << query;
+      }
+      for (const std::string search :
+           {R"({"words":"alpha"})", R"({"words":"beta"})", R"({"words":"b","sort":"path"})",
+            R"({"name":"replaces"})", R"({"below":"/w","sort":"path"})", R"({"below":"/v/a"})"}) {
+        EXPECT_EQ(at_once.Search(search), one_by_one.Search(search)) << search;
+      }
+      if (!restarted) {
+        at_once.Restart();
+      }
+    }
+  }
+}
+
+TEST(Engine, WhatCannotMoveIsToldAndStays) {
+  EngineFixture engine;
+  for (const char* path : {"/v/a/1", "/v/a/2", "/v/a/3"}) {
+    engine.Add(path);
+  }
+  // A folder is no number.
+  const Json::Value answer =
+      engine.Send("document_move_below",
+                  Parsed(R"({"from":"/v/a","to":"/w","size":2,"folder_field":["KAVOMDFSSize"]})"));
+  EXPECT_EQ(Answer(answer), "ok");
+  std::string failed;
+  for (const Json::Value& item : answer["data"]["failed"]) {
+    failed += item["doc_id"].asString() + " " + Answer(item) + " ";
+  }
+  EXPECT_EQ(failed, "/v/a/1 2007 /v/a/2 2007 ");
+  EXPECT_EQ(answer["data"]["after"], "/v/a/2");
+  EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/"}})"), "/v/a/1 /v/a/2 /v/a/3");
 }
 
 TEST(Engine, PathsAreBytes) {

@@ -68,21 +68,13 @@ struct DiskScan::Level {
   size_t next = 0;
 };
 
-DiskScan::DiskScan(const std::string& root, WalkRules rules, ContentRules content, uint64_t seed)
-    : rules_(std::move(rules)),
+DiskScan::DiskScan(std::string root, WalkRules rules, ContentRules content, uint64_t seed)
+    : root_(std::move(root)),
+      rules_(std::move(rules)),
       content_(std::move(content)),
       seed_(seed),
       buffer_(kBufferBytes),
-      thread_([this] { Work(); }) {
-  const bool may_enter = (rules_.covers(root) || rules_.leads(root)) && rules_.allows(root);
-  if (!may_enter) {
-    return;
-  }
-  const std::string above = Dirname(root);
-  const daemon::UniqueFd parent(
-      open(above.empty() ? "/" : above.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  Open(parent.Get(), Basename(root), root);
-}
+      thread_([this] { Work(); }) {}
 
 DiskScan::~DiskScan() {
   {
@@ -114,8 +106,22 @@ std::optional<ScannedFolder> DiskScan::Next() {
   }
 }
 
+void DiskScan::OpenRoot() {
+  if ((!rules_.covers(root_) && !rules_.leads(root_)) || !rules_.allows(root_)) {
+    return;
+  }
+  const std::string above = Dirname(root_);
+  const daemon::UniqueFd parent(
+      open(above.empty() ? "/" : above.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  Open(parent.Get(), Basename(root_), root_);
+}
+
 // False when nothing is left to be opened.
 bool DiskScan::WalkOn() {
+  if (!std::exchange(has_begun_, true)) {
+    OpenRoot();
+    return true;
+  }
   while (!levels_.empty()) {
     Level& level = levels_.back();
     if (level.next == level.below.size()) {

@@ -44,13 +44,14 @@ struct ScannedFolder {
 // follow, and the same is left out.
 class DiskScan {
  public:
-  DiskScan(const std::string& root, WalkRules rules, ContentRules content, uint64_t seed);
+  DiskScan(std::string root, WalkRules rules, ContentRules content, uint64_t seed);
   // Waits for what is under way.
   ~DiskScan();
   DiskScan(const DiskScan&) = delete;
   DiskScan& operator=(const DiskScan&) = delete;
 
   // The next folder, in the order of their keys as bytes: each right before those below it.
+  // Throws what the rules throw; it is not to be asked again then.
   std::optional<ScannedFolder> Next();
 
   // Whether it has ended early, as more folders wait than are to be kept in mind.
@@ -62,6 +63,7 @@ class DiskScan {
   struct Level;
   using FolderPtr = std::shared_ptr<Folder>;
 
+  void OpenRoot();
   void Open(int parent, const std::string& name, std::string path);
   void Read(const FolderPtr& folder);
   void Meet(const FolderPtr& folder, std::string_view name, unsigned type, Level* level,
@@ -73,10 +75,12 @@ class DiskScan {
   void LookAt(const Batch& batch, std::unique_lock<std::mutex>& lock);
   void Work();
 
+  const std::string root_;
   const WalkRules rules_;
   const ContentRules content_;
   const uint64_t seed_;
   std::vector<Level> levels_;
+  bool has_begun_ = false;
   size_t waiting_below_ = 0;  // Names in all levels.
   bool has_given_up_ = false;
   std::vector<char> buffer_;

@@ -25,7 +25,9 @@ constexpr size_t kMostWaiting = 200000;
 constexpr int kOpenFlags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
 
 // What the name of a batch is expected to be.
-enum Expected : char { kFile = 'f', kFolder = 'd', kFolderWithContent = 'D' };
+constexpr char kFile = 'f';
+constexpr char kFolder = 'd';
+constexpr char kFolderWithContent = 'D';
 
 daemon::EntryFacts FactsOf(const struct stat& info, bool content) {
   const Stamp stamp = StampOf(info, content, timespec{});
@@ -47,13 +49,13 @@ struct DiskScan::Folder {
   unsigned batches = 0;
 };
 
-// Names of one folder, each behind a byte of Expected and before a NUL.
+// Names of one folder, each behind one of these bytes and before a NUL.
 struct DiskScan::Batch {
   FolderPtr folder;
   std::string names = {};
   size_t count = 0;
 
-  void Add(Expected expected, std::string_view name) {
+  void Add(char expected, std::string_view name) {
     names += expected;
     names.append(name);
     names += '\0';

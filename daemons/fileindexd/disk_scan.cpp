@@ -70,11 +70,13 @@ struct DiskScan::Level {
   size_t next = 0;
 };
 
-DiskScan::DiskScan(std::string root, WalkRules rules, ContentRules content, uint64_t seed)
+DiskScan::DiskScan(std::string root, WalkRules rules, ContentRules content, uint64_t seed,
+                   std::function<void()> check)
     : root_(std::move(root)),
       rules_(std::move(rules)),
       content_(std::move(content)),
       seed_(seed),
+      check_(std::move(check)),
       buffer_(kBufferBytes),
       thread_([this] { Work(); }) {}
 
@@ -207,7 +209,8 @@ void DiskScan::Meet(const FolderPtr& folder, std::string_view name, unsigned typ
 
 void DiskScan::MeetFolder(const FolderPtr& folder, std::string path, Level* level, Batch* batch) {
   const bool is_covered = folder->is_covered || rules_.covers(path);
-  if (!(is_covered || rules_.leads(path)) || !rules_.allows(path)) {
+  if (level->below.size() > kMostWaiting || !(is_covered || rules_.leads(path)) ||
+      !rules_.allows(path)) {
     return;
   }
   if (is_covered && folder->contents) {
@@ -220,6 +223,7 @@ void DiskScan::MeetFolder(const FolderPtr& folder, std::string path, Level* leve
 
 // To whoever has time.
 void DiskScan::Hand(Batch batch) {
+  check_();
   if (batch.count == 0) {
     return;
   }

@@ -117,10 +117,47 @@ struct Differing {
   bool is_indexed;  // Whether the index had anything in it.
 };
 
-struct Differences {
-  std::vector<Differing> folders;  // In the order of their keys.
-  uint64_t same = 0;               // Entries of all others.
-  CrawlResult result;
+// What a comparison by digests comes to.
+class Differences {
+ public:
+  explicit Differences(const CrawlDeeds& deeds) : deeds_(deeds) {}
+
+  // In the order of their paths with "/" behind them.
+  void Meet(const ScannedFolder& folder, const IndexedFolder* indexed) {
+    const daemon::FolderDigest digest =
+        indexed == nullptr ? daemon::FolderDigest() : indexed->digest;
+    if (folder.error != 0) {
+      unknown_ = folder.path;
+      ++result_.unknown;
+      result_.last_error = folder.error;
+    } else if (!folder.is_whole || folder.digest != digest) {
+      Add(folder.path, indexed != nullptr);
+    } else {
+      same_ += digest.count;
+      deeds_.progress(same_, /*is_end=*/false);
+    }
+  }
+  void MeetIndexed(const IndexedFolder& folder) {
+    if (!unknown_ || !folder.path.starts_with(*unknown_)) {
+      Add(folder.path, /*is_indexed=*/true);
+    }
+  }
+
+  bool AreTooMany() const { return folders_.size() > kMostDiffering; }
+  const std::vector<Differing>& Folders() const { return folders_; }
+  uint64_t Same() const { return same_; }  // Entries of all other folders.
+  CrawlResult Result() const { return result_; }
+
+ private:
+  void Add(const std::string& path, bool is_indexed) {
+    folders_.push_back({path.substr(0, path.size() - 1), is_indexed});
+  }
+
+  const CrawlDeeds& deeds_;
+  std::vector<Differing> folders_;
+  std::optional<std::string> unknown_;  // The last folder that could not be read.
+  uint64_t same_ = 0;
+  CrawlResult result_;
 };
 
 // None where they are too many, or the index has nothing there.
@@ -128,47 +165,26 @@ std::optional<Differences> FindDifferences(const std::string& id, const std::str
                                            const WalkRules& rules, const ContentRules& content,
                                            const CrawlDeeds& deeds) {
   FolderListing listing(id, root);
-  auto indexed = listing.Next();
-  if (!indexed) {
+  std::optional<IndexedFolder> first = listing.Next();
+  if (!first) {
     return std::nullopt;
   }
-  DiskScan scan(root, rules, content, listing.Seed());
-  Differences found;
-  std::string unknown;  // Keys that begin so are of folders that could not be read.
-  const auto add = [&](std::string key, bool is_indexed) {
-    key.pop_back();
-    found.folders.push_back({std::move(key), is_indexed});
+  DiskScan scan(root, rules, content, listing.Seed(), deeds.check);
+  Differences found(deeds);
+  const auto next_on_disk = [&] { return found.AreTooMany() ? std::nullopt : scan.Next(); };
+  const auto next_indexed = [&] {
+    if (first) {
+      return std::exchange(first, std::nullopt);
+    }
+    return found.AreTooMany() ? std::nullopt : listing.Next();
   };
-  auto on_disk = scan.Next();
-  while ((on_disk || indexed) && found.folders.size() <= kMostDiffering) {
-    deeds.check();
-    const int order = !on_disk ? 1 : !indexed ? -1 : on_disk->key.compare(indexed->key);
-    if (order <= 0 && on_disk->error != 0) {
-      unknown = on_disk->key;
-      ++found.result.unknown;
-      found.result.last_error = on_disk->error;
-    } else if (order > 0) {
-      if (unknown.empty() || !indexed->key.starts_with(unknown)) {
-        add(indexed->key, /*is_indexed=*/true);
-      }
-    } else {
-      const daemon::FolderDigest digest = order == 0 ? indexed->digest : daemon::FolderDigest();
-      if (on_disk->is_whole && on_disk->digest == digest) {
-        found.same += digest.count;
-        deeds.progress(found.same, /*is_end=*/false);
-      } else {
-        add(on_disk->key, /*is_indexed=*/order == 0);
-      }
-    }
-    if (order <= 0) {
-      on_disk = scan.Next();
-    }
-    if (order >= 0) {
-      indexed = listing.Next();
-    }
-  }
-  const bool is_all = !scan.HasGivenUp() && found.folders.size() <= kMostDiffering;
-  return is_all ? std::optional(std::move(found)) : std::nullopt;
+  MergeByPath(
+      next_on_disk, next_indexed,
+      [&](const ScannedFolder& folder, const IndexedFolder* indexed) {
+        found.Meet(folder, indexed);
+      },
+      [&](const IndexedFolder& folder) { found.MeetIndexed(folder); });
+  return scan.HasGivenUp() || found.AreTooMany() ? std::nullopt : std::optional(std::move(found));
 }
 
 // The folder's own entry, and its own document.
@@ -220,9 +236,9 @@ std::optional<CrawlResult> CrawlDifferences(const std::string& id, CrawlPoint po
   rules.enters = false;
   for (;; point.pass = 2) {
     Pass pass(&point, deeds, /*keeps_place=*/false);
-    pass.CountDone(found->same);
+    pass.CountDone(found->Same());
     CompareRoot(pass, id, point.root, rules);
-    for (const Differing& folder : found->folders) {
+    for (const Differing& folder : found->Folders()) {
       deeds.check();
       if (!pass.IsGone(folder.path)) {
         CompareFolder(pass, id, folder, rules);
@@ -230,8 +246,8 @@ std::optional<CrawlResult> CrawlDifferences(const std::string& id, CrawlPoint po
     }
     if (!pass.End()) {
       CrawlResult result = pass.Result();
-      result.unknown += found->result.unknown;
-      result.last_error = result.last_error == 0 ? found->result.last_error : result.last_error;
+      result.unknown += found->Result().unknown;
+      result.last_error = result.last_error == 0 ? found->Result().last_error : result.last_error;
       return result;
     }
   }
@@ -251,7 +267,7 @@ void FolderListing::TakePage() {
   page_ = std::move(page.folders);
   next_ = 0;
   if (page_.size() == kPage) {
-    next_page_ = std::async(std::launch::async, ListFolders, id_, root_, page_.back().key, kPage);
+    next_page_ = std::async(std::launch::async, ListFolders, id_, root_, page_.back().path, kPage);
   }
 }
 

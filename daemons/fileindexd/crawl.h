@@ -65,7 +65,7 @@ class IndexListing {
 };
 
 // The folders at and below one whose digests the index has, page by page, in the order of their
-// keys; each page is asked for while the one before is gone through.
+// paths with "/" behind them; each page is asked for while the one before is gone through.
 class FolderListing {
  public:
   // Waits for the first page. Throws as ListFolders() does.

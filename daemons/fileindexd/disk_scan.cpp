@@ -25,7 +25,9 @@ constexpr size_t kMostWaiting = 200000;
 constexpr int kOpenFlags = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC;
 
 // What the name of a batch is expected to be.
-enum Expected : char { kFile = 'f', kFolder = 'd', kFolderWithContent = 'D' };
+constexpr char kFile = 'f';
+constexpr char kFolder = 'd';
+constexpr char kFolderWithContent = 'D';
 
 daemon::EntryFacts FactsOf(const struct stat& info, bool content) {
   const Stamp stamp = StampOf(info, content, timespec{});
@@ -47,13 +49,13 @@ struct DiskScan::Folder {
   unsigned batches = 0;
 };
 
-// Names of one folder, each behind a byte of Expected and before a NUL.
+// Names of one folder, each behind one of these bytes and before a NUL.
 struct DiskScan::Batch {
   FolderPtr folder;
   std::string names = {};
   size_t count = 0;
 
-  void Add(Expected expected, std::string_view name) {
+  void Add(char expected, std::string_view name) {
     names += expected;
     names.append(name);
     names += '\0';
@@ -68,21 +70,15 @@ struct DiskScan::Level {
   size_t next = 0;
 };
 
-DiskScan::DiskScan(const std::string& root, WalkRules rules, ContentRules content, uint64_t seed)
-    : rules_(std::move(rules)),
+DiskScan::DiskScan(std::string root, WalkRules rules, ContentRules content, uint64_t seed,
+                   std::function<void()> check)
+    : root_(std::move(root)),
+      rules_(std::move(rules)),
       content_(std::move(content)),
       seed_(seed),
+      check_(std::move(check)),
       buffer_(kBufferBytes),
-      thread_([this] { Work(); }) {
-  const bool may_enter = (rules_.covers(root) || rules_.leads(root)) && rules_.allows(root);
-  if (!may_enter) {
-    return;
-  }
-  const std::string above = Dirname(root);
-  const daemon::UniqueFd parent(
-      open(above.empty() ? "/" : above.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  Open(parent.Get(), Basename(root), root);
-}
+      thread_([this] { Work(); }) {}
 
 DiskScan::~DiskScan() {
   {
@@ -114,8 +110,22 @@ std::optional<ScannedFolder> DiskScan::Next() {
   }
 }
 
+void DiskScan::OpenRoot() {
+  if ((!rules_.covers(root_) && !rules_.leads(root_)) || !rules_.allows(root_)) {
+    return;
+  }
+  const std::string above = Dirname(root_);
+  const daemon::UniqueFd parent(
+      open(above.empty() ? "/" : above.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  Open(parent.Get(), Basename(root_), root_);
+}
+
 // False when nothing is left to be opened.
 bool DiskScan::WalkOn() {
+  if (!std::exchange(has_begun_, true)) {
+    OpenRoot();
+    return true;
+  }
   while (!levels_.empty()) {
     Level& level = levels_.back();
     if (level.next == level.below.size()) {
@@ -199,7 +209,8 @@ void DiskScan::Meet(const FolderPtr& folder, std::string_view name, unsigned typ
 
 void DiskScan::MeetFolder(const FolderPtr& folder, std::string path, Level* level, Batch* batch) {
   const bool is_covered = folder->is_covered || rules_.covers(path);
-  if (!(is_covered || rules_.leads(path)) || !rules_.allows(path)) {
+  if (level->below.size() > kMostWaiting || !(is_covered || rules_.leads(path)) ||
+      !rules_.allows(path)) {
     return;
   }
   if (is_covered && folder->contents) {
@@ -212,6 +223,7 @@ void DiskScan::MeetFolder(const FolderPtr& folder, std::string path, Level* leve
 
 // To whoever has time.
 void DiskScan::Hand(Batch batch) {
+  check_();
   if (batch.count == 0) {
     return;
   }

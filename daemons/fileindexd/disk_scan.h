@@ -32,7 +32,7 @@ struct ContentRules {
 };
 
 struct ScannedFolder {
-  std::string key;  // Its path with "/" behind it.
+  std::string path;  // With "/" behind it.
   daemon::FolderDigest digest;
   // Whether the digest stands for all that DiskWalk gives directly in the folder.
   bool is_whole = true;
@@ -44,13 +44,16 @@ struct ScannedFolder {
 // follow, and the same is left out.
 class DiskScan {
  public:
-  DiskScan(const std::string& root, WalkRules rules, ContentRules content, uint64_t seed);
+  // `check` is called every now and then, by Next() on its thread, and may throw to end the scan.
+  DiskScan(std::string root, WalkRules rules, ContentRules content, uint64_t seed,
+           std::function<void()> check);
   // Waits for what is under way.
   ~DiskScan();
   DiskScan(const DiskScan&) = delete;
   DiskScan& operator=(const DiskScan&) = delete;
 
-  // The next folder, in the order of their keys as bytes: each right before those below it.
+  // The next folder, in the order of their paths, with "/" behind them, as bytes: each right before
+  // those below it. Throws what the rules and the check throw; it is not to be asked again then.
   std::optional<ScannedFolder> Next();
 
   // Whether it has ended early, as more folders wait than are to be kept in mind.
@@ -62,6 +65,7 @@ class DiskScan {
   struct Level;
   using FolderPtr = std::shared_ptr<Folder>;
 
+  void OpenRoot();
   void Open(int parent, const std::string& name, std::string path);
   void Read(const FolderPtr& folder);
   void Meet(const FolderPtr& folder, std::string_view name, unsigned type, Level* level,
@@ -73,10 +77,13 @@ class DiskScan {
   void LookAt(const Batch& batch, std::unique_lock<std::mutex>& lock);
   void Work();
 
+  const std::string root_;
   const WalkRules rules_;
   const ContentRules content_;
   const uint64_t seed_;
+  const std::function<void()> check_;
   std::vector<Level> levels_;
+  bool has_begun_ = false;
   size_t waiting_below_ = 0;  // Names in all levels.
   bool has_given_up_ = false;
   std::vector<char> buffer_;

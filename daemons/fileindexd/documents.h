@@ -38,7 +38,7 @@ std::vector<IndexedPath> ListIn(const std::string& id, const std::string& folder
 
 // What stands directly in each folder, as the index has it.
 struct IndexedFolder {
-  std::string key;  // Its path with "/" behind it.
+  std::string path;  // With "/" behind it.
   daemon::FolderDigest digest;
 };
 struct FolderPage {
@@ -46,8 +46,8 @@ struct FolderPage {
   std::vector<IndexedFolder> folders;
 };
 
-// Up to `count` of the folders at and below `folder` with documents in them, those behind the key
-// `after` ("" for the first ones), in the order of their keys as bytes.
+// Up to `count` of the folders at and below `folder` with documents in them, those behind the path
+// `after` ("" for the first ones), in the order of their paths, with "/" behind them, as bytes.
 FolderPage ListFolders(const std::string& id, const std::string& folder, const std::string& after,
                        unsigned count);
 

@@ -158,19 +158,18 @@ TEST(DiskScan, AddsUpWhatTheWalkGives) {
              wants(entry->path)}));
       }
     }
-    vexlo::fileindexd::DiskScan scan(
-        folder.Path(), rules, {wants, [&](const std::string&) { return std::optional(by_type); }},
-        seed);
+    const auto in = [&](const std::string&) { return std::optional(by_type); };
+    vexlo::fileindexd::DiskScan scan(folder.Path(), rules, {wants, in}, seed, [] {});
     std::map<std::string, vexlo::daemon::FolderDigest> got;
     std::string last;
     while (const auto each = scan.Next()) {
-      EXPECT_GT(each->key, last);
-      last = each->key;
+      EXPECT_GT(each->path, last);
+      last = each->path;
       EXPECT_EQ(each->error, 0);
       // Of a folder that is not covered itself nobody knows what is.
-      EXPECT_EQ(each->is_whole, covers(each->key.substr(0, each->key.size() - 1))) << each->key;
+      EXPECT_EQ(each->is_whole, covers(each->path.substr(0, each->path.size() - 1))) << each->path;
       if (each->digest.count > 0 && each->is_whole) {
-        got[each->key] = each->digest;
+        got[each->path] = each->digest;
       }
     }
     std::erase_if(want, [&](const auto& each) { return each.first == folder / "b/"; });
@@ -190,14 +189,14 @@ TEST(DiskScan, TellsWhatCouldNotBeLookedAt) {
       {"getdents64", 1, "/?"}, {"getdents64", 3, "/ /a/? /b/"}, {"fstatat", 1, "/- /a/ /b/"}};
   for (const auto& c : cases) {
     const ScopedFault fault(c.function, EIO, c.nth);
-    vexlo::fileindexd::DiskScan scan(
-        folder.Path(), Everything(),
-        {[](const std::string&) { return true; },
-         [](const std::string&) { return std::optional(vexlo::fileindexd::ContentByType{}); }},
-        0);
+    const auto wants = [](const std::string&) { return true; };
+    const auto in = [](const std::string&) {
+      return std::optional(vexlo::fileindexd::ContentByType{});
+    };
+    vexlo::fileindexd::DiskScan scan(folder.Path(), Everything(), {wants, in}, 0, [] {});
     std::string got;
     while (const auto each = scan.Next()) {
-      got += (got.empty() ? "" : " ") + each->key.substr(folder.Path().size()) +
+      got += (got.empty() ? "" : " ") + each->path.substr(folder.Path().size()) +
              (each->error == EIO ? "?"
               : each->is_whole   ? ""
                                  : "-");

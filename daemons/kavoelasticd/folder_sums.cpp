@@ -121,20 +121,25 @@ const char kMakeFolderSums[] =
     "CREATE TABLE folders(path BLOB PRIMARY KEY, count INTEGER NOT NULL, sum INTEGER NOT NULL)"
     " WITHOUT ROWID;";
 
-uint64_t FolderSums::HashOf(const StoredDocument& document) {
+uint64_t FolderSums::HashOf(const std::string& path, const Record& record) {
   if (!seed_) {
     seed_ = SeedOf(session_.db);
   }
-  return daemon::EntryHash(*seed_, NameOf(document.path), FactsOf(session_, document.record));
+  return daemon::EntryHash(*seed_, NameOf(path), FactsOf(session_, record));
 }
 
 void FolderSums::Change(const StoredDocument& before, const StoredDocument& after) {
   if (!before.path.empty()) {
-    changes_[KeyOf(before.path)].Remove(HashOf(before));
+    changes_[KeyOf(before.path)].Remove(HashOf(before.path, before.record));
   }
   if (!after.path.empty()) {
-    changes_[KeyOf(after.path)].Add(HashOf(after));
+    changes_[KeyOf(after.path)].Add(HashOf(after.path, after.record));
   }
+}
+
+void FolderSums::Move(const std::string& path_old, const std::string& path, uint64_t hash) {
+  changes_[KeyOf(path_old)].Remove(hash);
+  changes_[KeyOf(path)].Add(hash);
 }
 
 void FolderSums::Write() {

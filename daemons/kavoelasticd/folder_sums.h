@@ -24,8 +24,13 @@ class FolderSums {
   // The session may write, and outlives this.
   explicit FolderSums(Session& session) : session_(session) {}
 
+  // The hash of the document in its folder.
+  uint64_t HashOf(const std::string& path, const Record& record);
+
   // The documents `before` and `after` stand for each other; one without a path is none.
   void Change(const StoredDocument& before, const StoredDocument& after);
+  // A document with this hash keeps its name and fields, and gets another folder.
+  void Move(const std::string& path_old, const std::string& path, uint64_t hash);
 
   // Throws what the database answers.
   void Write();
@@ -33,8 +38,6 @@ class FolderSums {
   void Clear() { changes_.clear(); }
 
  private:
-  uint64_t HashOf(const StoredDocument& document);
-
   Session& session_;
   std::optional<uint64_t> seed_;
   std::unordered_map<std::string, daemon::FolderDigest> changes_;  // By keys, see KeyOf().

@@ -246,7 +246,7 @@ std::string Writer::MoveBelow(
     failures.erase(i);
     if (page[i].follows_path) {
       MoveRow(page[i].id, path);
-      sums_.Move(path, page[i].path, page[i].hash);
+      sums_.Move(page[i].path, path, page[i].hash);
       ++changes_;
       return;
     }

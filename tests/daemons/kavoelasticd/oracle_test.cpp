@@ -7,6 +7,7 @@
 #include <map>
 #include <random>
 #include <string>
+#include <vector>
 
 #include "daemons/common/entry_digest.h"
 #include "daemons/kavoelasticd/engine_fixture.h"
@@ -206,7 +207,34 @@ class Oracle {
     }
   }
 
+  void MoveFolder(const std::string& from, const std::string& to) {
+    if (from == to) {
+      return;
+    }
+    Json::Value data = Parsed(R"({"folder_field":["KAVOMDParent"]})");
+    data["from"] = from;
+    data["to"] = to;
+    EXPECT_EQ(Answer(engine_.Send("document_move_below", data)), "ok");
+    std::vector<std::string> below;
+    for (const auto& [path, document] : documents_) {
+      if (path.starts_with(from + "/")) {
+        below.push_back(path);
+      }
+    }
+    for (const std::string& path : below) {
+      const std::string moved = to + path.substr(from.size());
+      data = Json::Value();
+      data["KAVOMDPath"] = moved;
+      data["KAVOMDParent"] = moved.substr(0, moved.rfind('/'));
+      Merge(path, data);
+    }
+  }
+
   void Other(const std::string& path) {
+    if (random_() % 4 == 0) {
+      const std::string folders[] = {"/a", "/b", "/c"};
+      MoveFolder(folders[random_() % 3], folders[random_() % 3]);
+    }
     if (random_() % 4 == 0) {
       engine_.Restart();
     }

@@ -5,12 +5,13 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <filesystem>
 #include <string_view>
+#include <system_error>
 #include <utility>
 
 #include "common/check.h"
 #include "common/error.h"
+#include "daemons/common/folders.h"
 #include "daemons/common/log.h"
 
 namespace vexlo::evnotifyd {
@@ -30,10 +31,9 @@ Monitor::Monitor(const FeederOptions& options)
       folder_(kavo::local::MonitorQueuesFolder()),
       registrations_(inotify_init1(IN_NONBLOCK | IN_CLOEXEC)),
       mounts_(open("/proc/self/mountinfo", O_RDONLY | O_CLOEXEC)) {
-  std::error_code error;
-  std::filesystem::create_directories(folder_, error);
-  VEXLO_CHECK(static_cast<bool>(error), ERR_SYSTEM,
-              "the folder cannot be made, path=" + folder_ + ", reason=" + error.message());
+  VEXLO_CHECK(!daemon::MakeFolders(folder_), ERR_SYSTEM,
+              "the folder cannot be made, path=" + folder_ +
+                  ", reason=" + std::generic_category().message(errno));
   WatchFolder();
   Read();
   thread_ = std::jthread([this](const std::stop_token& stop) { Run(stop); });
@@ -78,8 +78,7 @@ void Monitor::Run(const std::stop_token& stop) {
 // The folder is made anew when somebody has removed it; where it was watched before, nothing
 // changes.
 void Monitor::WatchFolder() {
-  std::error_code error;
-  std::filesystem::create_directories(folder_, error);
+  daemon::MakeFolders(folder_);
   const bool was_watched = std::exchange(
       folder_watched_, inotify_add_watch(registrations_.Get(), folder_.c_str(), kFolderMask) >= 0);
   if (!folder_watched_ && was_watched) {

@@ -11,6 +11,7 @@
 #include "common/check.h"
 #include "common/file.h"
 #include "common/json.h"
+#include "daemons/common/folders.h"
 #include "daemons/common/log.h"
 
 namespace vexlo::extractd {
@@ -57,7 +58,9 @@ ContentKey KeyOf(const struct stat& info) {
 
 Quarantine::Quarantine(std::string file, size_t most) : file_(std::move(file)), most_(most) {
   const std::filesystem::path folder = std::filesystem::path(file_).parent_path();
-  std::filesystem::create_directories(folder);
+  if (!daemon::MakeFolders(folder)) {
+    throw std::system_error(errno, std::generic_category(), "cannot be made: " + folder.string());
+  }
   std::filesystem::permissions(folder, std::filesystem::perms::owner_all);
   if (!Load()) {
     entries_.clear();

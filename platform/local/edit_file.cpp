@@ -66,6 +66,14 @@ std::string FolderOf(const std::string& file) {
   return slash == std::string::npos ? "." : file.substr(0, std::max<size_t>(slash, 1));
 }
 
+void SyncFolder(const std::string& folder) {
+  const ScopedFd fd(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (fd.Get() < 0 || fsync(fd.Get()) != 0) {
+    ThrowSystem(folder,
+                "the change is made but may not outlive a power failure, as fsync of the folder");
+  }
+}
+
 void MakeFolders(const std::string& folder) {
   for (size_t end = 0; end != std::string::npos;) {
     end = folder.find('/', end + 1);
@@ -77,6 +85,8 @@ void MakeFolders(const std::string& folder) {
         errno = error;
         ThrowSystem(part, "mkdir");
       }
+    } else {
+      SyncFolder(FolderOf(part));
     }
   }
 }
@@ -134,12 +144,7 @@ void ReplaceWhole(const std::string& file, std::string_view text) {
   if (rename(path.c_str(), file.c_str()) != 0) {
     ThrowSystem(file, "rename");
   }
-  const std::string folder = FolderOf(file);
-  const ScopedFd folder_fd(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (folder_fd.Get() < 0 || fsync(folder_fd.Get()) != 0) {
-    ThrowSystem(file,
-                "the change is made but may not outlive a power failure, as fsync of the folder");
-  }
+  SyncFolder(FolderOf(file));
 }
 
 }  // namespace kavo::local

@@ -430,7 +430,9 @@ void Engine::IndexConfigSet(const Json::Value& data) {
   // With nothing at the old place, whoever moved the share has moved the database with it.
   if (entry.path != from && Exists(DatabaseFile(from))) {
     MakeFolders(entry.path);
+    // For good before the registry tells of the move: a database that stands there counts as moved.
     RemoveDatabase(entry.path);
+    SyncFolder(entry.path);
     RegistryEntry moving = slot->entry;
     moving.move_to = entry.path;
     {

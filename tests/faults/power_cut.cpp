@@ -222,29 +222,29 @@ DiskState PowerCut::After(size_t count, Survives survives, uint32_t seed) const 
 
 // NOLINTBEGIN(bugprone-macro-parentheses): these are types.
 // A function that does `after` with the `result` where it has not failed.
-#define RECORDED(type, name, parameters, arguments, after)              \
-  INTERPOSED type name parameters {                                     \
-    static const auto real = REAL_FUNCTION(type, name, parameters);     \
-    const std::lock_guard lock(mutex);                                  \
-    const type result = real arguments;                                 \
-    if (result >= 0 && current != nullptr) {                            \
-      after;                                                            \
-    }                                                                   \
-    return result;                                                      \
+#define RECORDED(type, name, parameters, arguments, after)          \
+  INTERPOSED type name parameters {                                 \
+    static const auto real = REAL_FUNCTION(type, name, parameters); \
+    const std::lock_guard lock(mutex);                              \
+    const type result = real arguments;                             \
+    if (result >= 0 && current != nullptr) {                        \
+      after;                                                        \
+    }                                                               \
+    return result;                                                  \
   }
-#define OPEN(name, before, known)                                                        \
-  INTERPOSED int name(before const char* path, int flags, ...) {                         \
-    static const auto real = REAL_FUNCTION(int, name, (before const char*, int, ...));   \
-    va_list more;                                                                        \
-    va_start(more, flags);                                                               \
-    const auto mode = va_arg(more, mode_t);                                              \
-    va_end(more);                                                                        \
-    const std::lock_guard lock(mutex);                                                   \
-    const int fd = real(known path, flags, mode);                                        \
-    if (fd >= 0 && current != nullptr) {                                                 \
-      Recorder::Opened(fd, flags);                                                       \
-    }                                                                                    \
-    return fd;                                                                           \
+#define OPEN(name, before, known)                                                      \
+  INTERPOSED int name(before const char* path, int flags, ...) {                       \
+    static const auto real = REAL_FUNCTION(int, name, (before const char*, int, ...)); \
+    va_list more;                                                                      \
+    va_start(more, flags);                                                             \
+    const auto mode = va_arg(more, mode_t);                                            \
+    va_end(more);                                                                      \
+    const std::lock_guard lock(mutex);                                                 \
+    const int fd = real(known path, flags, mode);                                      \
+    if (fd >= 0 && current != nullptr) {                                               \
+      Recorder::Opened(fd, flags);                                                     \
+    }                                                                                  \
+    return fd;                                                                         \
   }
 #define NOTHING
 #define FOLDER int folder,
@@ -265,8 +265,7 @@ RECORDED(ssize_t, write, (int fd, const void* data, size_t size), (fd, data, siz
 RECORDED(ssize_t, pwrite, (int fd, const void* data, size_t size, off_t at), (fd, data, size, at),
          Recorder::Changed(fd, Kind::kWrite, static_cast<size_t>(at), BYTES))
 RECORDED(ssize_t, pwrite64, (int fd, const void* data, size_t size, off64_t at),
-         (fd, data, size, at),
-         Recorder::Changed(fd, Kind::kWrite, static_cast<size_t>(at), BYTES))
+         (fd, data, size, at), Recorder::Changed(fd, Kind::kWrite, static_cast<size_t>(at), BYTES))
 RECORDED(int, ftruncate, (int fd, off_t size) noexcept, (fd, size),
          Recorder::Changed(fd, Kind::kResize, static_cast<size_t>(size)))
 RECORDED(int, ftruncate64, (int fd, off64_t size) noexcept, (fd, size),

@@ -26,7 +26,17 @@ void WriteDisk(const std::string& folder, const DiskState& state);
 
 // One change, in the order in which they were made.
 struct DiskOp {
-  enum class Kind { kWrite, kResize, kSync, kMake, kMakeFolder, kRename, kRemove, kSyncFolder, kNote };
+  enum class Kind {
+    kWrite,
+    kResize,
+    kSync,
+    kMake,
+    kMakeFolder,
+    kRename,
+    kRemove,
+    kSyncFolder,
+    kNote
+  };
   Kind kind;
   int file = 0;  // The number of a file, whatever its name is; of kNote, what was noted.
   size_t at = 0;

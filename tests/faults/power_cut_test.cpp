@@ -272,8 +272,8 @@ void TakeDocumentStep(Engine& engine, int step) {
     Json::Value more;
     more["KAVOMDTextContent"] = text;
     const std::string path = Document(step, number);
-    engine.Handle(WriteRequest("document_upsert_by_id", path,
-                               MakeDocument(path, vexlo::JsonToString(more))));
+    engine.Handle(
+        WriteRequest("document_upsert_by_id", path, MakeDocument(path, vexlo::JsonToString(more))));
   }
   if (step > 2) {
     engine.Handle(RenameRequest(Document(step - 1, 0), "/moved" + Document(step - 1, 0)));
@@ -294,6 +294,7 @@ void TakeDocumentStep(Engine& engine, int step) {
 
 int ReadDocumentSteps() {
   Engine engine(kState + "/elastic/indexes.json");
+  Send(engine, "index_resume", Json::Value(Json::objectValue));  // It may be paused.
   const auto paths = Documents(engine);
   if (!paths) {
     return engine.Handle(Parsed(R"({"command":"index_list"})"))["data"].empty() ? 0 : -1;

@@ -127,7 +127,7 @@ void Monitor::Read() {
   }
   std::vector<Queue> ended;
   {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     for (auto queue = queues_.begin(); queue != queues_.end();) {
       const bool stays =
           wanted.count(queue->first) != 0 || unreadable_.count(queue->second.registered.app) != 0;
@@ -160,12 +160,16 @@ void Monitor::Stop(std::vector<Queue> queues, bool discard) {
 // What is watched on the way comes first: a root that comes between the two is seen by both.
 void Monitor::CheckRoots() {
   std::set<std::string> roots;
-  for (const auto& [key, queue] : queues_) {
-    for (const kavo::local::MonitoredFolder& folder : queue.registered.folders) {
-      roots.insert(folder.path);
+  {
+    const kavo::local::MutexLock lock(mutex_);
+    for (const auto& [key, queue] : queues_) {
+      for (const kavo::local::MonitoredFolder& folder : queue.registered.folders) {
+        roots.insert(folder.path);
+      }
     }
   }
   root_paths_.Set(roots);
+  const kavo::local::MutexLock lock(mutex_);
   for (const auto& [key, queue] : queues_) {
     queue.watch->CheckRoots();
   }
@@ -173,7 +177,7 @@ void Monitor::CheckRoots() {
 
 Json::Value Monitor::Stats() const {
   Json::Value queues(Json::arrayValue);
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   for (const auto& [key, queue] : queues_) {
     const QueueStats stats = queue.watch->Stats();
     Json::Value value(Json::objectValue);

@@ -134,7 +134,7 @@ void Quarantine::Put(Entry entry) {
 }
 
 std::optional<Fault> Quarantine::Find(const ContentKey& key) {
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   const auto found = by_file_.find({key.device, key.inode});
   if (found == by_file_.end()) {
     return std::nullopt;
@@ -149,14 +149,14 @@ std::optional<Fault> Quarantine::Find(const ContentKey& key) {
 
 void Quarantine::Add(const ContentKey& key, const Fault& fault, const std::string& path) {
   const auto now = std::chrono::system_clock::now().time_since_epoch();
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   Put({key, fault.Reason(), fault.what(), path,
        std::chrono::duration_cast<std::chrono::seconds>(now).count()});
   Save();
 }
 
 size_t Quarantine::Size() {
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   return entries_.size();
 }
 

@@ -38,6 +38,11 @@ int OpenLock(const std::string& path) {
   return fd;
 }
 
+bool SyncFolder(const std::string& folder) {
+  const ScopedFd fd(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  return fd.Get() >= 0 && fsync(fd.Get()) == 0;
+}
+
 }  // namespace
 
 bool IsNormalised(std::string_view path) {
@@ -66,14 +71,6 @@ std::string FolderOf(const std::string& file) {
   return slash == std::string::npos ? "." : file.substr(0, std::max<size_t>(slash, 1));
 }
 
-void SyncFolder(const std::string& folder) {
-  const ScopedFd fd(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (fd.Get() < 0 || fsync(fd.Get()) != 0) {
-    ThrowSystem(folder,
-                "the change is made but may not outlive a power failure, as fsync of the folder");
-  }
-}
-
 void MakeFolders(const std::string& folder) {
   for (size_t end = 0; end != std::string::npos;) {
     end = folder.find('/', end + 1);
@@ -85,8 +82,8 @@ void MakeFolders(const std::string& folder) {
         errno = error;
         ThrowSystem(part, "mkdir");
       }
-    } else {
-      SyncFolder(FolderOf(part));
+    } else if (!SyncFolder(FolderOf(part))) {
+      ThrowSystem(part, "fsync of the folder above");
     }
   }
 }
@@ -144,7 +141,10 @@ void ReplaceWhole(const std::string& file, std::string_view text) {
   if (rename(path.c_str(), file.c_str()) != 0) {
     ThrowSystem(file, "rename");
   }
-  SyncFolder(FolderOf(file));
+  if (!SyncFolder(FolderOf(file))) {
+    ThrowSystem(file,
+                "the change is made but may not outlive a power failure, as fsync of the folder");
+  }
 }
 
 }  // namespace kavo::local

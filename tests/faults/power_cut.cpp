@@ -81,6 +81,10 @@ struct Recorder {
       Add({Kind::kSyncFolder, 0, 0, "", path});
     }
   }
+  static void Wrote(int fd, off_t at, const void* data, ssize_t size) {
+    Changed(fd, Kind::kWrite, static_cast<size_t>(at),
+            std::string(static_cast<const char*>(data), static_cast<size_t>(size)));
+  }
   static void Renamed(const std::string& from, const std::string& to) {
     if (Knows(from) && FileAt(from) >= 0) {
       const int file = current->files_.extract(from).mapped();
@@ -142,8 +146,11 @@ void PowerCut::Note(int number) {
   ops_.push_back({Kind::kNote, number});
 }
 
-std::vector<bool> PowerCut::Surviving(size_t count, Survives survives, uint32_t seed,
-                                      std::vector<DiskOp>& ops) const {
+namespace {
+
+// Which of the operations survive; cuts the last write of kSome.
+std::vector<bool> Surviving(std::vector<DiskOp>& ops, Survives survives, uint32_t seed) {
+  const size_t count = ops.size();
   std::vector<bool> is_there(count, survives == Survives::kAll);
   std::set<int> synced;
   std::set<std::string> synced_folders;
@@ -151,7 +158,7 @@ std::vector<bool> PowerCut::Surviving(size_t count, Survives survives, uint32_t 
   std::map<std::string, bool> ends;  // Whether later entries of a folder are gone.
   size_t torn = count;
   for (size_t i = count; i-- > 0 && survives != Survives::kAll;) {
-    const DiskOp& op = ops_[i];
+    const DiskOp& op = ops[i];
     if (op.kind == Kind::kSync) {
       synced.insert(op.file);
     } else if (op.kind == Kind::kSyncFolder) {
@@ -177,9 +184,11 @@ std::vector<bool> PowerCut::Surviving(size_t count, Survives survives, uint32_t 
   return is_there;
 }
 
+}  // namespace
+
 DiskState PowerCut::After(size_t count, Survives survives, uint32_t seed) const {
   std::vector<DiskOp> ops(ops_.begin(), ops_.begin() + static_cast<ptrdiff_t>(count));
-  const std::vector<bool> is_there = Surviving(count, survives, seed, ops);
+  const std::vector<bool> is_there = Surviving(ops, survives, seed);
   std::map<int, std::string> contents = contents_;
   std::map<std::string, int> names;
   for (const auto& [path, content] : before_.files) {
@@ -221,7 +230,7 @@ DiskState PowerCut::After(size_t count, Survives survives, uint32_t seed) const 
 // --- The C library's functions
 
 // NOLINTBEGIN(bugprone-macro-parentheses): these are types.
-// A function that does `after` with the `result` where it has not failed.
+// A function that does `after` with its `result` where it has not failed.
 #define RECORDED(type, name, parameters, arguments, after)          \
   INTERPOSED type name parameters {                                 \
     static const auto real = REAL_FUNCTION(type, name, parameters); \
@@ -232,40 +241,29 @@ DiskState PowerCut::After(size_t count, Survives survives, uint32_t seed) const 
     }                                                               \
     return result;                                                  \
   }
-#define OPEN(name, before, known)                                                      \
-  INTERPOSED int name(before const char* path, int flags, ...) {                       \
-    static const auto real = REAL_FUNCTION(int, name, (before const char*, int, ...)); \
-    va_list more;                                                                      \
-    va_start(more, flags);                                                             \
-    const auto mode = va_arg(more, mode_t);                                            \
-    va_end(more);                                                                      \
-    const std::lock_guard lock(mutex);                                                 \
-    const int fd = real(known path, flags, mode);                                      \
-    if (fd >= 0 && current != nullptr) {                                               \
-      Recorder::Opened(fd, flags);                                                     \
-    }                                                                                  \
-    return fd;                                                                         \
+#define OPEN(name)                                                              \
+  INTERPOSED int name(const char* path, int flags, ...) {                       \
+    static const auto real = REAL_FUNCTION(int, name, (const char*, int, ...)); \
+    va_list more;                                                               \
+    va_start(more, flags);                                                      \
+    const auto mode = va_arg(more, mode_t);                                     \
+    va_end(more);                                                               \
+    const std::lock_guard lock(mutex);                                          \
+    const int fd = real(path, flags, mode);                                     \
+    if (fd >= 0 && current != nullptr) {                                        \
+      Recorder::Opened(fd, flags);                                              \
+    }                                                                           \
+    return fd;                                                                  \
   }
-#define NOTHING
-#define FOLDER int folder,
-#define FOLDER_ARGUMENT folder,
 // NOLINTEND(bugprone-macro-parentheses)
-OPEN(open, NOTHING, NOTHING)
-OPEN(open64, NOTHING, NOTHING)
-OPEN(openat, FOLDER, FOLDER_ARGUMENT)
-OPEN(openat64, FOLDER, FOLDER_ARGUMENT)
+OPEN(open)
+OPEN(open64)
 RECORDED(int, mkostemp, (char* path, int flags), (path, flags), Recorder::Opened(result, O_CREAT))
-RECORDED(int, mkostemp64, (char* path, int flags), (path, flags), Recorder::Opened(result, O_CREAT))
-
-#define BYTES std::string(static_cast<const char*>(data), static_cast<size_t>(result))
 // The offset behind what was written tells where, with O_APPEND too.
 RECORDED(ssize_t, write, (int fd, const void* data, size_t size), (fd, data, size),
-         Recorder::Changed(fd, Kind::kWrite, static_cast<size_t>(lseek(fd, 0, SEEK_CUR) - result),
-                           BYTES))
-RECORDED(ssize_t, pwrite, (int fd, const void* data, size_t size, off_t at), (fd, data, size, at),
-         Recorder::Changed(fd, Kind::kWrite, static_cast<size_t>(at), BYTES))
+         Recorder::Wrote(fd, lseek(fd, 0, SEEK_CUR) - result, data, result))
 RECORDED(ssize_t, pwrite64, (int fd, const void* data, size_t size, off64_t at),
-         (fd, data, size, at), Recorder::Changed(fd, Kind::kWrite, static_cast<size_t>(at), BYTES))
+         (fd, data, size, at), Recorder::Wrote(fd, at, data, result))
 RECORDED(int, ftruncate, (int fd, off_t size) noexcept, (fd, size),
          Recorder::Changed(fd, Kind::kResize, static_cast<size_t>(size)))
 RECORDED(int, ftruncate64, (int fd, off64_t size) noexcept, (fd, size),
@@ -273,8 +271,6 @@ RECORDED(int, ftruncate64, (int fd, off64_t size) noexcept, (fd, size),
 RECORDED(int, rename, (const char* from, const char* to) noexcept, (from, to),
          Recorder::Renamed(from, to))
 RECORDED(int, unlink, (const char* path) noexcept, (path), Recorder::Removed(path))
-RECORDED(int, unlinkat, (int folder, const char* path, int flags) noexcept, (folder, path, flags),
-         Recorder::Removed(path[0] == '/' ? path : PathOf(folder) + "/" + path))
 RECORDED(int, rmdir, (const char* path) noexcept, (path), Recorder::Removed(path))
 RECORDED(int, mkdir, (const char* path, mode_t mode) noexcept, (path, mode),
          Recorder::Knows(path) ? Recorder::Add({Kind::kMakeFolder, 0, 0, "", path}) : void())

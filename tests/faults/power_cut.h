@@ -71,8 +71,6 @@ class PowerCut {
 
  private:
   friend struct Recorder;
-  std::vector<bool> Surviving(size_t count, Survives survives, uint32_t seed,
-                              std::vector<DiskOp>& ops) const;
 
   const std::string folder_;
   DiskState before_;

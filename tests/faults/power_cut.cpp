@@ -19,7 +19,7 @@ namespace {
 namespace fs = std::filesystem;
 using Kind = DiskOp::Kind;
 
-std::recursive_mutex mutex;
+std::mutex mutex;
 PowerCut* current = nullptr;
 
 bool IsKept(const std::string& path) { return !path.ends_with("-shm"); }
@@ -31,18 +31,66 @@ std::string PathOf(int fd) {
   return {path, static_cast<size_t>(std::max<ssize_t>(length, 0))};
 }
 
-bool IsOfFolder(Kind kind) {
-  return kind == Kind::kMake || kind == Kind::kMakeFolder || kind == Kind::kRename ||
-         kind == Kind::kRemove;
+// Which of the operations survive; cuts the last write of kSome.
+std::vector<bool> Surviving(std::vector<DiskOp>& ops, Survives survives, uint32_t seed) {
+  std::vector<bool> is_there(ops.size(), survives == Survives::kAll);
+  std::set<int> synced;
+  std::set<std::string> synced_folders;
+  std::minstd_rand random(seed);
+  bool is_torn = false;
+  for (size_t i = ops.size(); i-- > 0 && survives != Survives::kAll;) {
+    DiskOp& op = ops[i];
+    const std::string folder = FolderOf(op.path);
+    if (op.kind == Kind::kSync) {
+      synced.insert(op.file);
+    } else if (op.kind == Kind::kSyncFolder) {
+      synced_folders.insert(op.path);
+    } else if (op.kind == Kind::kWrite || op.kind == Kind::kResize) {
+      is_there[i] = synced.contains(op.file);
+      if (!is_there[i] && survives == Survives::kSome && random() % 2 == 0) {
+        is_there[i] = true;
+        const size_t end = (op.at + random() % (op.bytes.size() + 1)) / 512 * 512;
+        op.bytes.resize(std::exchange(is_torn, true) ? op.bytes.size()
+                                                     : std::max(end, op.at) - op.at);
+      }
+    } else if (synced_folders.contains(folder) ||
+               (op.kind == Kind::kRename && synced_folders.contains(FolderOf(op.path_old))) ||
+               (survives == Survives::kSome && random() % 4 == 0)) {
+      is_there[i] = true;
+      synced_folders.insert(folder);  // All before it in its folder have survived, too.
+    }
+  }
+  return is_there;
 }
 
-void Put(std::string& content, const DiskOp& op) {
-  if (op.kind == Kind::kResize) {
-    content.resize(op.at);
-    return;
+void Replay(const DiskOp& op, std::map<int, std::string>& contents,
+            std::map<std::string, int>& names, std::set<std::string>& folders) {
+  switch (op.kind) {
+    case Kind::kWrite: {
+      std::string& content = contents[op.file];
+      content.resize(std::max(content.size(), op.at + op.bytes.size()));
+      content.replace(op.at, op.bytes.size(), op.bytes);
+      break;
+    }
+    case Kind::kResize:
+      contents[op.file].resize(op.at);
+      break;
+    case Kind::kMake:
+    case Kind::kRename:
+      names[op.path] = op.file;
+      names.erase(op.path_old);
+      break;
+    case Kind::kMakeFolder:
+      folders.insert(op.path);
+      break;
+    case Kind::kRemove:
+      names.erase(op.path);
+      folders.erase(op.path);
+      break;
+    case Kind::kSync:
+    case Kind::kSyncFolder:
+      break;
   }
-  content.resize(std::max(content.size(), op.at + op.bytes.size()));
-  content.replace(op.at, op.bytes.size(), op.bytes);
 }
 
 }  // namespace
@@ -50,11 +98,7 @@ void Put(std::string& content, const DiskOp& op) {
 // What the functions below tell; with the mutex held, and `current` set.
 struct Recorder {
   static bool Knows(const std::string& path) {
-    return current != nullptr && path.starts_with(current->folder_ + "/") && IsKept(path);
-  }
-  static int FileAt(const std::string& path) {
-    const auto found = current->files_.find(path);
-    return found == current->files_.end() ? -1 : found->second;
+    return path.starts_with(current->folder_ + "/") && IsKept(path);
   }
   static void Add(DiskOp op) { current->ops_.push_back(std::move(op)); }
 
@@ -63,39 +107,42 @@ struct Recorder {
     if (!Knows(path) || (flags & (O_CREAT | O_TRUNC)) == 0) {
       return;
     }
-    if (FileAt(path) < 0) {
-      const int file = static_cast<int>(current->contents_.size());
-      current->contents_[file];
-      current->files_[path] = file;
-      Add({Kind::kMake, file, 0, "", path});
-    } else if ((flags & O_TRUNC) != 0) {
-      Add({Kind::kResize, FileAt(path)});
+    const int next = static_cast<int>(current->before_.size() + current->ops_.size());
+    const auto [file, is_new] = current->files_.try_emplace(path, next);
+    Add({is_new ? Kind::kMake : Kind::kResize, file->second, path});
+    if (!is_new && (flags & O_TRUNC) == 0) {
+      current->ops_.pop_back();
     }
   }
   // Of a file that has no name any more nothing is left.
-  static void Changed(int fd, Kind kind, size_t at, std::string bytes = "") {
+  static void Changed(int fd, Kind kind, off_t at, std::string bytes = "") {
     const std::string path = PathOf(fd);
-    if (Knows(path) && FileAt(path) >= 0) {
-      Add({kind, FileAt(path), at, std::move(bytes)});
-    } else if (kind == Kind::kSync && current != nullptr && fs::is_directory(path)) {
-      Add({Kind::kSyncFolder, 0, 0, "", path});
+    if (const auto file = current->files_.find(path); file != current->files_.end()) {
+      Add({kind, file->second, path, "", static_cast<size_t>(at), std::move(bytes)});
+    } else if (kind == Kind::kSync && fs::is_directory(path)) {
+      Add({Kind::kSyncFolder, 0, path});
     }
   }
   static void Wrote(int fd, off_t at, const void* data, ssize_t size) {
-    Changed(fd, Kind::kWrite, static_cast<size_t>(at),
+    Changed(fd, Kind::kWrite, at,
             std::string(static_cast<const char*>(data), static_cast<size_t>(size)));
   }
   static void Renamed(const std::string& from, const std::string& to) {
-    if (Knows(from) && FileAt(from) >= 0) {
+    if (current->files_.contains(from)) {
       const int file = current->files_.extract(from).mapped();
       current->files_[to] = file;
-      Add({Kind::kRename, file, 0, "", to, from});
+      Add({Kind::kRename, file, to, from});
+    }
+  }
+  static void MadeFolder(const std::string& path) {
+    if (Knows(path)) {
+      Add({Kind::kMakeFolder, 0, path});
     }
   }
   static void Removed(const std::string& path) {
     if (Knows(path)) {
       current->files_.erase(path);
-      Add({Kind::kRemove, 0, 0, "", path});
+      Add({Kind::kRemove, 0, path});
     }
   }
 };
@@ -124,17 +171,20 @@ void WriteDisk(const std::string& folder, const DiskState& state) {
   }
 }
 
-PowerCut::PowerCut(std::string folder) : folder_(std::move(folder)), before_(ReadDisk(folder_)) {
-  for (const auto& [path, content] : before_.files) {
-    const int file = static_cast<int>(contents_.size());
-    contents_[file] = content;
+PowerCut::PowerCut(std::string folder) : folder_(std::move(folder)) {
+  const DiskState state = ReadDisk(folder_);
+  for (const std::string& path : state.folders) {
+    before_.push_back({Kind::kMakeFolder, 0, path});
+  }
+  for (const auto& [path, content] : state.files) {
+    const int file = static_cast<int>(before_.size());
     files_[path] = file;
+    before_.push_back({Kind::kMake, file, path});
+    before_.push_back({Kind::kWrite, file, path, "", 0, content});
   }
   const std::lock_guard lock(mutex);
   current = this;
 }
-
-PowerCut::~PowerCut() { Stop(); }
 
 void PowerCut::Stop() {
   const std::lock_guard lock(mutex);
@@ -143,84 +193,39 @@ void PowerCut::Stop() {
 
 void PowerCut::Note(int number) {
   const std::lock_guard lock(mutex);
-  ops_.push_back({Kind::kNote, number});
+  notes_[ops_.size()] = number;
 }
 
-namespace {
-
-// Which of the operations survive; cuts the last write of kSome.
-std::vector<bool> Surviving(std::vector<DiskOp>& ops, Survives survives, uint32_t seed) {
-  const size_t count = ops.size();
-  std::vector<bool> is_there(count, survives == Survives::kAll);
-  std::set<int> synced;
-  std::set<std::string> synced_folders;
-  std::minstd_rand random(seed);
-  std::map<std::string, bool> ends;  // Whether later entries of a folder are gone.
-  size_t torn = count;
-  for (size_t i = count; i-- > 0 && survives != Survives::kAll;) {
-    const DiskOp& op = ops[i];
-    if (op.kind == Kind::kSync) {
-      synced.insert(op.file);
-    } else if (op.kind == Kind::kSyncFolder) {
-      synced_folders.insert(op.path);
-    } else if (IsOfFolder(op.kind)) {
-      // Backwards: once an entry has survived, all before it in its folder have.
-      bool& survived = ends[FolderOf(op.path)];
-      survived = survived || synced_folders.contains(FolderOf(op.path)) ||
-                 (!op.path_old.empty() && synced_folders.contains(FolderOf(op.path_old))) ||
-                 (survives == Survives::kSome && random() % 4 == 0);
-      is_there[i] = survived;
-    } else {
-      const bool is_synced = synced.contains(op.file);
-      is_there[i] = is_synced || (survives == Survives::kSome && random() % 2 == 0);
-      torn = is_there[i] && !is_synced && torn == count ? i : torn;
-    }
-  }
-  if (torn < count) {
-    DiskOp& op = ops[torn];
-    const size_t end = (op.at + random() % (op.bytes.size() + 1)) / 512 * 512;
-    op.bytes.resize(op.kind == Kind::kWrite ? std::max(end, op.at) - op.at : 0);
-  }
-  return is_there;
+int PowerCut::NoteAt(size_t count) const {
+  const auto behind = notes_.upper_bound(count);
+  return behind == notes_.begin() ? 0 : std::prev(behind)->second;
 }
 
-}  // namespace
+std::string PowerCut::PathAt(size_t count) const { return count == 0 ? "" : ops_[count - 1].path; }
 
 DiskState PowerCut::After(size_t count, Survives survives, uint32_t seed) const {
   std::vector<DiskOp> ops(ops_.begin(), ops_.begin() + static_cast<ptrdiff_t>(count));
   const std::vector<bool> is_there = Surviving(ops, survives, seed);
-  std::map<int, std::string> contents = contents_;
+  std::map<int, std::string> contents;
   std::map<std::string, int> names;
-  for (const auto& [path, content] : before_.files) {
-    names[path] = static_cast<int>(names.size());
-  }
   DiskState state;
-  std::set<std::string> folders = before_.folders;
+  std::set<std::string> folders;
+  for (const DiskOp& op : before_) {
+    Replay(op, contents, names, folders);
+  }
   for (size_t i = 0; i < count; ++i) {
-    const DiskOp& op = ops[i];
-    if (!is_there[i]) {
-      continue;
-    }
-    if (op.kind == Kind::kWrite || op.kind == Kind::kResize) {
-      Put(contents[op.file], op);
-    } else if (op.kind == Kind::kMake || op.kind == Kind::kRename) {
-      names[op.path] = op.file;
-      names.erase(op.path_old);
-    } else if (op.kind == Kind::kMakeFolder) {
-      folders.insert(op.path);
-    } else if (op.kind == Kind::kRemove) {
-      names.erase(op.path);
-      folders.erase(op.path);
+    if (is_there[i]) {
+      Replay(ops[i], contents, names, folders);
     }
   }
   // From the top down: without its own entry, nothing in a folder can be reached.
-  for (const std::string& folder : folders) {
-    if (FolderOf(folder) == folder_ || state.folders.contains(FolderOf(folder))) {
-      state.folders.insert(folder);
-    }
-  }
+  const auto is_reached = [&](const std::string& path) {
+    return FolderOf(path) == folder_ || state.folders.contains(FolderOf(path));
+  };
+  std::copy_if(folders.begin(), folders.end(), std::inserter(state.folders, state.folders.end()),
+               is_reached);
   for (const auto& [path, file] : names) {
-    if (FolderOf(path) == folder_ || state.folders.contains(FolderOf(path))) {
+    if (is_reached(path)) {
       state.files[path] = contents[file];
     }
   }
@@ -265,15 +270,15 @@ RECORDED(ssize_t, write, (int fd, const void* data, size_t size), (fd, data, siz
 RECORDED(ssize_t, pwrite64, (int fd, const void* data, size_t size, off64_t at),
          (fd, data, size, at), Recorder::Wrote(fd, at, data, result))
 RECORDED(int, ftruncate, (int fd, off_t size) noexcept, (fd, size),
-         Recorder::Changed(fd, Kind::kResize, static_cast<size_t>(size)))
+         Recorder::Changed(fd, Kind::kResize, size))
 RECORDED(int, ftruncate64, (int fd, off64_t size) noexcept, (fd, size),
-         Recorder::Changed(fd, Kind::kResize, static_cast<size_t>(size)))
+         Recorder::Changed(fd, Kind::kResize, size))
 RECORDED(int, rename, (const char* from, const char* to) noexcept, (from, to),
          Recorder::Renamed(from, to))
 RECORDED(int, unlink, (const char* path) noexcept, (path), Recorder::Removed(path))
 RECORDED(int, rmdir, (const char* path) noexcept, (path), Recorder::Removed(path))
 RECORDED(int, mkdir, (const char* path, mode_t mode) noexcept, (path, mode),
-         Recorder::Knows(path) ? Recorder::Add({Kind::kMakeFolder, 0, 0, "", path}) : void())
+         Recorder::MadeFolder(path))
 
 INTERPOSED int fsync(int fd) {
   const std::lock_guard lock(mutex);

@@ -1,6 +1,6 @@
 // Records what the program does to the files below a folder, and makes of it what a power cut may
-// leave. A test program has power_cut.cpp linked in, which takes the place of the C library's
-// functions that change files. No call syncs anything in it: what would have been synced is known.
+// leave. For a test program that has power_cut.cpp linked in, which takes the place of the C
+// library's functions that change files. Nothing is synced in it: what would be is known.
 #ifndef FAULTS_POWER_CUT_H_
 #define FAULTS_POWER_CUT_H_
 
@@ -11,38 +11,25 @@
 #include <string>
 #include <vector>
 
-// Files by their paths, and folders.
 struct DiskState {
-  std::map<std::string, std::string> files;
+  std::map<std::string, std::string> files;  // By their paths.
   std::set<std::string> folders;
   bool operator==(const DiskState&) const = default;
 };
 
-// What is below the folder, less what no power cut leaves: sockets, and the shared memory of
-// databases, which is made anew by the first who opens one.
+// What is below the folder, less the shared memory of databases, which the first who opens one
+// makes anew; and the way back.
 DiskState ReadDisk(const std::string& folder);
-// Makes it so.
 void WriteDisk(const std::string& folder, const DiskState& state);
 
-// One change, in the order in which they were made.
 struct DiskOp {
-  enum class Kind {
-    kWrite,
-    kResize,
-    kSync,
-    kMake,
-    kMakeFolder,
-    kRename,
-    kRemove,
-    kSyncFolder,
-    kNote
-  };
+  enum class Kind { kWrite, kResize, kSync, kMake, kMakeFolder, kRename, kRemove, kSyncFolder };
   Kind kind;
-  int file = 0;  // The number of a file, whatever its name is; of kNote, what was noted.
+  int file = 0;  // The number of a file, whatever its name is.
+  std::string path = {};
+  std::string path_old = {};
   size_t at = 0;
   std::string bytes = {};
-  std::string path = {};  // In the folder of which the entry is, or which is synced.
-  std::string path_old = {};
 };
 
 enum class Survives {
@@ -56,27 +43,30 @@ class PowerCut {
  public:
   // Records from now on; what is below the folder is there for good. One at a time.
   explicit PowerCut(std::string folder);
-  ~PowerCut();
+  ~PowerCut() { Stop(); }
   PowerCut(const PowerCut&) = delete;
   PowerCut& operator=(const PowerCut&) = delete;
 
-  // Puts a note into the record. Any thread.
+  // Puts a number into the record. Any thread.
   void Note(int number);
-  // Ends the recording. The record misses nothing when the state after all of it is ReadDisk().
+  // Ends the recording. It has missed nothing when the state after all of it is ReadDisk().
   void Stop();
 
-  const std::vector<DiskOp>& Ops() const { return ops_; }
-  // When the power fails after the first `count` operations. `seed` chooses.
+  size_t Count() const { return ops_.size(); }
+  // What was noted last before the operation of that number, and what that was.
+  int NoteAt(size_t count) const;
+  std::string PathAt(size_t count) const;
+  // When the power fails after `count` operations. `seed` chooses.
   DiskState After(size_t count, Survives survives, uint32_t seed) const;
 
  private:
   friend struct Recorder;
 
   const std::string folder_;
-  DiskState before_;
   std::map<std::string, int> files_;  // By their names now.
-  std::map<int, std::string> contents_;
+  std::vector<DiskOp> before_;        // What makes the disk as it was.
   std::vector<DiskOp> ops_;
+  std::map<size_t, int> notes_;  // By the number of the operation that follows.
 };
 
 #endif  // FAULTS_POWER_CUT_H_

@@ -56,30 +56,27 @@ constexpr struct {
              {"Some2", Survives::kSome, 2},
              {"Some3", Survives::kSome, 3}};
 
-// Calls `judge` with the disk as each cut leaves it, and with the last note before the cut. Returns
-// how many states there were.
-unsigned AfterEveryCut(PowerCut& cut, const std::function<void(int note, Survives)>& judge) {
+// Calls `judge` with the disk as each cut leaves it, and with the last note before the cut.
+void AfterEveryCut(const char* name, PowerCut& cut,
+                   const std::function<void(int note, Survives)>& judge) {
   cut.Stop();
-  const auto& ops = cut.Ops();
-  EXPECT_EQ(cut.After(ops.size(), Survives::kAll, 0), ReadDisk(kRoot.Path()));
-  int note = 0;
+  EXPECT_EQ(cut.After(cut.Count(), Survives::kAll, 0), ReadDisk(kRoot.Path()));
   unsigned states = 0;
-  for (size_t i = 0; i <= ops.size() && !testing::Test::HasFailure(); ++i) {
-    note = i > 0 && ops[i - 1].kind == DiskOp::Kind::kNote ? ops[i - 1].file : note;
+  for (size_t i = 0; i <= cut.Count() && !testing::Test::HasFailure(); ++i) {
     std::optional<DiskState> last;
     for (const auto& c : kCuts) {
-      SCOPED_TRACE(c.name + std::string(" after operation ") + std::to_string(i) + ", " +
-                   (i > 0 ? ops[i - 1].path : ""));
+      SCOPED_TRACE(std::string(name) + ", " + c.name + " after operation " + std::to_string(i) +
+                   " on " + cut.PathAt(i));
       DiskState state = cut.After(i, c.survives, c.seed + static_cast<uint32_t>(i) * 8);
       if (state != last) {
         WriteDisk(kRoot.Path(), state);
-        judge(note, c.survives);
+        judge(cut.NoteAt(i), c.survives);
         last = std::move(state);
         ++states;
       }
     }
   }
-  return states;
+  printf("%s: %zu operations, %u disks\n", name, cut.Count(), states);
 }
 
 // Work in steps, and how many of them can be seen: -1 where something is neither old nor new.
@@ -91,20 +88,18 @@ struct Steps {
 };
 
 void TakeEachAndCut(const Steps& steps) {
-  SCOPED_TRACE(steps.name);
   PowerCut cut(kRoot.Path());
   for (int step = 1; step <= steps.count; ++step) {
     cut.Note(Begins(step));
     steps.take(step);
     cut.Note(IsDone(step));
   }
-  const unsigned states = AfterEveryCut(cut, [&](int note, Survives /*survives*/) {
+  AfterEveryCut(steps.name, cut, [&](int note, Survives /*survives*/) {
     int seen = -1;
     EXPECT_NO_THROW(seen = steps.read());
     EXPECT_GE(seen, (note - 1) / 2) << "what was answered for is not there";
     EXPECT_LE(seen, note / 2);
   });
-  printf("%s: %zu operations, %u states\n", steps.name, cut.Ops().size(), states);
 }
 
 // As an installation has it.
@@ -407,7 +402,7 @@ TEST(PowerCut, AnEventIsInTheQueueUntilItIsInTheIndex) {
   await();
   worker.reset();
   server.reset();
-  const unsigned states = AfterEveryCut(cut, [&](int note, Survives survives) {
+  AfterEveryCut("Worker", cut, [&](int note, Survives survives) {
     std::set<std::string> known;
     {
       Engine engine(kState + "/elastic/indexes.json");
@@ -417,7 +412,6 @@ TEST(PowerCut, AnEventIsInTheQueueUntilItIsInTheIndex) {
     EXPECT_TRUE(std::includes(known.begin(), known.end(), first.begin(), first.end()));
     EXPECT_TRUE(known.contains(later) || note == 0 || survives != Survives::kAll);
   });
-  printf("Worker: %zu operations, %u states\n", cut.Ops().size(), states);
 }
 
 }  // namespace

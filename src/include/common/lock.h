@@ -9,13 +9,13 @@
 
 #include "common/export.h"
 
-// What clang's -Wthread-safety is told: that a class can be held, that it is held for a scope, what
-// is touched only by who holds it. Nothing for other compilers.
+// What clang's -Wthread-safety is told of locks. Nothing for other compilers.
 #ifdef __clang__
 #define VEXLO_THREAD_ATTRIBUTE(attribute) __attribute__((attribute))
 #else
 #define VEXLO_THREAD_ATTRIBUTE(attribute)
 #endif
+// Of data: touched only by who holds the mutex.
 #define VEXLO_GUARDED_BY(mutex) VEXLO_THREAD_ATTRIBUTE(guarded_by(mutex))
 
 namespace vexlo {

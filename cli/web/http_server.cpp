@@ -6,14 +6,13 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <condition_variable>
 #include <cstdint>
 #include <deque>
-#include <mutex>
 #include <optional>
 #include <thread>
 
 #include "cli/command.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::cli {
 namespace {
@@ -53,50 +52,51 @@ class Workers {
 
   // False when the queue is full.
   bool Add(std::function<void()> work) {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     if (ending_ || queue_.size() >= most_) {
       return false;
     }
     queue_.push_back(std::move(work));
-    changed_.notify_all();
+    changed_.NotifyAll();
     return true;
   }
 
   // The threads finish what they have begun.
   void End() {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     ending_ = true;
-    changed_.notify_all();
+    changed_.NotifyAll();
   }
   bool AwaitEnd(Clock::time_point deadline) {
-    std::unique_lock<std::mutex> lock(mutex_);
-    return changed_.wait_until(lock, deadline, [this] { return running_ == 0; });
+    kavo::local::MutexLock lock(mutex_);
+    return changed_.WaitUntil(lock, deadline,
+                              [this]() KAVO_REQUIRES(mutex_) { return running_ == 0; });
   }
 
  private:
   void Run() {
-    std::unique_lock<std::mutex> lock(mutex_);
+    kavo::local::MutexLock lock(mutex_);
     for (;;) {
-      changed_.wait(lock, [this] { return ending_ || !queue_.empty(); });
+      changed_.Wait(lock, [this]() KAVO_REQUIRES(mutex_) { return ending_ || !queue_.empty(); });
       if (ending_) {
         break;
       }
       const std::function<void()> work = std::move(queue_.front());
       queue_.pop_front();
-      lock.unlock();
+      lock.Unlock();
       work();
-      lock.lock();
+      lock.Lock();
     }
     --running_;
-    changed_.notify_all();
+    changed_.NotifyAll();
   }
 
   const size_t most_;
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  std::deque<std::function<void()>> queue_;
-  bool ending_ = false;
-  size_t running_;
+  kavo::local::Mutex mutex_;
+  kavo::local::Condition changed_;
+  std::deque<std::function<void()>> queue_ KAVO_GUARDED_BY(mutex_);
+  bool ending_ KAVO_GUARDED_BY(mutex_) = false;
+  size_t running_ KAVO_GUARDED_BY(mutex_);
   std::vector<std::thread> threads_;
 };
 
@@ -105,7 +105,7 @@ class Workers {
 class Waiting {
  public:
   void Begin(int socket) {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     since_[socket] = Clock::now();
     if (since_.size() > kMostWaiting) {
       const auto oldest =
@@ -115,11 +115,11 @@ class Waiting {
     }
   }
   void End(int socket) {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     since_.erase(socket);
   }
   void CloseOverdue() {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     for (auto at = since_.begin(); at != since_.end();) {
       at = at->second + kPatience < Clock::now() ? ShutDown(at) : std::next(at);
     }
@@ -129,13 +129,13 @@ class Waiting {
   using Since = std::map<int, Clock::time_point>;
 
   // The library sees the end of the connection then, and closes it.
-  Since::iterator ShutDown(Since::iterator at) {
+  Since::iterator ShutDown(Since::iterator at) KAVO_REQUIRES(mutex_) {
     shutdown(at->first, SHUT_RDWR);
     return since_.erase(at);
   }
 
-  std::mutex mutex_;
-  Since since_;
+  kavo::local::Mutex mutex_;
+  Since since_ KAVO_GUARDED_BY(mutex_);
 };
 
 int SocketOf(MHD_Connection* connection) {
@@ -254,7 +254,7 @@ struct HttpServer::State {
       Resume(connection);
     };
     {
-      const std::lock_guard<std::mutex> lock(mutex);
+      const kavo::local::MutexLock lock(mutex);
       suspended[connection] = exchange;
     }
     if (!lanes[lane]->Add(run)) {
@@ -265,7 +265,7 @@ struct HttpServer::State {
   }
 
   void Resume(MHD_Connection* connection) {
-    const std::lock_guard<std::mutex> lock(mutex);
+    const kavo::local::MutexLock lock(mutex);
     suspended.erase(connection);
     MHD_resume_connection(connection);
   }
@@ -273,8 +273,8 @@ struct HttpServer::State {
   const Handler handler;
   Waiting waiting;
   MHD_Daemon* daemon = nullptr;
-  std::mutex mutex;  // Of what is suspended.
-  std::map<MHD_Connection*, Exchange*> suspended;
+  kavo::local::Mutex mutex;
+  std::map<MHD_Connection*, Exchange*> suspended KAVO_GUARDED_BY(mutex);
   std::vector<std::unique_ptr<Workers>> lanes;
 };
 
@@ -309,7 +309,7 @@ bool HttpServer::Stop(std::chrono::milliseconds patience) {
   // What was still queued. The library wants no connection suspended when it ends.
   std::map<MHD_Connection*, State::Exchange*> left;
   {
-    const std::lock_guard<std::mutex> lock(state_->mutex);
+    const kavo::local::MutexLock lock(state_->mutex);
     left = state_->suspended;
   }
   for (const auto& [connection, exchange] : left) {

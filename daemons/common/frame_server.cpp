@@ -256,11 +256,11 @@ void FrameServer::RemoveSocket() {
 FrameServer::~FrameServer() {
   RemoveSocket();
   {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     ending_ = true;
     jobs_.clear();
   }
-  jobs_changed_.notify_all();
+  jobs_changed_.NotifyAll();
   for (std::thread& worker : workers_) {
     worker.join();
   }
@@ -372,7 +372,7 @@ void FrameServer::Admit(UniqueFd fd) {
 
 // False when its user has as many connections as one may have.
 bool FrameServer::TakePlace(Connection& connection) {
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   if (!IsOwn(connection.peer)) {
     size_t& places = places_[connection.peer.uid];
     if (places >= options_.max_connections_per_user) {
@@ -385,7 +385,6 @@ bool FrameServer::TakePlace(Connection& connection) {
   return true;
 }
 
-// Called with the lock.
 void FrameServer::GiveUpPlace(const Connection& connection) {
   --open_;
   if (connection.has_place && --places_[connection.peer.uid] == 0) {
@@ -399,7 +398,7 @@ void FrameServer::UpdateAccepting() {
   }
   bool wanted = accept_after_ <= now_;
   {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     wanted = wanted && open_ < options_.max_connections;
     wake_wanted_ = wake_wanted_ || open_ >= options_.max_connections;
   }
@@ -504,7 +503,7 @@ bool FrameServer::Grow(Connection& connection) {
   const size_t room = static_cast<size_t>(
       std::min<uint64_t>(connection.length, std::max(2 * connection.got, kFirstBytes)));
   if (room > kFreeBytes) {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     if (!memory_.Take(connection.share, room)) {
       wake_wanted_ = true;
       return false;
@@ -587,10 +586,10 @@ void FrameServer::Submit(Connection& connection) {
   connection.state = Connection::State::kInWork;
   auto node = connections_.extract(connection.fd.Get());
   {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     jobs_.push_back(std::move(node.mapped()));
   }
-  jobs_changed_.notify_one();
+  jobs_changed_.NotifyOne();
 }
 
 void FrameServer::Close(Connection& connection) {
@@ -598,7 +597,7 @@ void FrameServer::Close(Connection& connection) {
     --starved_;
   }
   const auto node = connections_.extract(connection.fd.Get());  // Closes, in epoll too, at the end.
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   memory_.GiveBack(connection.share);
   unsent_bytes_ -= connection.reply.size();
   GiveUpPlace(*node.mapped());
@@ -622,7 +621,7 @@ void FrameServer::SetDeadline(Connection& connection, Clock::time_point deadline
 void FrameServer::TakeReturned() {
   std::vector<std::unique_ptr<Connection>> returned;
   {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     returned.swap(returned_);
     wake_wanted_ = stopping_ || starved_ > 0;
   }
@@ -709,33 +708,33 @@ void FrameServer::BeginStop() {
 }
 
 bool FrameServer::IsStopped() {
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   return open_ == 0 || now_ >= stop_deadline_;
 }
 
 bool FrameServer::FinishStop() {
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   if (open_ > 0) {
     Log(Level::kWarning, VEXLO_SOURCE, __LINE__,
         "stopped with " + std::to_string(open_) + " connections not served to the end");
   }
   jobs_.clear();
   ending_ = true;
-  jobs_changed_.notify_all();
+  jobs_changed_.NotifyAll();
   return busy_ == 0;
 }
 
 void FrameServer::Work() {
-  std::unique_lock<std::mutex> lock(mutex_);
+  kavo::local::MutexLock lock(mutex_);
   while (true) {
-    jobs_changed_.wait(lock, [this] { return !jobs_.empty() || ending_; });
+    jobs_changed_.Wait(lock, [this]() KAVO_REQUIRES(mutex_) { return !jobs_.empty() || ending_; });
     if (ending_) {
       return;
     }
     std::unique_ptr<Connection> connection = std::move(jobs_.front());
     jobs_.pop_front();
     ++busy_;
-    lock.unlock();
+    lock.Unlock();
 
     RequestMemory::Share share = std::exchange(connection->share, {});
     std::optional<std::string> reply = Answer(*connection);
@@ -750,7 +749,7 @@ void FrameServer::Work() {
       connection->fd.Reset();
     }
 
-    lock.lock();
+    lock.Lock();
     --busy_;
     memory_.GiveBack(share);
     if (!is_done && unsent_bytes_ + unsent <= options_.max_total_bytes) {

@@ -6,13 +6,11 @@
 #include <sys/types.h>
 
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
 #include <deque>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <thread>
@@ -20,6 +18,7 @@
 #include <vector>
 
 #include "daemons/common/unique_fd.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::daemon {
 
@@ -151,7 +150,7 @@ class FrameServer {
   void Accept();
   void Admit(UniqueFd fd);
   bool TakePlace(Connection& connection);
-  void GiveUpPlace(const Connection& connection);
+  void GiveUpPlace(const Connection& connection) KAVO_REQUIRES(mutex_);
   void UpdateAccepting();
   void Read(Connection& connection);
   Received Receive(Connection& connection);
@@ -199,18 +198,18 @@ class FrameServer {
   bool accepting_ = true;
   bool stopping_ = false;
 
-  std::mutex mutex_;
-  std::condition_variable jobs_changed_;
-  // Guarded by mutex_:
-  std::deque<std::unique_ptr<Connection>> jobs_;
-  std::vector<std::unique_ptr<Connection>> returned_;
-  RequestMemory memory_;
-  size_t unsent_bytes_ = 0;                   // Of replies in returned_ and connections_.
-  size_t open_ = 0;                           // Connections, whoever owns them.
-  std::unordered_map<uid_t, size_t> places_;  // Of them those of other users.
-  size_t busy_ = 0;                           // Workers in the handler or at its reply.
-  bool wake_wanted_ = false;
-  bool ending_ = false;
+  kavo::local::Mutex mutex_;
+  kavo::local::Condition jobs_changed_;
+  std::deque<std::unique_ptr<Connection>> jobs_ KAVO_GUARDED_BY(mutex_);
+  std::vector<std::unique_ptr<Connection>> returned_ KAVO_GUARDED_BY(mutex_);
+  RequestMemory memory_ KAVO_GUARDED_BY(mutex_);
+  size_t unsent_bytes_ KAVO_GUARDED_BY(mutex_) = 0;  // Of replies in returned_ and connections_.
+  size_t open_ KAVO_GUARDED_BY(mutex_) = 0;          // Connections, whoever owns them.
+  std::unordered_map<uid_t, size_t> places_
+      KAVO_GUARDED_BY(mutex_);               // Of them those of other users.
+  size_t busy_ KAVO_GUARDED_BY(mutex_) = 0;  // Workers in the handler or at its reply.
+  bool wake_wanted_ KAVO_GUARDED_BY(mutex_) = false;
+  bool ending_ KAVO_GUARDED_BY(mutex_) = false;
 
   std::vector<std::thread> workers_;  // Started by Run(), joined by the destructor.
 };

@@ -2,6 +2,8 @@
 
 #include <cstdio>
 
+#include "kavo/local/mutex.h"
+
 namespace vexlo::daemon {
 namespace {
 
@@ -38,11 +40,11 @@ bool LogRate::Admit(const char* source, int line, Clock::time_point now, uint64_
 }
 
 void Log(Level level, const char* source, int line, const std::string& text) {
-  static std::mutex mutex;
-  static LogRate rate;
+  static kavo::local::Mutex mutex;
+  static LogRate rate KAVO_GUARDED_BY(mutex);
   uint64_t held_back = 0;
   {
-    const std::lock_guard lock(mutex);
+    const kavo::local::MutexLock lock(mutex);
     if (!rate.Admit(source, line, LogRate::Clock::now(), &held_back)) {
       return;
     }

@@ -27,6 +27,7 @@
 #include <system_error>
 #include <thread>
 
+#include "daemons/common/folders.h"
 #include "daemons/common/sandbox.h"
 #include "kavo/local/shares.h"
 
@@ -241,8 +242,7 @@ bool OwnsStateFolders() {
 // What is in there tells of everybody's files. The sockets, which others may see, are not.
 void CloseStateFolder() {
   const std::string folder = kavo::local::Root() + kStateFolder;
-  std::error_code ignored;
-  std::filesystem::create_directories(folder, ignored);
+  MakeFolders(folder);
   struct stat info {};
   if (stat(folder.c_str(), &info) == 0 && info.st_uid == geteuid() && (info.st_mode & 077U) != 0 &&
       chmod(folder.c_str(), info.st_mode & 07700U) == 0) {
@@ -255,8 +255,7 @@ bool KeepToState() {
   folders.reserve(std::size(kWrittenFolders) + 1);
   for (const char* const folder : kWrittenFolders) {
     folders.push_back(kavo::local::Root() + folder);
-    std::error_code ignored;
-    std::filesystem::create_directories(folders.back(), ignored);
+    MakeFolders(folders.back());
   }
   folders.emplace_back("/dev/null");  // What programs are started with.
   return ForbidWriting(folders) != PathRule::kFailed;

@@ -5,12 +5,13 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <filesystem>
 #include <string_view>
+#include <system_error>
 #include <utility>
 
 #include "common/check.h"
 #include "common/error.h"
+#include "daemons/common/folders.h"
 #include "daemons/common/log.h"
 
 namespace vexlo::evnotifyd {
@@ -30,10 +31,9 @@ Monitor::Monitor(const FeederOptions& options)
       folder_(kavo::local::MonitorQueuesFolder()),
       registrations_(inotify_init1(IN_NONBLOCK | IN_CLOEXEC)),
       mounts_(open("/proc/self/mountinfo", O_RDONLY | O_CLOEXEC)) {
-  std::error_code error;
-  std::filesystem::create_directories(folder_, error);
-  VEXLO_CHECK(static_cast<bool>(error), ERR_SYSTEM,
-              "the folder cannot be made, path=" + folder_ + ", reason=" + error.message());
+  VEXLO_CHECK(!daemon::MakeFolders(folder_), ERR_SYSTEM,
+              "the folder cannot be made, path=" + folder_ +
+                  ", reason=" + std::generic_category().message(errno));
   WatchFolder();
   Read();
   thread_ = std::jthread([this](const std::stop_token& stop) { Run(stop); });
@@ -78,8 +78,7 @@ void Monitor::Run(const std::stop_token& stop) {
 // The folder is made anew when somebody has removed it; where it was watched before, nothing
 // changes.
 void Monitor::WatchFolder() {
-  std::error_code error;
-  std::filesystem::create_directories(folder_, error);
+  daemon::MakeFolders(folder_);
   const bool was_watched = std::exchange(
       folder_watched_, inotify_add_watch(registrations_.Get(), folder_.c_str(), kFolderMask) >= 0);
   if (!folder_watched_ && was_watched) {
@@ -128,7 +127,7 @@ void Monitor::Read() {
   }
   std::vector<Queue> ended;
   {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     for (auto queue = queues_.begin(); queue != queues_.end();) {
       const bool stays =
           wanted.count(queue->first) != 0 || unreadable_.count(queue->second.registered.app) != 0;
@@ -161,12 +160,16 @@ void Monitor::Stop(std::vector<Queue> queues, bool discard) {
 // What is watched on the way comes first: a root that comes between the two is seen by both.
 void Monitor::CheckRoots() {
   std::set<std::string> roots;
-  for (const auto& [key, queue] : queues_) {
-    for (const kavo::local::MonitoredFolder& folder : queue.registered.folders) {
-      roots.insert(folder.path);
+  {
+    const kavo::local::MutexLock lock(mutex_);
+    for (const auto& [key, queue] : queues_) {
+      for (const kavo::local::MonitoredFolder& folder : queue.registered.folders) {
+        roots.insert(folder.path);
+      }
     }
   }
   root_paths_.Set(roots);
+  const kavo::local::MutexLock lock(mutex_);
   for (const auto& [key, queue] : queues_) {
     queue.watch->CheckRoots();
   }
@@ -174,7 +177,7 @@ void Monitor::CheckRoots() {
 
 Json::Value Monitor::Stats() const {
   Json::Value queues(Json::arrayValue);
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   for (const auto& [key, queue] : queues_) {
     const QueueStats stats = queue.watch->Stats();
     Json::Value value(Json::objectValue);

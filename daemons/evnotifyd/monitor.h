@@ -6,7 +6,6 @@
 
 #include <map>
 #include <memory>
-#include <mutex>
 #include <set>
 #include <stop_token>
 #include <string>
@@ -17,6 +16,7 @@
 #include "daemons/evnotifyd/queue_watch.h"
 #include "daemons/evnotifyd/root_paths.h"
 #include "daemons/evnotifyd/wake.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::evnotifyd {
 
@@ -61,8 +61,8 @@ class Monitor {
   RootPaths root_paths_;
   std::map<std::string, std::string> unreadable_;  // What has been logged.
 
-  mutable std::mutex mutex_;     // Held for moments.
-  std::map<Key, Queue> queues_;  // Changed by the thread alone; guarded by mutex_ for others.
+  mutable kavo::local::Mutex mutex_;                     // Held for moments.
+  std::map<Key, Queue> queues_ KAVO_GUARDED_BY(mutex_);  // Changed by the thread alone.
 
   std::jthread thread_;
 };

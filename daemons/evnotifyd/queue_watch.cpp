@@ -24,7 +24,7 @@ QueueWatch::~QueueWatch() { RequestStop(/*discard=*/false); }
 
 void QueueWatch::SetFolders(std::vector<kavo::local::MonitoredFolder> folders) {
   {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     folders_ = std::move(folders);
   }
   wake_.Raise();
@@ -32,7 +32,7 @@ void QueueWatch::SetFolders(std::vector<kavo::local::MonitoredFolder> folders) {
 
 void QueueWatch::CheckRoots() {
   {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     check_roots_ = true;
   }
   wake_.Raise();
@@ -40,7 +40,7 @@ void QueueWatch::CheckRoots() {
 
 void QueueWatch::RequestStop(bool discard) {
   {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     discard_ = discard_ || discard;
   }
   thread_.request_stop();
@@ -48,7 +48,7 @@ void QueueWatch::RequestStop(bool discard) {
 }
 
 QueueStats QueueWatch::Stats() const {
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   return stats_;
 }
 
@@ -58,7 +58,7 @@ void QueueWatch::Run(const std::stop_token& stop) {
     std::optional<std::vector<kavo::local::MonitoredFolder>> folders;
     bool check_roots = false;
     {
-      const std::lock_guard<std::mutex> lock(mutex_);
+      const kavo::local::MutexLock lock(mutex_);
       folders = std::exchange(folders_, std::nullopt);
       check_roots = std::exchange(check_roots_, false);
     }
@@ -75,14 +75,14 @@ void QueueWatch::Run(const std::stop_token& stop) {
       fds.push_back({fd, POLLIN, 0});
     }
     {
-      const std::lock_guard<std::mutex> lock(mutex_);
+      const kavo::local::MutexLock lock(mutex_);
       stats_ = std::move(stats);
     }
     wake_.Wait(fds, feeder.NextDeadline());
   }
   bool discard = false;
   {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     discard = discard_;
   }
   if (!discard) {

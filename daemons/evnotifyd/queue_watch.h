@@ -2,7 +2,6 @@
 #ifndef DAEMONS_EVNOTIFYD_QUEUE_WATCH_H_
 #define DAEMONS_EVNOTIFYD_QUEUE_WATCH_H_
 
-#include <mutex>
 #include <optional>
 #include <stop_token>
 #include <string>
@@ -12,6 +11,7 @@
 #include "daemons/evnotifyd/feeder.h"
 #include "daemons/evnotifyd/wake.h"
 #include "kavo/local/monitor_queues.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::evnotifyd {
 
@@ -41,12 +41,12 @@ class QueueWatch {
   const FeederOptions options_;
   const Wake wake_;
 
-  mutable std::mutex mutex_;  // Held for moments.
-  // Guarded by mutex_:
-  std::optional<std::vector<kavo::local::MonitoredFolder>> folders_;  // To be watched from now on.
-  bool check_roots_ = false;
-  bool discard_ = false;
-  QueueStats stats_;
+  mutable kavo::local::Mutex mutex_;  // Held for moments.
+  std::optional<std::vector<kavo::local::MonitoredFolder>> folders_
+      KAVO_GUARDED_BY(mutex_);  // To be watched from now on.
+  bool check_roots_ KAVO_GUARDED_BY(mutex_) = false;
+  bool discard_ KAVO_GUARDED_BY(mutex_) = false;
+  QueueStats stats_ KAVO_GUARDED_BY(mutex_);
 
   std::jthread thread_;
 };

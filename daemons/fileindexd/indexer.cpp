@@ -65,52 +65,53 @@ Indexer::Indexer(std::string id, Stats& stats, std::function<bool()> is_interrup
 
 Indexer::~Indexer() {
   {
-    const std::lock_guard lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     ending_ = true;
   }
-  changed_.notify_all();
+  changed_.NotifyAll();
   for (std::thread& thread : threads_) {
     thread.join();
   }
 }
 
 void Indexer::Upsert(const std::string& path, bool content) {
-  std::unique_lock lock(mutex_);
+  kavo::local::MutexLock lock(mutex_);
   // The same file twice at a time might end with the older of two readings.
-  changed_.wait(lock, [&] {
+  changed_.Wait(lock, [&]() KAVO_REQUIRES(mutex_) {
     return failure_ != nullptr || (waiting_.size() < kMostWaiting && !in_work_.contains(path));
   });
   ThrowFailure();
   was_used_ = true;
   in_work_.insert(path);
   waiting_.push_back({path, content});
-  lock.unlock();
-  changed_.notify_all();
+  lock.Unlock();
+  changed_.NotifyAll();
 }
 
 void Indexer::Drain() {
-  std::unique_lock lock(mutex_);
-  changed_.wait(lock, [this] { return failure_ != nullptr || in_work_.empty(); });
+  kavo::local::MutexLock lock(mutex_);
+  changed_.Wait(lock,
+                [this]() KAVO_REQUIRES(mutex_) { return failure_ != nullptr || in_work_.empty(); });
   ThrowFailure();
 }
 
 size_t Indexer::InWork() {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   return in_work_.size();
 }
 
 std::vector<std::string> Indexer::TakeGone() {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   return std::exchange(gone_, {});
 }
 
 bool Indexer::TakeHasUnread() {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   return std::exchange(has_unread_, false);
 }
 
 bool Indexer::TakeWasUsed() {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   return std::exchange(was_used_, false);
 }
 
@@ -122,13 +123,13 @@ void Indexer::ThrowFailure() {
 
 void Indexer::Fail(std::exception_ptr failure) {
   {
-    const std::lock_guard lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     if (failure_ == nullptr) {
       failure_ = std::move(failure);
     }
     waiting_.clear();
   }
-  changed_.notify_all();
+  changed_.NotifyAll();
 }
 
 void Indexer::Work() {
@@ -162,9 +163,9 @@ void Indexer::Work() {
 }
 
 bool Indexer::TakeJob(bool may_wait, Job* job) {
-  std::unique_lock lock(mutex_);
+  kavo::local::MutexLock lock(mutex_);
   if (may_wait) {
-    changed_.wait(lock, [this] { return ending_ || !waiting_.empty(); });
+    changed_.Wait(lock, [this]() KAVO_REQUIRES(mutex_) { return ending_ || !waiting_.empty(); });
   }
   if (waiting_.empty() || ending_) {
     return false;
@@ -179,10 +180,10 @@ void Indexer::Extract(const Job& job, Batch* batch) {
   try {
     Json::Value item = MakePut(id_, job.path, job.content);
     if (IsDelete(item)) {
-      const std::lock_guard lock(mutex_);
+      const kavo::local::MutexLock lock(mutex_);
       gone_.push_back(job.path);
     } else if (IsUnread(item)) {
-      const std::lock_guard lock(mutex_);
+      const kavo::local::MutexLock lock(mutex_);
       has_unread_ = true;
     }
     batch->bytes += TextBytes(item);
@@ -211,12 +212,12 @@ void Indexer::Send(Batch* batch) {
 
 void Indexer::Finish(const std::vector<std::string>& paths) {
   {
-    const std::lock_guard lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     for (const std::string& path : paths) {
       in_work_.erase(path);
     }
   }
-  changed_.notify_all();
+  changed_.NotifyAll();
 }
 
 }  // namespace vexlo::fileindexd

@@ -2,18 +2,17 @@
 #ifndef DAEMONS_FILEINDEXD_INDEXER_H_
 #define DAEMONS_FILEINDEXD_INDEXER_H_
 
-#include <condition_variable>
 #include <cstddef>
 #include <deque>
 #include <exception>
 #include <functional>
-#include <mutex>
 #include <string>
 #include <thread>
 #include <unordered_set>
 #include <vector>
 
 #include "daemons/fileindexd/stats.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::fileindexd {
 
@@ -71,22 +70,22 @@ class Indexer {
   void Finish(const std::vector<std::string>& paths);
   // Ends everything with `failure`, unless something ended it before.
   void Fail(std::exception_ptr failure);
-  void ThrowFailure();  // With mutex_ held.
+  void ThrowFailure() KAVO_REQUIRES(mutex_);
 
   const std::string id_;
   Stats& stats_;
   const std::function<bool()> is_interrupted_;
 
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  // Guarded by mutex_:
-  std::deque<Job> waiting_;
-  std::unordered_set<std::string> in_work_;  // Taken and not answered, those that wait among them.
-  std::exception_ptr failure_;
-  std::vector<std::string> gone_;
-  bool has_unread_ = false;
-  bool was_used_ = false;
-  bool ending_ = false;
+  kavo::local::Mutex mutex_;
+  kavo::local::Condition changed_;
+  std::deque<Job> waiting_ KAVO_GUARDED_BY(mutex_);
+  std::unordered_set<std::string> in_work_
+      KAVO_GUARDED_BY(mutex_);  // Taken and not answered, those that wait among them.
+  std::exception_ptr failure_ KAVO_GUARDED_BY(mutex_);
+  std::vector<std::string> gone_ KAVO_GUARDED_BY(mutex_);
+  bool has_unread_ KAVO_GUARDED_BY(mutex_) = false;
+  bool was_used_ KAVO_GUARDED_BY(mutex_) = false;
+  bool ending_ KAVO_GUARDED_BY(mutex_) = false;
 
   std::vector<std::thread> threads_;  // Last: they use the others.
 };

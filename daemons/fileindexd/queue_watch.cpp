@@ -8,13 +8,12 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
-#include <filesystem>
 #include <string_view>
-#include <system_error>
 
 #include "common/check.h"
 #include "common/error.h"
 #include "common/string.h"
+#include "daemons/common/folders.h"
 
 namespace vexlo::fileindexd {
 namespace {
@@ -43,8 +42,7 @@ void QueueWatch::Watch(const std::string& queue_path) {
   queue_path_ = queue_path;
   name_ = Basename(queue_path);
   const std::string folder = Dirname(queue_path);
-  std::error_code ignored;
-  std::filesystem::create_directories(folder, ignored);
+  daemon::MakeFolders(folder);
   inotify_ = daemon::UniqueFd(inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
   VEXLO_CHECK(inotify_.Get() < 0, ERR_SYSTEM, "inotify_init1 failed");
   const bool failed =

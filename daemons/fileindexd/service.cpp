@@ -130,7 +130,7 @@ Json::Value Service::Carry(const std::string& type, const Json::Value& data) {
 Json::Value Service::Describe() {
   Json::Value answer = Success();
   answer["shares"] = Json::Value(Json::arrayValue);
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   for (const auto& [share, worker] : workers_) {
     answer["shares"].append(worker->Describe());
   }
@@ -139,19 +139,19 @@ Json::Value Service::Describe() {
 
 void Service::Post(Task task) {
   {
-    const std::lock_guard lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     tasks_.push_back(std::move(task));
   }
-  changed_.notify_all();
+  changed_.NotifyAll();
 }
 
 void Service::Run() {
-  std::unique_lock lock(mutex_);
+  kavo::local::MutexLock lock(mutex_);
   for (;;) {
-    const auto is_called = [this] { return ending_ || !tasks_.empty(); };
+    const auto is_called = [this]() KAVO_REQUIRES(mutex_) { return ending_ || !tasks_.empty(); };
     if (!start_again_) {
-      changed_.wait(lock, is_called);
-    } else if (!changed_.wait_until(lock, *start_again_, is_called)) {
+      changed_.Wait(lock, is_called);
+    } else if (!changed_.WaitUntil(lock, *start_again_, is_called)) {
       tasks_.push_back([this] { StartIndexedShares(); });
     }
     if (ending_) {
@@ -159,14 +159,14 @@ void Service::Run() {
     }
     const Task task = std::move(tasks_.front());
     tasks_.pop_front();
-    lock.unlock();
+    lock.Unlock();
     try {
       task();
     } catch (const std::exception& error) {
       daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
                   std::string("a command failed, reason=") + error.what());
     }
-    lock.lock();
+    lock.Lock();
   }
 }
 
@@ -196,7 +196,7 @@ void Service::Create(const std::string& share) {
     return;
   }
   auto worker = std::make_shared<Worker>(share, pause_, options_.coalescing);
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   if (ending_) {
     worker->Stop();
   }
@@ -206,7 +206,7 @@ void Service::Create(const std::string& share) {
 void Service::Delete(const std::string& share) {
   std::shared_ptr<Worker> worker;
   {
-    const std::lock_guard lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     const auto found = workers_.find(share);
     if (found == workers_.end()) {
       return;
@@ -223,14 +223,14 @@ void Service::Delete(const std::string& share) {
 }
 
 void Service::KickAll() {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   for (const auto& [share, worker] : workers_) {
     worker->Kick();
   }
 }
 
 std::shared_ptr<Worker> Service::Find(const std::string& share) {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   const auto found = workers_.find(share);
   return found == workers_.end() ? nullptr : found->second;
 }
@@ -239,11 +239,11 @@ bool Service::Stop(std::chrono::milliseconds time) {
   const auto until = std::chrono::steady_clock::now() + time;
   Workers workers;
   {
-    const std::lock_guard lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     ending_ = true;
     workers = workers_;
   }
-  changed_.notify_all();
+  changed_.NotifyAll();
   for (const auto& [share, worker] : workers) {
     worker->Stop();
   }

@@ -5,18 +5,17 @@
 #include <json/value.h>
 
 #include <chrono>
-#include <condition_variable>
 #include <deque>
 #include <functional>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <thread>
 
 #include "daemons/common/run_daemon.h"
 #include "daemons/fileindexd/worker.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::fileindexd {
 
@@ -60,12 +59,11 @@ class Service {
 
   const ServiceOptions options_;
   Pause pause_;
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  // Guarded by mutex_, which is held for moments:
-  Workers workers_;
-  std::deque<Task> tasks_;
-  bool ending_ = false;
+  kavo::local::Mutex mutex_;  // Held for moments.
+  kavo::local::Condition changed_;
+  Workers workers_ KAVO_GUARDED_BY(mutex_);
+  std::deque<Task> tasks_ KAVO_GUARDED_BY(mutex_);
+  bool ending_ KAVO_GUARDED_BY(mutex_) = false;
 
   // The thread's own: when to look for the list of folders again, while it cannot be read.
   std::optional<std::chrono::steady_clock::time_point> start_again_;

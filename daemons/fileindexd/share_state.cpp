@@ -1,14 +1,14 @@
 #include "daemons/fileindexd/share_state.h"
 
 #include <cerrno>
-#include <filesystem>
-#include <system_error>
 #include <vector>
 
 #include "common/check.h"
 #include "common/error.h"
 #include "common/file.h"
 #include "common/json.h"
+#include "common/string.h"
+#include "daemons/common/folders.h"
 #include "daemons/common/log.h"
 #include "fileindex/paths.h"
 
@@ -74,8 +74,7 @@ void SaveShareState(const std::string& file, const ShareState& state) {
     crawl["pass"] = state.crawl->pass;
     crawl["saw_gone"] = state.crawl->saw_gone;
   }
-  std::error_code ignored;
-  std::filesystem::create_directories(std::filesystem::path(file).parent_path(), ignored);
+  daemon::MakeFolders(Dirname(file));
   errno = 0;
   if (!JsonToFile(value, file)) {
     LogFailure({VEXLO_SOURCE, __LINE__, __func__, "!JsonToFile(value, file)"}, file, errno);

@@ -21,7 +21,7 @@ Json::Value Counts(const std::map<int, uint64_t>& counts) {
 }  // namespace
 
 void Stats::SetState(WorkerState state) {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   if (IsAtWork(state) && !IsAtWork(state_)) {
     began_ = Clock::now();
     files_before_ = files_;
@@ -30,30 +30,30 @@ void Stats::SetState(WorkerState state) {
 }
 
 void Stats::CountOperation(fileindex::FileIndexOP kind) {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   ++operations_;
   ++kinds_[kind];
 }
 
 void Stats::CountFiles(uint64_t count) {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   files_ += count;
 }
 
 void Stats::CountError(int code, const std::string& reason) {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   ++errors_[code];
   last_error_ = reason;
 }
 
 void Stats::SetProgress(uint64_t done, uint64_t found) {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   done_ = done;
   found_ = found;
 }
 
 Json::Value Stats::ToJson() const {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   Json::Value value(Json::objectValue);
   value["state"] = kStateNames[static_cast<size_t>(state_)];
   value["operations"] = static_cast<Json::UInt64>(operations_);

@@ -7,10 +7,10 @@
 #include <chrono>
 #include <cstdint>
 #include <map>
-#include <mutex>
 #include <string>
 
 #include "fileindex/optree/op.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::fileindexd {
 
@@ -35,17 +35,17 @@ class Stats {
  private:
   using Clock = std::chrono::steady_clock;
 
-  mutable std::mutex mutex_;
-  WorkerState state_ = WorkerState::kIdle;
-  uint64_t operations_ = 0;
-  std::map<int, uint64_t> kinds_;
-  uint64_t files_ = 0;
-  uint64_t files_before_ = 0;  // When the work began.
-  Clock::time_point began_;
-  std::map<int, uint64_t> errors_;
-  std::string last_error_;
-  uint64_t done_ = 0;
-  uint64_t found_ = 0;
+  mutable kavo::local::Mutex mutex_;
+  WorkerState state_ KAVO_GUARDED_BY(mutex_) = WorkerState::kIdle;
+  uint64_t operations_ KAVO_GUARDED_BY(mutex_) = 0;
+  std::map<int, uint64_t> kinds_ KAVO_GUARDED_BY(mutex_);
+  uint64_t files_ KAVO_GUARDED_BY(mutex_) = 0;
+  uint64_t files_before_ KAVO_GUARDED_BY(mutex_) = 0;  // When the work began.
+  Clock::time_point began_ KAVO_GUARDED_BY(mutex_);
+  std::map<int, uint64_t> errors_ KAVO_GUARDED_BY(mutex_);
+  std::string last_error_ KAVO_GUARDED_BY(mutex_);
+  uint64_t done_ KAVO_GUARDED_BY(mutex_) = 0;
+  uint64_t found_ KAVO_GUARDED_BY(mutex_) = 0;
 };
 
 }  // namespace vexlo::fileindexd

@@ -115,7 +115,7 @@ bool Worker::AwaitEnd(Clock::time_point until) {
 Json::Value Worker::Describe() const {
   std::string queue_path;
   {
-    const std::lock_guard lock(queue_path_mutex_);
+    const kavo::local::MutexLock lock(queue_path_mutex_);
     queue_path = queue_path_;
   }
   Json::Value value = stats_.ToJson();
@@ -154,7 +154,7 @@ Worker::Outcome Worker::RunCycle() {
   const sdk::SDKShare share(share_);
   const std::string queue_path = share.GetQueuePath();
   {
-    const std::lock_guard lock(queue_path_mutex_);
+    const kavo::local::MutexLock lock(queue_path_mutex_);
     queue_path_ = queue_path;
   }
   watch_.Watch(queue_path);

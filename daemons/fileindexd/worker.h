@@ -7,7 +7,6 @@
 #include <atomic>
 #include <chrono>
 #include <future>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <thread>
@@ -15,6 +14,7 @@
 #include "daemons/fileindexd/queue_watch.h"
 #include "daemons/fileindexd/share_state.h"
 #include "daemons/fileindexd/stats.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::fileindexd {
 
@@ -82,8 +82,8 @@ class Worker {
   std::atomic<bool> kicked_ = false;
   Stats stats_;
   QueueWatch watch_;
-  mutable std::mutex queue_path_mutex_;
-  std::string queue_path_;  // Guarded by the mutex.
+  mutable kavo::local::Mutex queue_path_mutex_;
+  std::string queue_path_ KAVO_GUARDED_BY(queue_path_mutex_);
 
   // The thread's own:
   ShareState state_;

@@ -200,7 +200,7 @@ Pool::Pool(PoolOptions options) : options_(std::move(options)) {}
 
 Pool::~Pool() = default;
 
-// Null when one must be started. Called with the lock.
+// Null when one must be started.
 std::unique_ptr<Pool::Worker> Pool::TakeIdle(bool new_worker) {
   while (!idle_.empty()) {
     std::unique_ptr<Worker> worker = std::move(idle_.back());
@@ -216,9 +216,10 @@ std::unique_ptr<Pool::Worker> Pool::TakeIdle(bool new_worker) {
 }
 
 std::unique_ptr<Pool::Worker> Pool::Take(bool new_worker, Outcome& refusal) {
-  std::unique_lock<std::mutex> lock(mutex_);
-  const bool is_free = came_free_.wait_for(
-      lock, options_.wait_limit, [this] { return taken_ < options_.workers || stopping_; });
+  kavo::local::MutexLock lock(mutex_);
+  const bool is_free = came_free_.WaitFor(
+      lock, options_.wait_limit,
+      [this]() KAVO_REQUIRES(mutex_) { return taken_ < options_.workers || stopping_; });
   if (!is_free || stopping_) {
     refusal.text = stopping_ ? kEnding : "every worker is busy";
     return nullptr;
@@ -226,14 +227,14 @@ std::unique_ptr<Pool::Worker> Pool::Take(bool new_worker, Outcome& refusal) {
   ++taken_;
   std::unique_ptr<Worker> worker = TakeIdle(new_worker);
   if (worker == nullptr) {
-    lock.unlock();
+    lock.Unlock();
     worker = Worker::Start(options_, refusal.text);
-    lock.lock();
+    lock.Lock();
   }
   if (worker == nullptr) {
     daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__, refusal.text);
     --taken_;
-    came_free_.notify_one();
+    came_free_.NotifyOne();
   } else {
     busy_.insert(worker->Socket());
   }
@@ -243,7 +244,7 @@ std::unique_ptr<Pool::Worker> Pool::Take(bool new_worker, Outcome& refusal) {
 void Pool::GiveBack(std::unique_ptr<Worker> worker) {
   const bool is_alive = worker->IsAlive();
   const bool is_used_up = !is_alive || worker->Served() >= options_.files_per_worker;
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   busy_.erase(worker->Socket());
   --taken_;
   deaths_ += is_alive || stopping_ ? 0 : 1;
@@ -252,7 +253,7 @@ void Pool::GiveBack(std::unique_ptr<Worker> worker) {
   } else {
     idle_.push_back(std::move(worker));
   }
-  came_free_.notify_one();
+  came_free_.NotifyOne();
 }
 
 Pool::Outcome Pool::Run(const std::string& request, int file, bool new_worker) {
@@ -263,27 +264,27 @@ Pool::Outcome Pool::Run(const std::string& request, int file, bool new_worker) {
   }
   outcome = worker->Ask(request, file, Clock::now() + options_.deadline);
   GiveBack(std::move(worker));
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   return stopping_ && outcome.kind != Outcome::kReply ? Outcome{Outcome::kNoWorker, kEnding}
                                                       : std::move(outcome);
 }
 
 void Pool::Stop() {
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   stopping_ = true;
   for (const int socket : busy_) {
     shutdown(socket, SHUT_RDWR);  // Whoever waits on it takes the worker for dead.
   }
-  came_free_.notify_all();
+  came_free_.NotifyAll();
 }
 
 size_t Pool::Workers() {
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   return idle_.size() + taken_;
 }
 
 size_t Pool::Deaths() {
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   return deaths_;
 }
 

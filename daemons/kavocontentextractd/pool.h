@@ -6,16 +6,15 @@
 #include <sys/types.h>
 
 #include <chrono>
-#include <condition_variable>
 #include <cstddef>
 #include <memory>
-#include <mutex>
 #include <set>
 #include <string>
 #include <vector>
 
 #include "daemons/common/sandbox.h"
 #include "daemons/common/unique_fd.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::extractd {
 
@@ -77,18 +76,17 @@ class Pool {
   class Worker;
 
   std::unique_ptr<Worker> Take(bool new_worker, Outcome& refusal);
-  std::unique_ptr<Worker> TakeIdle(bool new_worker);
+  std::unique_ptr<Worker> TakeIdle(bool new_worker) KAVO_REQUIRES(mutex_);
   void GiveBack(std::unique_ptr<Worker> worker);
 
   const PoolOptions options_;
-  std::mutex mutex_;
-  std::condition_variable came_free_;
-  // Guarded by mutex_:
-  std::vector<std::unique_ptr<Worker>> idle_;
-  std::set<int> busy_;  // The sockets of workers that read.
-  size_t taken_ = 0;
-  bool stopping_ = false;
-  size_t deaths_ = 0;
+  kavo::local::Mutex mutex_;
+  kavo::local::Condition came_free_;
+  std::vector<std::unique_ptr<Worker>> idle_ KAVO_GUARDED_BY(mutex_);
+  std::set<int> busy_ KAVO_GUARDED_BY(mutex_);  // The sockets of workers that read.
+  size_t taken_ KAVO_GUARDED_BY(mutex_) = 0;
+  bool stopping_ KAVO_GUARDED_BY(mutex_) = false;
+  size_t deaths_ KAVO_GUARDED_BY(mutex_) = 0;
 };
 
 }  // namespace vexlo::extractd

@@ -11,6 +11,7 @@
 #include "common/check.h"
 #include "common/file.h"
 #include "common/json.h"
+#include "daemons/common/folders.h"
 #include "daemons/common/log.h"
 
 namespace vexlo::extractd {
@@ -57,7 +58,9 @@ ContentKey KeyOf(const struct stat& info) {
 
 Quarantine::Quarantine(std::string file, size_t most) : file_(std::move(file)), most_(most) {
   const std::filesystem::path folder = std::filesystem::path(file_).parent_path();
-  std::filesystem::create_directories(folder);
+  if (!daemon::MakeFolders(folder)) {
+    throw std::system_error(errno, std::generic_category(), "cannot be made: " + folder.string());
+  }
   std::filesystem::permissions(folder, std::filesystem::perms::owner_all);
   if (!Load()) {
     entries_.clear();
@@ -131,7 +134,7 @@ void Quarantine::Put(Entry entry) {
 }
 
 std::optional<Fault> Quarantine::Find(const ContentKey& key) {
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   const auto found = by_file_.find({key.device, key.inode});
   if (found == by_file_.end()) {
     return std::nullopt;
@@ -146,14 +149,14 @@ std::optional<Fault> Quarantine::Find(const ContentKey& key) {
 
 void Quarantine::Add(const ContentKey& key, const Fault& fault, const std::string& path) {
   const auto now = std::chrono::system_clock::now().time_since_epoch();
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   Put({key, fault.Reason(), fault.what(), path,
        std::chrono::duration_cast<std::chrono::seconds>(now).count()});
   Save();
 }
 
 size_t Quarantine::Size() {
-  const std::lock_guard<std::mutex> lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   return entries_.size();
 }
 

@@ -8,12 +8,12 @@
 #include <cstdint>
 #include <list>
 #include <map>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <utility>
 
 #include "daemons/kavocontentextractd/fault.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::extractd {
 
@@ -56,16 +56,15 @@ class Quarantine {
   };
   using FileId = std::pair<uint64_t, uint64_t>;  // Device and inode.
 
-  bool Load();
-  void Save();
-  void Put(Entry entry);
+  bool Load() KAVO_REQUIRES(mutex_);
+  void Save() KAVO_REQUIRES(mutex_);
+  void Put(Entry entry) KAVO_REQUIRES(mutex_);
 
   const std::string file_;
   const size_t most_;
-  std::mutex mutex_;
-  // Guarded by mutex_:
-  std::list<Entry> entries_;  // The oldest first.
-  std::map<FileId, std::list<Entry>::iterator> by_file_;
+  kavo::local::Mutex mutex_;
+  std::list<Entry> entries_ KAVO_GUARDED_BY(mutex_);  // The oldest first.
+  std::map<FileId, std::list<Entry>::iterator> by_file_ KAVO_GUARDED_BY(mutex_);
 };
 
 }  // namespace vexlo::extractd

@@ -10,6 +10,7 @@
 #include <system_error>
 #include <vector>
 
+#include "daemons/common/folders.h"
 #include "daemons/kavoelasticd/failure.h"
 #include "daemons/kavoelasticd/sqlite.h"
 
@@ -30,8 +31,8 @@ void Remove(const std::string& path) {
   }
 }
 
-void Sync(const std::string& path, int flags) {
-  const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | flags);
+void Sync(const std::string& path) {
+  const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
   if (fd < 0) {
     Fail("opening to sync failed", path);
   }
@@ -52,7 +53,7 @@ void CopyDatabase(const std::string& from, const std::string& to) {
     Connection db(Database(from), Connection::Use::kWrite);
     Sql(db, "VACUUM INTO ?").Text(copy).Run();
   }
-  Sync(copy, 0);
+  Sync(copy);
   if (rename(copy.c_str(), Database(to).c_str()) != 0) {
     Fail("renaming failed", copy);
   }
@@ -70,17 +71,8 @@ bool Exists(const std::string& path) {
 }
 
 void MakeFolders(const std::string& path) {
-  for (size_t slash = path.find('/', 1);; slash = path.find('/', slash + 1)) {
-    const std::string folder = path.substr(0, slash);
-    if (mkdir(folder.c_str(), 0755) == 0) {
-      const size_t above = folder.rfind('/');
-      SyncFolder(above == 0 || above == std::string::npos ? "/" : folder.substr(0, above));
-    } else if (errno != EEXIST) {
-      Fail("making a folder failed", folder);
-    }
-    if (slash == std::string::npos) {
-      return;
-    }
+  if (!daemon::MakeFolders(path)) {
+    Fail("making a folder failed", path);
   }
 }
 
@@ -92,7 +84,11 @@ void MakePrivateFile(const std::string& path) {
   close(fd);
 }
 
-void SyncFolder(const std::string& path) { Sync(path, O_DIRECTORY); }
+void SyncFolder(const std::string& path) {
+  if (!daemon::SyncFolder(path)) {
+    Fail("syncing failed", path);
+  }
+}
 
 void RemoveDatabase(const std::string& folder) {
   // The file itself last: as long as it stands, its log belongs to it.

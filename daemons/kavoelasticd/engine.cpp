@@ -68,16 +68,6 @@ Json::Value WithData(Json::Value data) {
 
 }  // namespace
 
-struct Engine::Slot {
-  Gate gate;
-  // The rest is read inside the gate, and changed by whoever is alone there.
-  std::string id;
-  RegistryEntry entry;
-  bool gone = false;  // Deleted: whoever still holds the slot finds no index.
-  std::unique_ptr<Store> store;
-  uint64_t openings = 0;  // Tells one store from the next.
-};
-
 Engine::Engine(std::string registry_path) : registry_(std::move(registry_path)) {
   for (const auto& [id, entry] : registry_.Entries()) {
     auto slot = std::make_shared<Slot>();
@@ -186,7 +176,7 @@ Json::Value Engine::Dispatch(const Json::Value& request) {
       {"index_config_set", &Engine::IndexConfigSet}};
   for (const auto& [name, run] : kAdmin) {
     if (command == name) {
-      const std::lock_guard lock(admin_mutex_);
+      const kavo::local::MutexLock lock(admin_mutex_);
       (this->*run)(data);
       return Success();
     }
@@ -262,7 +252,7 @@ void Engine::CompoundRun(const std::string& id, std::span<const Json::Value* con
 }
 
 Engine::SlotPtr Engine::Find(const std::string& id) {
-  const std::lock_guard lock(registry_mutex_);
+  const kavo::local::MutexLock lock(registry_mutex_);
   const auto found = slots_.find(id);
   if (found == slots_.end()) {
     throw Failure(Code::kIndexMissing, "there is no index " + id);
@@ -337,7 +327,7 @@ void Engine::MarkDamaged(Slot& slot, const std::string& reason) {
 void Engine::SetState(Slot& slot, State state) {
   RegistryEntry entry = slot.entry;
   entry.state = state;
-  const std::lock_guard lock(registry_mutex_);
+  const kavo::local::MutexLock lock(registry_mutex_);
   registry_.Put(slot.id, entry);
   slot.entry = entry;
 }
@@ -362,7 +352,7 @@ void Engine::IndexCreate(const Json::Value& data) {
   const WordCutter cutter(LanguageOf(info.settings));
   SlotPtr slot;
   {
-    const std::lock_guard lock(registry_mutex_);
+    const kavo::local::MutexLock lock(registry_mutex_);
     const std::string owner = registry_.OwnerOf(path);
     if (!owner.empty() && owner != id) {
       throw Failure(Code::kIndexExists, path + " is the folder of " + owner);
@@ -373,7 +363,6 @@ void Engine::IndexCreate(const Json::Value& data) {
   }
   if (slot == nullptr) {
     slot = std::make_shared<Slot>();
-    slot->id = id;
   }
   const Gate::Alone alone(slot->gate);
   if (!slot->entry.path.empty() && slot->entry.state != State::kDamaged) {
@@ -381,8 +370,9 @@ void Engine::IndexCreate(const Json::Value& data) {
   }
   Store::Create(path, info);
   const RegistryEntry entry = {path, info.token, State::kActive, /*move_to=*/""};
-  const std::lock_guard lock(registry_mutex_);
+  const kavo::local::MutexLock lock(registry_mutex_);
   registry_.Put(id, entry);
+  slot->id = id;
   slot->entry = entry;
   slots_[id] = slot;
 }
@@ -392,7 +382,7 @@ void Engine::IndexDelete(const Json::Value& data) {
   const SlotPtr slot = Find(id);
   const Gate::Alone alone(slot->gate);
   {
-    const std::lock_guard lock(registry_mutex_);
+    const kavo::local::MutexLock lock(registry_mutex_);
     registry_.Remove(id);
     slots_.erase(id);
   }
@@ -435,7 +425,7 @@ void Engine::IndexConfigSet(const Json::Value& data) {
   const std::string from = entry.path;
   entry.path = change.isMember("path") ? AbsoluteFolder(RequiredText(change, "path")) : from;
   {
-    const std::lock_guard lock(registry_mutex_);
+    const kavo::local::MutexLock lock(registry_mutex_);
     const std::string owner = registry_.OwnerOf(entry.path);
     if ((new_id != id && slots_.contains(new_id)) || (!owner.empty() && owner != id)) {
       throw Failure(Code::kIndexExists, "the id or the folder belongs to another index");
@@ -446,16 +436,18 @@ void Engine::IndexConfigSet(const Json::Value& data) {
   // With nothing at the old place, whoever moved the share has moved the database with it.
   if (entry.path != from && Exists(DatabaseFile(from))) {
     MakeFolders(entry.path);
+    // For good before the registry tells of the move: a database that stands there counts as moved.
     RemoveDatabase(entry.path);
+    SyncFolder(entry.path);
     RegistryEntry moving = slot->entry;
     moving.move_to = entry.path;
     {
-      const std::lock_guard lock(registry_mutex_);
+      const kavo::local::MutexLock lock(registry_mutex_);
       registry_.Put(id, moving);
     }
     MoveDatabase(from, entry.path);
   }
-  const std::lock_guard lock(registry_mutex_);
+  const kavo::local::MutexLock lock(registry_mutex_);
   registry_.Replace(id, new_id, entry);
   slot->id = new_id;
   slot->entry = entry;
@@ -465,7 +457,7 @@ void Engine::IndexConfigSet(const Json::Value& data) {
 
 Json::Value Engine::IndexList() {
   Json::Value list(Json::arrayValue);
-  const std::lock_guard lock(registry_mutex_);
+  const kavo::local::MutexLock lock(registry_mutex_);
   for (const auto& [id, entry] : registry_.Entries()) {
     Json::Value& item = list.append(Json::objectValue);
     item["id"] = id;
@@ -486,7 +478,7 @@ Json::Value Engine::Search(const Json::Value& data, const JudgePaths& judge) {
   }
   const bool named = !ids.empty();
   if (!named) {
-    const std::lock_guard lock(registry_mutex_);
+    const kavo::local::MutexLock lock(registry_mutex_);
     for (const auto& [id, slot] : slots_) {
       ids.push_back(id);
     }
@@ -534,23 +526,28 @@ Json::Value Engine::Search(const Json::Value& data, const JudgePaths& judge) {
 }
 
 void Engine::NoteChange() {
-  const std::lock_guard lock(change_mutex_);
+  const kavo::local::MutexLock lock(change_mutex_);
   if (!changed_) {
     changed_ = true;
-    change_noted_.notify_all();
+    change_noted_.NotifyAll();
   }
 }
 
 void Engine::AwaitChange(const std::stop_token& stop) {
-  std::unique_lock lock(change_mutex_);
-  change_noted_.wait(lock, stop, [this] { return changed_; });
+  const std::stop_callback wake(stop, [this] {
+    const kavo::local::MutexLock lock(change_mutex_);
+    change_noted_.NotifyAll();
+  });
+  kavo::local::MutexLock lock(change_mutex_);
+  change_noted_.Wait(
+      lock, [&]() KAVO_REQUIRES(change_mutex_) { return changed_ || stop.stop_requested(); });
   changed_ = false;
 }
 
 bool Engine::CommitIdle(std::chrono::steady_clock::duration idle) {
   std::vector<SlotPtr> slots;
   {
-    const std::lock_guard lock(registry_mutex_);
+    const kavo::local::MutexLock lock(registry_mutex_);
     for (const auto& [id, slot] : slots_) {
       slots.push_back(slot);
     }

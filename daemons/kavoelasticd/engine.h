@@ -6,11 +6,9 @@
 #include <json/value.h>
 
 #include <chrono>
-#include <condition_variable>
 #include <functional>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <span>
 #include <stop_token>
 #include <string>
@@ -19,6 +17,7 @@
 #include "daemons/kavoelasticd/readable.h"
 #include "daemons/kavoelasticd/registry.h"
 #include "daemons/kavoelasticd/store.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::elasticd {
 
@@ -57,7 +56,16 @@ class Engine {
   void AwaitChange(const std::stop_token& stop);
 
  private:
-  struct Slot;
+  struct Slot {
+    Gate gate;
+    // Read inside the gate, and changed by whoever is alone there.
+    std::string id KAVO_GUARDED_BY(gate);
+    RegistryEntry entry KAVO_GUARDED_BY(gate);
+    // Deleted: whoever still holds the slot finds no index.
+    bool gone KAVO_GUARDED_BY(gate) = false;
+    std::unique_ptr<Store> store KAVO_GUARDED_BY(gate);
+    uint64_t openings KAVO_GUARDED_BY(gate) = 0;  // Tells one store from the next.
+  };
   using SlotPtr = std::shared_ptr<Slot>;
   using StoreUse = std::function<void(Store&)>;
 
@@ -68,11 +76,11 @@ class Engine {
   void CompoundRun(const std::string& id, std::span<const Json::Value* const> items,
                    std::span<Json::Value> results);
 
-  void IndexCreate(const Json::Value& data);
-  void IndexDelete(const Json::Value& data);
-  void IndexPause(const Json::Value& data);
-  void IndexResume(const Json::Value& data);
-  void IndexConfigSet(const Json::Value& data);
+  void IndexCreate(const Json::Value& data) KAVO_REQUIRES(admin_mutex_);
+  void IndexDelete(const Json::Value& data) KAVO_REQUIRES(admin_mutex_);
+  void IndexPause(const Json::Value& data) KAVO_REQUIRES(admin_mutex_);
+  void IndexResume(const Json::Value& data) KAVO_REQUIRES(admin_mutex_);
+  void IndexConfigSet(const Json::Value& data) KAVO_REQUIRES(admin_mutex_);
   Json::Value IndexList();
   Json::Value Search(const Json::Value& data, const JudgePaths& judge);
 
@@ -80,21 +88,21 @@ class Engine {
   // `use` throws.
   void WithStore(const std::string& id, const StoreUse& use);
   SlotPtr Find(const std::string& id);
-  // With the slot's gate closed for others.
-  void Open(Slot& slot);
-  void CloseCleanly(Slot& slot);
-  void MarkDamaged(Slot& slot, const std::string& reason);
-  void SetState(Slot& slot, State state);
+  void Open(Slot& slot) KAVO_REQUIRES(slot.gate);
+  void CloseCleanly(Slot& slot) KAVO_REQUIRES(slot.gate);
+  void MarkDamaged(Slot& slot, const std::string& reason) KAVO_REQUIRES(slot.gate);
+  void SetState(Slot& slot, State state) KAVO_REQUIRES(slot.gate);
   void NoteChange();
 
-  std::mutex admin_mutex_;     // One command on the indexes themselves at a time.
-  std::mutex registry_mutex_;  // Guards the two below.
-  Registry registry_;
-  std::map<std::string, SlotPtr> slots_;  // By id, as in the registry.
+  kavo::local::Mutex admin_mutex_;  // One command on the indexes themselves at a time.
+  kavo::local::Mutex registry_mutex_;
+  Registry registry_ KAVO_GUARDED_BY(registry_mutex_);
+  std::map<std::string, SlotPtr> slots_
+      KAVO_GUARDED_BY(registry_mutex_);  // By id, as in the registry.
 
-  std::mutex change_mutex_;
-  std::condition_variable_any change_noted_;
-  bool changed_ = false;  // Guarded by change_mutex_.
+  kavo::local::Mutex change_mutex_;
+  kavo::local::Condition change_noted_;
+  bool changed_ KAVO_GUARDED_BY(change_mutex_) = false;
 };
 
 }  // namespace vexlo::elasticd

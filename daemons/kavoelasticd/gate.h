@@ -2,28 +2,20 @@
 #ifndef DAEMONS_KAVOELASTICD_GATE_H_
 #define DAEMONS_KAVOELASTICD_GATE_H_
 
-#include <condition_variable>
 #include <cstddef>
-#include <mutex>
+
+#include "kavo/local/mutex.h"
 
 namespace vexlo::elasticd {
 
 // Unlike a shared mutex, whoever wants to be alone keeps newcomers out while it waits, so a stream
 // of searches cannot hold up a pause for ever. Not recursive.
-class Gate {
+class KAVO_CAPABILITY("gate") Gate {
  public:
-  class Visit {
+  class KAVO_SCOPED_CAPABILITY Visit {
    public:
-    explicit Visit(Gate& gate) : gate_(gate) {
-      std::unique_lock lock(gate_.mutex_);
-      gate_.changed_.wait(lock, [this] { return !gate_.closed_; });
-      ++gate_.visitors_;
-    }
-    ~Visit() {
-      const std::lock_guard lock(gate_.mutex_);
-      --gate_.visitors_;
-      gate_.changed_.notify_all();
-    }
+    explicit Visit(Gate& gate) KAVO_ACQUIRE_SHARED(gate) : gate_(gate) { gate_.Enter(); }
+    ~Visit() KAVO_RELEASE_GENERIC() { gate_.Leave(); }
     Visit(const Visit&) = delete;
     Visit& operator=(const Visit&) = delete;
 
@@ -31,19 +23,10 @@ class Gate {
     Gate& gate_;
   };
 
-  class Alone {
+  class KAVO_SCOPED_CAPABILITY Alone {
    public:
-    explicit Alone(Gate& gate) : gate_(gate) {
-      std::unique_lock lock(gate_.mutex_);
-      gate_.changed_.wait(lock, [this] { return !gate_.closed_; });
-      gate_.closed_ = true;
-      gate_.changed_.wait(lock, [this] { return gate_.visitors_ == 0; });
-    }
-    ~Alone() {
-      const std::lock_guard lock(gate_.mutex_);
-      gate_.closed_ = false;
-      gate_.changed_.notify_all();
-    }
+    explicit Alone(Gate& gate) KAVO_ACQUIRE(gate) : gate_(gate) { gate_.Close(); }
+    ~Alone() KAVO_RELEASE() { gate_.Open(); }
     Alone(const Alone&) = delete;
     Alone& operator=(const Alone&) = delete;
 
@@ -52,10 +35,32 @@ class Gate {
   };
 
  private:
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  bool closed_ = false;
-  size_t visitors_ = 0;
+  void Enter() {
+    kavo::local::MutexLock lock(mutex_);
+    changed_.Wait(lock, [this]() KAVO_REQUIRES(mutex_) { return !closed_; });
+    ++visitors_;
+  }
+  void Leave() {
+    const kavo::local::MutexLock lock(mutex_);
+    --visitors_;
+    changed_.NotifyAll();
+  }
+  void Close() {
+    kavo::local::MutexLock lock(mutex_);
+    changed_.Wait(lock, [this]() KAVO_REQUIRES(mutex_) { return !closed_; });
+    closed_ = true;
+    changed_.Wait(lock, [this]() KAVO_REQUIRES(mutex_) { return visitors_ == 0; });
+  }
+  void Open() {
+    const kavo::local::MutexLock lock(mutex_);
+    closed_ = false;
+    changed_.NotifyAll();
+  }
+
+  kavo::local::Mutex mutex_;
+  kavo::local::Condition changed_;
+  bool closed_ KAVO_GUARDED_BY(mutex_) = false;
+  size_t visitors_ KAVO_GUARDED_BY(mutex_) = 0;
 };
 
 }  // namespace vexlo::elasticd

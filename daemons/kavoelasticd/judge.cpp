@@ -179,7 +179,7 @@ Judge::Judge() {
 std::vector<Verdict> Judge::Ask(const daemon::Peer& peer, const std::vector<std::string>& paths) {
   std::vector<Verdict> verdicts;
   verdicts.reserve(paths.size());
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   for (size_t from = 0; from < paths.size(); from += kPathsAtOnce) {
     AskSome(peer, paths, from, std::min(kPathsAtOnce, paths.size() - from), verdicts);
   }

@@ -5,13 +5,13 @@
 #include <sys/types.h>
 
 #include <cstddef>
-#include <mutex>
 #include <string>
 #include <vector>
 
 #include "daemons/common/frame_server.h"
 #include "daemons/common/unique_fd.h"
 #include "daemons/kavoelasticd/readable.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::elasticd {
 
@@ -36,12 +36,13 @@ class Judge {
 
  private:
   void AskSome(const daemon::Peer& peer, const std::vector<std::string>& paths, size_t from,
-               size_t count, std::vector<Verdict>& verdicts);
-  std::string Receive();
+               size_t count, std::vector<Verdict>& verdicts) KAVO_REQUIRES(mutex_);
+  std::string Receive() KAVO_REQUIRES(mutex_);
 
-  std::mutex mutex_;  // Guards the rest.
+  kavo::local::Mutex mutex_;  // One question at a time.
   daemon::UniqueFd socket_;
-  bool is_waiting_ = false;  // An answer that nobody waits for any more is still to come.
+  bool is_waiting_ KAVO_GUARDED_BY(mutex_) =
+      false;  // An answer that nobody waits for any more is still to come.
 };
 
 }  // namespace vexlo::elasticd

@@ -60,7 +60,7 @@ void RequestStats::Count(const Json::Value& request, const Json::Value& reply,
                          std::chrono::nanoseconds time) {
   const double seconds = std::chrono::duration<double>(time).count();
   const auto* const bound = std::lower_bound(kBounds.begin(), kBounds.end(), seconds);
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   Command& command = commands_[NameOf(request)];
   ++command.count;
   command.seconds += seconds;
@@ -83,7 +83,7 @@ void RequestStats::CountError(const Json::Value& reply) {
 }
 
 Json::Value RequestStats::ToJson() const {
-  const std::lock_guard lock(mutex_);
+  const kavo::local::MutexLock lock(mutex_);
   Json::Value value(Json::objectValue);
   value["success"] = true;
   for (const double bound : kBounds) {

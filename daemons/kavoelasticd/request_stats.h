@@ -9,8 +9,9 @@
 #include <cstdint>
 #include <functional>
 #include <map>
-#include <mutex>
 #include <string>
+
+#include "kavo/local/mutex.h"
 
 namespace vexlo::elasticd {
 
@@ -45,11 +46,11 @@ class RequestStats {
     std::array<uint64_t, kBounds.size()> steps{};
   };
 
-  void CountError(const Json::Value& reply);
+  void CountError(const Json::Value& reply) KAVO_REQUIRES(mutex_);
 
-  mutable std::mutex mutex_;
-  std::map<std::string, Command> commands_;
-  std::map<int, uint64_t> errors_;
+  mutable kavo::local::Mutex mutex_;
+  std::map<std::string, Command> commands_ KAVO_GUARDED_BY(mutex_);
+  std::map<int, uint64_t> errors_ KAVO_GUARDED_BY(mutex_);
 };
 
 }  // namespace vexlo::elasticd

@@ -100,6 +100,7 @@ void Store::CheckDatabase(Connection& db, const std::string& token) {
 }
 
 void Store::OpenWriter(const std::string& token) {
+  const kavo::local::MutexLock lock(write_mutex_);
   const std::string file = DatabaseFile(folder_);
   try {
     {
@@ -138,7 +139,7 @@ Store::~Store() {
 }
 
 void Store::Write(const std::function<void(Writer&, Session&)>& change) {
-  const std::lock_guard lock(write_mutex_);
+  const kavo::local::MutexLock lock(write_mutex_);
   uncommitted_ = true;
   at_rest_ = false;
   last_change_ = std::chrono::steady_clock::now();
@@ -158,7 +159,7 @@ void Store::Write(const std::function<void(Writer&, Session&)>& change) {
   }
 }
 
-// The write lock is held. The next Commit() tells what is lost.
+// The next Commit() tells what is lost.
 void Store::RollBack(const char* reason) {
   daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
               "changes are rolled back, index=" + folder_ + ", reason=" + reason);
@@ -168,7 +169,7 @@ void Store::RollBack(const char* reason) {
 
 void Store::Read(const std::function<void(Session&)>& read) {
   if (uncommitted_) {
-    const std::lock_guard lock(write_mutex_);
+    const kavo::local::MutexLock lock(write_mutex_);
     try {
       read(*write_session_);
     } catch (const SqlError& error) {
@@ -185,7 +186,7 @@ void Store::Read(const std::function<void(Session&)>& read) {
 
 std::unique_ptr<Session> Store::TakeReader() {
   {
-    const std::lock_guard lock(readers_mutex_);
+    const kavo::local::MutexLock lock(readers_mutex_);
     if (!readers_.empty()) {
       std::unique_ptr<Session> reader = std::move(readers_.back());
       readers_.pop_back();
@@ -202,14 +203,14 @@ void Store::ReadCommitted(const std::function<void(Session&)>& read) {
   reader->db.Run("BEGIN");
   read(*reader);
   reader->db.Run("COMMIT");
-  const std::lock_guard lock(readers_mutex_);
+  const kavo::local::MutexLock lock(readers_mutex_);
   if (readers_.size() < kIdleReaders) {
     readers_.push_back(std::move(reader));
   }
 }
 
 void Store::Commit() {
-  const std::lock_guard lock(write_mutex_);
+  const kavo::local::MutexLock lock(write_mutex_);
   try {
     writer_->Commit();
   } catch (const SqlError& error) {
@@ -221,7 +222,6 @@ void Store::Commit() {
   uncommitted_ = false;
 }
 
-// The write lock is held.
 void Store::CommitQuietly() {
   try {
     writer_->CommitChanges();
@@ -234,8 +234,11 @@ void Store::CommitQuietly() {
 bool Store::CommitIdle(std::chrono::steady_clock::duration idle) {
   for (int step = 0; step < kStepsAtOnce && !at_rest_; ++step) {
     // Given back after each step, and whoever writes meanwhile ends the loop.
-    const std::unique_lock lock(write_mutex_, std::try_to_lock);
-    if (!lock.owns_lock() || std::chrono::steady_clock::now() - last_change_ < idle) {
+    if (!write_mutex_.TryLock()) {
+      return true;
+    }
+    const kavo::local::MutexLock lock(write_mutex_, std::adopt_lock);
+    if (std::chrono::steady_clock::now() - last_change_ < idle) {
       return true;
     }
     if (uncommitted_) {
@@ -252,7 +255,7 @@ bool Store::CommitIdle(std::chrono::steady_clock::duration idle) {
   return !at_rest_;
 }
 
-// The write lock is held, and nothing is uncommitted. In steps, as whoever writes waits for one.
+// Nothing is uncommitted. In steps, as whoever writes waits for one.
 // Whether there are more.
 bool Store::Rest() {
   Connection& db = write_session_->db;
@@ -278,7 +281,11 @@ bool Store::Rest() {
 
 void Store::Close() {
   Commit();
-  readers_.clear();
+  {
+    const kavo::local::MutexLock lock(readers_mutex_);
+    readers_.clear();
+  }
+  const kavo::local::MutexLock lock(write_mutex_);
   Sql checkpoint(write_session_->db, "PRAGMA wal_checkpoint(TRUNCATE)");
   if (!checkpoint.Row() || checkpoint.IntAt(0) != 0) {
     throw Failure(Code::kStorage, "the log cannot be emptied, index=" + folder_);

@@ -6,13 +6,13 @@
 #include <chrono>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <vector>
 
 #include "daemons/kavoelasticd/schema.h"
 #include "daemons/kavoelasticd/session.h"
 #include "daemons/kavoelasticd/writer.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::elasticd {
 
@@ -59,23 +59,24 @@ class Store {
  private:
   void OpenWriter(const std::string& token);
   void CheckDatabase(Connection& db, const std::string& token);
-  void CommitQuietly();
-  void RollBack(const char* reason);
-  bool Rest();
+  void CommitQuietly() KAVO_REQUIRES(write_mutex_);
+  void RollBack(const char* reason) KAVO_REQUIRES(write_mutex_);
+  bool Rest() KAVO_REQUIRES(write_mutex_);
   std::unique_ptr<Session> TakeReader();
 
   const std::string folder_;
   std::string language_;
   std::unique_ptr<Schema> schema_;
   bool lacks_folder_sums_ = false;  // Until it is opened to be written.
-  std::mutex write_mutex_;          // Guards the writer and its session.
-  std::unique_ptr<Session> write_session_;
-  std::unique_ptr<Writer> writer_;
-  std::chrono::steady_clock::time_point last_change_;
+  kavo::local::Mutex write_mutex_;
+  std::unique_ptr<Session> write_session_ KAVO_GUARDED_BY(write_mutex_);
+  std::unique_ptr<Writer> writer_ KAVO_GUARDED_BY(write_mutex_);
+  std::chrono::steady_clock::time_point last_change_ KAVO_GUARDED_BY(write_mutex_);
   std::atomic<bool> uncommitted_ = false;
   std::atomic<bool> at_rest_ = true;  // Nothing is left for CommitIdle().
-  std::mutex readers_mutex_;          // Guards the sessions that no one uses.
-  std::vector<std::unique_ptr<Session>> readers_;
+  kavo::local::Mutex readers_mutex_;
+  std::vector<std::unique_ptr<Session>> readers_
+      KAVO_GUARDED_BY(readers_mutex_);  // That no one uses.
 };
 
 }  // namespace vexlo::elasticd

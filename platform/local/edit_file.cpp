@@ -38,6 +38,11 @@ int OpenLock(const std::string& path) {
   return fd;
 }
 
+bool SyncFolder(const std::string& folder) {
+  const ScopedFd fd(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  return fd.Get() >= 0 && fsync(fd.Get()) == 0;
+}
+
 }  // namespace
 
 bool IsNormalised(std::string_view path) {
@@ -77,6 +82,8 @@ void MakeFolders(const std::string& folder) {
         errno = error;
         ThrowSystem(part, "mkdir");
       }
+    } else if (!SyncFolder(FolderOf(part))) {
+      ThrowSystem(part, "fsync of the folder above");
     }
   }
 }
@@ -134,9 +141,7 @@ void ReplaceWhole(const std::string& file, std::string_view text) {
   if (rename(path.c_str(), file.c_str()) != 0) {
     ThrowSystem(file, "rename");
   }
-  const std::string folder = FolderOf(file);
-  const ScopedFd folder_fd(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (folder_fd.Get() < 0 || fsync(folder_fd.Get()) != 0) {
+  if (!SyncFolder(FolderOf(file))) {
     ThrowSystem(file,
                 "the change is made but may not outlive a power failure, as fsync of the folder");
   }

@@ -6,10 +6,10 @@
 #include <algorithm>
 #include <cerrno>
 #include <ctime>
-#include <mutex>
 #include <string>
 #include <utility>
 
+#include "kavo/local/mutex.h"
 #include "platform/local/boundary.h"
 #include "platform/local/shares_file.h"
 
@@ -35,7 +35,7 @@ class ShareCache {
 
   // The table, or null with `error` set to an errno.
   std::shared_ptr<const ShareTable> Get(int& error) {
-    const std::lock_guard<std::mutex> lock(mutex_);
+    const MutexLock lock(mutex_);
     struct stat info {};
     FileVersion version;
     if (stat(file_.c_str(), &info) == 0) {
@@ -59,7 +59,7 @@ class ShareCache {
   }
 
  private:
-  void Take(SharesText read) {
+  void Take(SharesText read) KAVO_REQUIRES(mutex_) {
     const bool is_settled = IsSettled(read);
     // The text is kept until the file has settled, and only so long.
     const bool is_known =
@@ -82,7 +82,7 @@ class ShareCache {
     is_loaded_ = true;
   }
 
-  void Log(const FileVersion& version, const std::string& message) {
+  void Log(const FileVersion& version, const std::string& message) KAVO_REQUIRES(mutex_) {
     if (message != logged_ || version != logged_version_) {
       syslog(LOG_ERR, "kavoplatform: %s", message.c_str());
       logged_ = message;
@@ -91,13 +91,13 @@ class ShareCache {
   }
 
   const std::string file_;
-  std::mutex mutex_;
-  SharesText read_;                          // What the table was made from.
-  std::shared_ptr<const ShareTable> table_;  // Null when that is bad.
-  bool is_loaded_ = false;
-  bool is_settled_ = false;
-  std::string logged_;
-  FileVersion logged_version_;
+  Mutex mutex_;
+  SharesText read_ KAVO_GUARDED_BY(mutex_);  // What the table was made from.
+  std::shared_ptr<const ShareTable> table_ KAVO_GUARDED_BY(mutex_);  // Null when that is bad.
+  bool is_loaded_ KAVO_GUARDED_BY(mutex_) = false;
+  bool is_settled_ KAVO_GUARDED_BY(mutex_) = false;
+  std::string logged_ KAVO_GUARDED_BY(mutex_);
+  FileVersion logged_version_ KAVO_GUARDED_BY(mutex_);
 };
 
 }  // namespace

@@ -14,7 +14,7 @@
 // when the build has no root, as the tests would write to the system's own files then.
 class PrivateRoot {
  public:
-  PrivateRoot() {
+  explicit PrivateRoot(const std::string& parent = "/tmp") : folder_(parent) {
     setenv("FILEINDEX_ROOT", folder_.Path().c_str(), /*overwrite=*/1);
     if (kavo::local::Root() != folder_.Path()) {
       std::fputs("configure this build with FILEINDEX_ROOT, as the presets do\n", stderr);

@@ -2,8 +2,9 @@
 
 #include <algorithm>
 #include <deque>
-#include <mutex>
 #include <utility>
+
+#include "common/lock.h"
 
 namespace vexlo::fileindex {
 namespace {
@@ -17,13 +18,13 @@ struct KeptNote {
   ReindexNote note;
 };
 
-std::mutex& Guard() {
-  static std::mutex mutex;
-  return mutex;
-}
+struct KeptNotes {
+  Mutex mutex;
+  std::deque<KeptNote> notes VEXLO_GUARDED_BY(mutex);
+};
 
-std::deque<KeptNote>& Kept() {
-  static auto* const kept = new std::deque<KeptNote>;  // Threads may ask until the very end.
+KeptNotes& Kept() {
+  static auto* const kept = new KeptNotes;  // Threads may ask until the very end.
   return *kept;
 }
 
@@ -67,14 +68,15 @@ ReindexNote ReindexNotes::Take(const LineReader& reader) {
     return note;
   }
   {
-    const std::lock_guard lock(Guard());
-    const auto kept = std::find_if(Kept().begin(), Kept().end(),
+    KeptNotes& all = Kept();
+    const LockMutex lock(all.mutex);
+    const auto kept = std::find_if(all.notes.begin(), all.notes.end(),
                                    [&](const KeptNote& each) { return each.file == *file; });
-    if (kept == Kept().end()) {
+    if (kept == all.notes.end()) {
       return note;
     }
     note = std::move(kept->note);
-    Kept().erase(kept);
+    all.notes.erase(kept);
   }
   std::string before(std::min(note.tail_.size(), kTailBytes), '\0');
   const std::string_view tail =
@@ -90,12 +92,13 @@ void ReindexNotes::Keep(const LineReader& reader, ReindexNote note) {
   if (!file || note.offset_ == 0) {
     return;
   }
-  const std::lock_guard lock(Guard());
-  std::erase_if(Kept(), [&](const KeptNote& each) { return each.file == *file; });
-  if (Kept().size() >= kMostNotes) {
-    Kept().pop_front();
+  KeptNotes& all = Kept();
+  const LockMutex lock(all.mutex);
+  std::erase_if(all.notes, [&](const KeptNote& each) { return each.file == *file; });
+  if (all.notes.size() >= kMostNotes) {
+    all.notes.pop_front();
   }
-  Kept().push_back({*file, std::move(note)});
+  all.notes.push_back({*file, std::move(note)});
 }
 
 }  // namespace vexlo::fileindex

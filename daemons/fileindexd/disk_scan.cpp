@@ -82,11 +82,11 @@ DiskScan::DiskScan(std::string root, WalkRules rules, ContentRules content, uint
 
 DiskScan::~DiskScan() {
   {
-    const std::lock_guard lock(mutex_);
+    const kavo::local::MutexLock lock(mutex_);
     ending_ = true;
     batches_.clear();
   }
-  has_batch_.notify_one();
+  has_batch_.NotifyOne();
   thread_.join();
 }
 
@@ -98,15 +98,24 @@ std::optional<ScannedFolder> DiskScan::Next() {
     if (ahead_.empty()) {
       return std::nullopt;
     }
-    std::unique_lock lock(mutex_);
-    const Folder& first = *ahead_.front();
-    while (first.batches > 0) {
-      Help(lock);
-    }
-    ScannedFolder folder = {first.path + "/", first.digest, first.is_whole, first.error};
-    lock.unlock();
+    ScannedFolder folder = Finished(*ahead_.front());
     ahead_.pop_front();
     return folder;
+  }
+}
+
+// The folder once all in it is looked at, which may be done here.
+ScannedFolder DiskScan::Finished(const Folder& folder) {
+  for (;;) {
+    kavo::local::MutexLock lock(mutex_);
+    is_done_.Wait(lock,
+                  [&]() KAVO_REQUIRES(mutex_) { return folder.batches == 0 || !batches_.empty(); });
+    if (folder.batches == 0) {
+      return {folder.path + "/", folder.digest, folder.is_whole, folder.error};
+    }
+    const Batch batch = TakeBatch();
+    lock.Unlock();
+    LookAt(batch);
   }
 }
 
@@ -227,32 +236,27 @@ void DiskScan::Hand(Batch batch) {
   if (batch.count == 0) {
     return;
   }
-  std::unique_lock lock(mutex_);
-  ++batch.folder->batches;
-  if (batches_.size() >= kMostBatches) {
-    LookAt(batch, lock);
-    return;
+  {
+    const kavo::local::MutexLock lock(mutex_);
+    ++batch.folder->batches;
+    if (batches_.size() < kMostBatches) {
+      batches_.push_back(std::move(batch));
+      if (batches_.size() == 1) {
+        has_batch_.NotifyOne();
+      }
+      return;
+    }
   }
-  batches_.push_back(std::move(batch));
-  if (batches_.size() == 1) {
-    has_batch_.notify_one();
-  }
+  LookAt(batch);
 }
 
-// Looks at the first batch that waits, or waits itself.
-void DiskScan::Help(std::unique_lock<std::mutex>& lock) {
-  if (batches_.empty()) {
-    is_done_.wait(lock);
-    return;
-  }
-  const Batch batch = std::move(batches_.front());
+DiskScan::Batch DiskScan::TakeBatch() {
+  Batch batch = std::move(batches_.front());
   batches_.pop_front();
-  LookAt(batch, lock);
+  return batch;
 }
 
-// With the lock held but for the looking.
-void DiskScan::LookAt(const Batch& batch, std::unique_lock<std::mutex>& lock) {
-  lock.unlock();
+void DiskScan::LookAt(const Batch& batch) {
   Folder& folder = *batch.folder;
   daemon::FolderDigest digest;
   bool is_whole = true;
@@ -279,22 +283,24 @@ void DiskScan::LookAt(const Batch& batch, std::unique_lock<std::mutex>& lock) {
             : folder.contents->at(static_cast<size_t>(fileindex::GetFileTypeByFullPath(name)));
     digest.Add(daemon::EntryHash(seed_, name, FactsOf(info, content)));
   }
-  lock.lock();
+  const kavo::local::MutexLock lock(mutex_);
   folder.digest.Add(digest);
   folder.is_whole = folder.is_whole && is_whole;
   if (--folder.batches == 0) {
-    is_done_.notify_one();
+    is_done_.NotifyOne();
   }
 }
 
 void DiskScan::Work() {
-  std::unique_lock lock(mutex_);
   for (;;) {
-    has_batch_.wait(lock, [this] { return ending_ || !batches_.empty(); });
+    kavo::local::MutexLock lock(mutex_);
+    has_batch_.Wait(lock, [this]() KAVO_REQUIRES(mutex_) { return ending_ || !batches_.empty(); });
     if (ending_) {
       return;
     }
-    Help(lock);
+    const Batch batch = TakeBatch();
+    lock.Unlock();
+    LookAt(batch);
   }
 }
 

@@ -3,13 +3,11 @@
 #define DAEMONS_FILEINDEXD_DISK_SCAN_H_
 
 #include <array>
-#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
 #include <deque>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -18,6 +16,7 @@
 
 #include "daemons/common/entry_digest.h"
 #include "daemons/fileindexd/disk_walk.h"
+#include "kavo/local/mutex.h"
 
 namespace vexlo::fileindexd {
 
@@ -73,8 +72,9 @@ class DiskScan {
   void MeetFolder(const FolderPtr& folder, std::string path, Level* level, Batch* batch);
   bool WalkOn();
   void Hand(Batch batch);
-  void Help(std::unique_lock<std::mutex>& lock);
-  void LookAt(const Batch& batch, std::unique_lock<std::mutex>& lock);
+  ScannedFolder Finished(const Folder& folder);
+  Batch TakeBatch() KAVO_REQUIRES(mutex_);
+  void LookAt(const Batch& batch);
   void Work();
 
   const std::string root_;
@@ -90,11 +90,11 @@ class DiskScan {
   std::string name_;
 
   std::deque<FolderPtr> ahead_;  // Opened and not given yet.
-  std::mutex mutex_;             // Guards the rest, and what is counted in a folder.
-  std::condition_variable has_batch_;
-  std::condition_variable is_done_;
-  std::deque<Batch> batches_;
-  bool ending_ = false;
+  kavo::local::Mutex mutex_;     // Guards also what is counted in a folder.
+  kavo::local::Condition has_batch_;
+  kavo::local::Condition is_done_;
+  std::deque<Batch> batches_ KAVO_GUARDED_BY(mutex_);
+  bool ending_ KAVO_GUARDED_BY(mutex_) = false;
   std::thread thread_;  // Last: it uses the others.
 };
 

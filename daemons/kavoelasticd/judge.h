@@ -28,6 +28,10 @@ class Judge {
 
   bool IsThere() const { return socket_.Get() >= 0; }
 
+  // Returns when the process has ended, which it does only when it was killed, or when `quit` is
+  // readable: false. There is no other one then, as the rights to start it are gone.
+  bool AwaitEnd(int quit) const;
+
   // For each path whether the user may reach it and read it: modes, access control lists and groups
   // of each folder on the way and of the last component count as they do in open(). Nobody's
   // superuser: for uid 0 nothing is readable. Throws Failure kInternal when there is no answer in
@@ -39,8 +43,8 @@ class Judge {
                size_t count, std::vector<Verdict>& verdicts);
   std::string Receive();
 
-  std::mutex mutex_;  // Guards the rest.
   daemon::UniqueFd socket_;
+  std::mutex mutex_;         // Guards the rest, and what is sent and received.
   bool is_waiting_ = false;  // An answer that nobody waits for any more is still to come.
 };
 

@@ -60,11 +60,10 @@
 #include <thread>
 #include <vector>
 
+#include "bench/same_tables.h"
 #include "common/json.h"
 #include "daemons/common/frame_server.h"
 #include "daemons/kavoelasticd/engine.h"
-#include "daemons/kavoelasticd/pack.h"
-#include "daemons/kavoelasticd/rows.h"
 #include "daemons/kavoelasticd/server.h"
 #include "fileindex/elastic_control/share_index.h"
 #include "kavo/sock_connection.h"
@@ -339,123 +338,6 @@ Json::Value Rename(const Json::Value& document, const std::string& from, const s
   return item;
 }
 
-// The baseline of the same tables.
-class Same {
- public:
-  explicit Same(const std::string& folder)
-      : mappings_(vexlo::fileindex::elastic::GetFileIndexMappings()),
-        schema_(mappings_),
-        session_(Make(folder, mappings_), vexlo::elasticd::Connection::Use::kWrite, schema_,
-                 "english") {
-    session_.db.Run(
-        "PRAGMA synchronous=FULL; PRAGMA cache_size=-32768; PRAGMA wal_autocheckpoint=4000");
-  }
-
-  struct Document {
-    std::string path;
-    vexlo::elasticd::DocsRow docs;
-    std::string record;
-    vexlo::elasticd::ExactRows exact;
-    std::vector<std::pair<uint32_t, std::string>> bodies;
-    std::vector<vexlo::elasticd::TextRow> texts;
-  };
-
-  Document Rows(const Json::Value& data) {
-    vexlo::elasticd::StoredDocument document;
-    document.path = data[schema_.Key()].asString();
-    for (auto member = data.begin(); member != data.end(); ++member) {
-      if (member.name() != schema_.Key()) {
-        const uint32_t id = session_.Intern(member.name());
-        SetField(&document.record, id, session_.FieldOf(id), *member, document.path);
-      }
-    }
-    Document rows;
-    rows.path = document.path;
-    rows.docs = DocsRowOf(session_, document);
-    rows.record = document.record.Encode();
-    rows.exact = ExactRowsOf(session_, document);
-    for (const vexlo::elasticd::Item& item : document.record.Items()) {
-      if (item.kind == vexlo::elasticd::Kind::kBody) {
-        rows.bodies.emplace_back(item.field, item.bytes);
-      }
-    }
-    rows.texts = {
-        TextRowOf(session_, document, vexlo::elasticd::kTexts, schema_.TextColumns().size()),
-        TextRowOf(session_, document, vexlo::elasticd::kWordTable, 3),
-        TextRowOf(session_, document, vexlo::elasticd::kGramTable, schema_.GramColumns().size())};
-    return rows;
-  }
-
-  void Insert(const Document& document) {
-    using vexlo::elasticd::Sql;
-    vexlo::elasticd::Connection& db = session_.db;
-    Sql(db, "INSERT INTO records(record) VALUES(?)").Blob(document.record).Run();
-    const int64_t id = db.LastInsertId();
-    Sql(db, "INSERT INTO docs(id, path, ext, size, mtime) VALUES(?,?,?,?,?)")
-        .Int(id)
-        .Blob(document.path)
-        .Blob(*document.docs.extension)
-        .Int(*document.docs.size)
-        .Int(*document.docs.modified)
-        .Run();
-    for (const auto& [field, value] : document.exact) {
-      Sql(db, "INSERT INTO exact VALUES(?,?,?)").Int(field).Blob(value).Int(id).Run();
-    }
-    for (const auto& [field, text] : document.bodies) {
-      const std::string packed = vexlo::elasticd::Pack(text);
-      Sql(db, "INSERT INTO bodies VALUES(?,?)")
-          .Int(vexlo::elasticd::BodyId(id, field))
-          .Blob(packed)
-          .Run();
-    }
-    for (size_t table = 0; table < document.texts.size(); ++table) {
-      const vexlo::elasticd::TextRow& row = document.texts[table];
-      if (std::all_of(row.begin(), row.end(), [](const std::string& t) { return t.empty(); })) {
-        continue;
-      }
-      Sql insert(db, inserts_[table]);
-      insert.Int(id);
-      for (const std::string& text : row) {
-        insert.Text(text);
-      }
-      insert.Run();
-    }
-  }
-
-  void Execute(const char* sql) { session_.db.Run(sql); }
-
- private:
-  static std::string Make(const std::string& folder, const Json::Value& mappings) {
-    vexlo::elasticd::Store::Create(folder + "/same", {"token", mappings, {}, {}});
-    return vexlo::elasticd::DatabaseFile(folder + "/same");
-  }
-  static std::string InsertSql(const std::string& table, const std::string& columns, size_t count) {
-    std::string marks;
-    for (size_t i = 0; i < count; ++i) {
-      marks += ",?";
-    }
-    return "INSERT INTO " + table + "(rowid" + columns + ") VALUES(?" + marks + ")";
-  }
-  static std::string Numbered(char letter, size_t count) {
-    std::string columns;
-    for (size_t i = 0; i < count; ++i) {
-      columns += ',';
-      columns += letter;
-      columns += std::to_string(i);
-    }
-    return columns;
-  }
-
-  const Json::Value mappings_;
-  const vexlo::elasticd::Schema schema_;
-  vexlo::elasticd::Session session_;
-  const std::string inserts_[3] = {
-      InsertSql("texts", Numbered('t', schema_.TextColumns().size()), schema_.TextColumns().size()),
-      InsertSql("words", ",name,rest,other", 3),
-      InsertSql("grams", Numbered('g', schema_.GramColumns().size()),
-                schema_.GramColumns().size())};
-};
-
 // The simple baseline.
 class Bare {
  public:
@@ -599,16 +481,16 @@ double InsertAll(Baseline& baseline, const std::vector<typename Baseline::Docume
 
 // Documents from..to through the engine and into the baselines, in turn by parts so that a noisy
 // moment meets all. Returns the engine's seconds for one.
-double Upsert(const Report& report, const EngineProcess& engine, Same& same, Bare& bare,
-              const std::vector<Json::Value>& documents, size_t from, size_t to, size_t clients,
-              size_t commit_every) {
+double Upsert(const Report& report, const EngineProcess& engine, bench::SameTables& same,
+              Bare& bare, const std::vector<Json::Value>& documents, size_t from, size_t to,
+              size_t clients, size_t commit_every) {
   double ours = 0;
   double same_tables = 0;
   double simple = 0;
   for (size_t begin = from; begin < to; begin += commit_every) {
     const size_t end = std::min(begin + commit_every, to);
     std::vector<std::string> requests;
-    std::vector<Same::Document> rows;
+    std::vector<bench::SameTables::Document> rows;
     std::vector<Bare::Document> bare_documents;
     for (size_t i = begin; i < end; ++i) {
       requests.push_back(vexlo::JsonToString(UpsertOf(documents[i])));
@@ -798,7 +680,7 @@ void TreeCases(const Report& report, const EngineProcess& engine, size_t count,
 void Run(const Report& report, size_t count, size_t tree, const std::string& folder) {
   const EngineProcess engine(folder);  // Before anything here has threads.
   CreateIndex(engine, "bench", folder);
-  Same same(folder);
+  bench::SameTables same(folder);
   Bare bare(folder);
 
   Corpus corpus;

@@ -405,8 +405,7 @@ void Examination::LookAtNotifyDaemon() {
       if (std::none_of(roots.begin(), roots.end(),
                        [&](const std::string& root) { return IsSameOrBelow(path, root); })) {
         Add(Severity::kError, "nobody watches the indexed folder '" + path + "'",
-            "fileindex folder delete " + Quoted(folder->GetPath()) + " && fileindex folder add " +
-                Quoted(path));
+            "fileindex folder set " + Quoted(folder->GetPath()));
       }
     }
   }

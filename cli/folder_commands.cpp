@@ -78,13 +78,51 @@ ExitStatus Add(const Arguments& arguments, const Console& console) {
   return kDone;
 }
 
+// Nobody is to watch folders in the name of a share that is gone, or elsewhere by now. `paths` are
+// the share paths of its folders.
+void ForgetQueues(const std::vector<std::string>& paths) {
+  const auto was_its = [&paths](const kavo::local::MonitoredFolder& folder) {
+    return SharePathOf(folder.path).empty() &&
+           std::any_of(paths.begin(), paths.end(),
+                       [&folder](const std::string& path) { return folder.path.ends_with(path); });
+  };
+  for (const kavo::local::RegisteredQueue& queue : kavo::local::ReadMonitorQueues().queues) {
+    if (!queue.folders.empty() &&
+        std::all_of(queue.folders.begin(), queue.folders.end(), was_its)) {
+      if (!EVNOTIFYD::MonitorQueue::Delete(queue.queue, queue.app,
+                                           EVNOTIFYD::MONITOR_QUEUE_TYPE_APPLICATION)) {
+        throw Failure("the folders stay watched: the registration of '" + ForTerminal(queue.app) +
+                      "' cannot be changed");
+      }
+      Unlink(queue.queue);
+      Unlink(queue.queue + ".tmp");
+    }
+  }
+}
+
+// The share paths of the indexed folders of the share that the folder is in.
+std::vector<std::string> FoldersBeside(const std::string& path) {
+  std::vector<std::string> paths;
+  WithFolders([&] {
+    const FolderMgr folders;
+    std::shared_ptr<fileindex::Folder> folder;
+    folders.Get(folder, path);
+    for (const auto& each : folders.GetFolders()) {
+      if (each->GetShare() == folder->GetShare()) {
+        paths.push_back(each->GetPath());
+      }
+    }
+  });
+  return paths;
+}
+
 ExitStatus Set(const Arguments& arguments, const Console& console) {
   const std::string path = ToSharePath(arguments.positional[0]);
   Json::Value record;
   WithFolders([&] { fileindex::FolderGet(record, path); });
   const Json::Value before = record;
   ApplyOptions(record, arguments);
-  if (record == before) {
+  if (record == before && !arguments.options.empty()) {
     console.err << "nothing to change\n";
     return kNothingFound;
   }
@@ -95,7 +133,11 @@ ExitStatus Set(const Arguments& arguments, const Console& console) {
   ChangeFolders(
       console, paths, [&] { fileindex::FolderSet(records, /*updater_mode=*/false); }, [] {},
       /*mendable=*/-1);
-  console.out << "changed: " << ForTerminal(path) << " (" << TypesOf(record) << ")\n";
+  if (record == before) {
+    ForgetQueues(FoldersBeside(path));
+  }
+  console.out << (record == before ? "renewed: " : "changed: ") << ForTerminal(path) << " ("
+              << TypesOf(record) << ")\n";
   return kDone;
 }
 
@@ -267,24 +309,7 @@ void ForgetShare(const std::string& share, const std::vector<std::string>& paths
     console.err << "the index of '" << ForTerminal(share)
                 << "' stays: " << ForTerminal(error.what()) << "\n";
   }
-  const auto was_its = [&paths](const kavo::local::MonitoredFolder& folder) {
-    return SharePathOf(folder.path).empty() &&
-           std::any_of(paths.begin(), paths.end(),
-                       [&folder](const std::string& path) { return folder.path.ends_with(path); });
-  };
-  for (const kavo::local::RegisteredQueue& queue : kavo::local::ReadMonitorQueues().queues) {
-    if (!queue.folders.empty() &&
-        std::all_of(queue.folders.begin(), queue.folders.end(), was_its)) {
-      if (!EVNOTIFYD::MonitorQueue::Delete(queue.queue, queue.app,
-                                           EVNOTIFYD::MONITOR_QUEUE_TYPE_APPLICATION)) {
-        throw Failure("the folders of '" + ForTerminal(share) +
-                      "' stay watched and listed: the registration of " + queue.app +
-                      " cannot be changed");
-      }
-      Unlink(queue.queue);
-      Unlink(queue.queue + ".tmp");
-    }
-  }
+  ForgetQueues(paths);
   fileindex::StatusMgr().ClearShareStatus(share);
 }
 
@@ -348,6 +373,8 @@ std::vector<Command> FolderCommands() {
        "changes how a folder is indexed",
        "Changes what the options name and nothing else. FOLDER is a full path or a share path.\n"
        "What is indexed otherwise now is indexed again. Exit status 1 when nothing changes.\n"
+       "Without options the folder is set as it is: the daemons are told of it once more, which a\n"
+       "share that has moved wants.\n"
        "\n"
        "  fileindex folder set /photo/2019 --types photo\n",
        RecordOptions(),

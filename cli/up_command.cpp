@@ -305,6 +305,8 @@ ExitStatus Up(const Arguments& arguments, const Console& console) {
   Json::Value fields;
   fields["call"] = OwnCall() + " search WORD...";
   voice.Say("search", "search with: " + fields["call"].asString(), fields);
+  fields["call"] = OwnCall() + " web";
+  voice.Say("web", "or with a browser: " + fields["call"].asString(), fields);
   voice.Say("following", "following changes; Ctrl-C ends it");
   std::map<std::string, uint64_t> operations;
   const Json::Value shares_now = AskShares();

@@ -1,6 +1,5 @@
 #include "daemons/fileindexd/indexer.h"
 
-#include <linux/ioprio.h>
 #include <sys/resource.h>
 #include <sys/syscall.h>
 #include <unistd.h>
@@ -22,6 +21,10 @@ constexpr Json::ArrayIndex kMostInRequest = 64;
 // Of text; what else is in a document is small.
 constexpr size_t kEnoughBytes = size_t{1} << 20;
 constexpr int kNice = 10;
+
+// As in <linux/ioprio.h>, of which some versions are no C++.
+constexpr int kThread = 1;
+constexpr int kBestEffort = 2 << 13;
 constexpr int kLowestOfBestEffort = 7;
 
 size_t TextBytes(const Json::Value& item) {
@@ -43,8 +46,7 @@ void LowerPriority() {
   // Both are a thread's own on Linux. Where they are refused the work is done all the same.
   const auto thread = static_cast<id_t>(gettid());
   setpriority(PRIO_PROCESS, thread, kNice);
-  syscall(SYS_ioprio_set, IOPRIO_WHO_PROCESS, 0,
-          IOPRIO_PRIO_VALUE(IOPRIO_CLASS_BE, kLowestOfBestEffort));
+  syscall(SYS_ioprio_set, kThread, 0, kBestEffort | kLowestOfBestEffort);
 }
 
 struct Indexer::Batch {

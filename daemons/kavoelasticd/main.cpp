@@ -56,15 +56,17 @@ int main(int argc, char** argv) {
     vexlo::elasticd::Engine engine(kavo::local::Root() + "/var/lib/kavo/elastic/indexes.json");
     const std::jthread committer(CommitIdle, std::ref(engine));
     const std::jthread ending(EndWithJudge, std::cref(*judge), std::ref(daemon));
+    vexlo::elasticd::RequestStats stats;
     const auto search = [&](const Json::Value& request, const vexlo::daemon::Peer& peer) {
       const bool sees_all = peer.uid == 0 || peer.uid == geteuid();
       const auto ask = [&](const std::vector<std::string>& paths) {
         return judge->Ask(peer, paths);
       };
-      return engine.HandleSearch(
-          request, sees_all ? vexlo::elasticd::JudgePaths() : vexlo::elasticd::JudgePaths(ask));
+      return stats.Measure(request, [&](const Json::Value& asked) {
+        return engine.HandleSearch(
+            asked, sees_all ? vexlo::elasticd::JudgePaths() : vexlo::elasticd::JudgePaths(ask));
+      });
     };
-    vexlo::elasticd::RequestStats stats;
     const auto answer = [&](const Json::Value& request) {
       return stats.Answer(request, [&](const Json::Value& asked) { return engine.Handle(asked); });
     };

@@ -24,6 +24,9 @@ constexpr std::array kNames = {"commit",
                                "search"};
 
 std::string NameOf(const Json::Value& request) {
+  if (!request.isObject()) {
+    return "other";
+  }
   if (request.isMember("compound")) {
     return "compound";
   }
@@ -37,9 +40,14 @@ std::string NameOf(const Json::Value& request) {
 
 Json::Value RequestStats::Answer(const Json::Value& request,
                                  const std::function<Json::Value(const Json::Value&)>& handle) {
-  if (request["command"] == "stats") {
+  if (request.isObject() && request["command"] == "stats") {
     return ToJson();
   }
+  return Measure(request, handle);
+}
+
+Json::Value RequestStats::Measure(const Json::Value& request,
+                                  const std::function<Json::Value(const Json::Value&)>& handle) {
   const auto began = std::chrono::steady_clock::now();
   Json::Value reply = handle(request);
   Count(request, reply, std::chrono::steady_clock::now() - began);

@@ -21,9 +21,13 @@ class RequestStats {
   static constexpr std::array<double, 10> kBounds = {0.0005, 0.001, 0.005, 0.01, 0.05,
                                                      0.1,    0.5,   1,     5,    30};
 
-  // Has `handle` answer the request, and counts it; "stats" is answered here.
+  // As Measure(), but "stats" is answered here.
   Json::Value Answer(const Json::Value& request,
                      const std::function<Json::Value(const Json::Value&)>& handle);
+
+  // Has `handle` answer the request, and counts it.
+  Json::Value Measure(const Json::Value& request,
+                      const std::function<Json::Value(const Json::Value&)>& handle);
 
  private:
   // A request that was answered with `reply` after `time`. Commands that the engine does not know

@@ -68,6 +68,6 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   }
   fuzz::Require(service.Answer(R"({"type":"stats"})").starts_with("{"),
                 "the service answers no more");
-  fuzz::Require(service.Stop(std::chrono::seconds(5)), "a worker does not end");
+  fuzz::Require(service.Stop(std::chrono::seconds(60)), "a worker does not end");
   return 0;
 }

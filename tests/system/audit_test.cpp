@@ -462,7 +462,8 @@ TEST_F(AuditTest, TheDoctorFindsWhatIsWrong) {
              "state":"degraded","watches":100000000}]})"});
        },
        {"warning  evnotifyd: not all changes are seen at once for /q: 4 watches are needed",
-        "error    evnotifyd: nobody watches the indexed folder '" + docs_ + "/in'\n",
+        "error    evnotifyd: nobody watches the indexed folder '" + docs_ +
+            "/in'\n         $ fileindex folder set '",
         "warning  inotify: 100,000,000 folders are watched of ",
         "         $ sudo sysctl fs.inotify.max_user_watches=200016384\n",
         "warning  inotify: events were lost 2 times"},

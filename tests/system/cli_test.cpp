@@ -147,6 +147,7 @@ const CliCase kFolderCases[] = {
     {"Groups", "folder groups", 0, "work\n", ""},
     {"Set", "folder set /docs --types none --group ''", 0, "changed: /docs (none)\n", ""},
     {"SetNothing", "folder set /docs --types none", 1, "", "nothing to change"},
+    {"SetAsItIs", "folder set /docs", 0, "renewed: /docs (none)\n", ""},
     {"Reindex", "folder reindex vol/docs", 0, "to be indexed again: /docs\n", "waits for it"},
     {"ReindexElsewhere", "folder reindex vol", 3, "", "'vol' lies in no share"},
     {"Status", "status --json", 0, "\"processing\"\n", "fileindexd does not run"},

@@ -378,11 +378,11 @@ class Torture {
     }
     const std::string types = tree_.Below(2) == 0 ? " --types document" : " --types document,photo";
     warrants_.at(kTool).Sign(moment.calls, 1 + tree_.Below(moment.most));
-    return stack_.Tool(
-               std::string(moment.command) + folder + (moment.command == kDelete ? "" : types),
-               warrants_.at(kTool).Prefix(),
-               kHasModule ? std::chrono::seconds(60)
-                          : std::chrono::milliseconds(1 + tree_.Below(30))) == 128 + SIGKILL;
+    last_command_ = std::string(moment.command) + folder + (moment.command == kDelete ? "" : types);
+    return stack_.Tool(last_command_, warrants_.at(kTool).Prefix(),
+                       kHasModule
+                           ? std::chrono::seconds(60)
+                           : std::chrono::milliseconds(1 + tree_.Below(30))) == 128 + SIGKILL;
   }
 
   bool KillJudge() {

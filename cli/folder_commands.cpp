@@ -89,8 +89,11 @@ void ForgetQueues(const std::vector<std::string>& paths) {
   for (const kavo::local::RegisteredQueue& queue : kavo::local::ReadMonitorQueues().queues) {
     if (!queue.folders.empty() &&
         std::all_of(queue.folders.begin(), queue.folders.end(), was_its)) {
-      EVNOTIFYD::MonitorQueue::Delete(queue.queue, queue.app,
-                                      EVNOTIFYD::MONITOR_QUEUE_TYPE_APPLICATION);
+      if (!EVNOTIFYD::MonitorQueue::Delete(queue.queue, queue.app,
+                                           EVNOTIFYD::MONITOR_QUEUE_TYPE_APPLICATION)) {
+        throw Failure("the folders stay watched: the registration of '" + ForTerminal(queue.app) +
+                      "' cannot be changed");
+      }
       Unlink(queue.queue);
       Unlink(queue.queue + ".tmp");
     }
@@ -323,16 +326,15 @@ ExitStatus Prune(const Arguments& /*arguments*/, const Console& console) {
         console.out << "pruned: " << ForTerminal(folder->GetPath()) << "\n";
       }
     }
+    // The list last: what is interrupted is found there and done again.
     for (const auto& [share, paths] : gone) {
+      ForgetShare(share, paths, console);
       folders.DeleteByShare(share);
     }
     if (!gone.empty()) {
       folders.Save();
     }
   });
-  for (const auto& [share, paths] : gone) {
-    ForgetShare(share, paths, console);
-  }
   if (gone.empty()) {
     console.err << "the share of every folder is there\n";
   }

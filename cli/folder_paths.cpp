@@ -7,6 +7,7 @@
 #include "common/sdk/share.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/util/share_path.h"
+#include "kavo/last_error.h"
 
 namespace vexlo::cli {
 
@@ -17,6 +18,9 @@ std::string SharePathOf(const std::string& full_path) {
   try {
     fileindex::GetShareNamePathByFullPath(share_name, share_dir, full_path);
   } catch (const Error&) {
+    if (KLIBCErrGet() != KAVO_ERR_NOT_FOUND) {
+      throw;  // Nobody can tell at present; the folder must not be made a share of its own.
+    }
     return "";
   }
   return "/" + share_name + full_path.substr(share_dir.size());

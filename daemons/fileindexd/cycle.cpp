@@ -67,6 +67,7 @@ Cycle::Cycle(const std::string& share, const std::string& share_path, std::strin
       cause_(std::move(cause)),
       scope_(share, share_path),
       state_(state),
+      missed_(state.missed),
       stats_(stats),
       is_interrupted_(std::move(is_interrupted)),
       indexer_(id_, stats, is_interrupted_),
@@ -218,7 +219,7 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
   facts.new_inode = InodeOf(now);
   RenameStep step = PlanRename(facts);
   // What was handed over before this may be of what came after it: see touched_.
-  const bool has_missed = state_.missed.HaveBelow(path_old);
+  const bool has_missed = missed_.HaveBelow(path_old);
   const bool is_mixed = has_missed || WasTouched(path) || WasTouched(path_old);
   ForgetMissed(path_old);
   ForgetTaken(path);
@@ -359,7 +360,7 @@ void Cycle::Reconcile(const std::string& root, const Json::Value& types, const c
   const std::vector<std::string>& folders = scope_.Folders();
   if (std::all_of(folders.begin(), folders.end(),
                   [&](const std::string& folder) { return IsSameOrBelow(folder, root); })) {
-    state_.missed.Clear();
+    missed_.Clear();
     state_changed_ = true;
   }
   ForgetMissed(root);
@@ -384,6 +385,7 @@ void Cycle::Reconcile(const std::string& root, const Json::Value& types, const c
   deeds.commit = [this] { Commit(); };
   deeds.save = [this](const CrawlPoint& reached) {
     state_.crawl = reached;
+    NoteGone();  // What goes on from there does not meet them again.
     SaveShareState(ShareStateFile(share_), state_);
   };
   deeds.progress = [this](uint64_t found, bool is_end) {
@@ -484,13 +486,20 @@ void Cycle::Submit(const std::string& path) {
 
 void Cycle::NoteMissed(const std::string& path) {
   state_.missed.Note(path);
+  missed_.Note(path);
   state_changed_ = true;
 }
 
 void Cycle::ForgetMissed(const std::string& path) {
-  if (state_.missed.HaveBelow(path)) {
-    state_.missed.Forget(path);
+  if (missed_.HaveBelow(path)) {
+    missed_.Forget(path);
     state_changed_ = true;
+  }
+}
+
+void Cycle::NoteGone() {
+  for (const std::string& path : indexer_.TakeGone()) {
+    NoteMissed(path);
   }
 }
 
@@ -616,9 +625,8 @@ void Cycle::RemoveGhosts() {
 void Cycle::Finish() {
   RemoveGhosts();
   Commit();
-  for (const std::string& path : indexer_.TakeGone()) {
-    NoteMissed(path);
-  }
+  NoteGone();
+  state_.missed = missed_;
   if (state_changed_) {
     SaveShareState(ShareStateFile(share_), state_);
     state_changed_ = false;

@@ -75,6 +75,7 @@ class Cycle {
   void DeleteUnwanted(const std::string& path);
   void NoteMissed(const std::string& path);
   void ForgetMissed(const std::string& path);
+  void NoteGone();
   void ForgetTaken(const std::string& path);
   void NoteMove(const std::string& path, const std::string& path_old);
   void ReconcileMovedFrom(const std::string& path, bool only_from_above);
@@ -95,6 +96,9 @@ class Cycle {
   const std::string cause_;
   const Scope scope_;
   ShareState& state_;
+  // What is left of the state's. There nothing is forgotten before the commit: a cycle that is done
+  // again has to find what this one has found.
+  MissedPaths missed_;
   Stats& stats_;
   const std::function<bool()> is_interrupted_;
   Indexer indexer_;

@@ -8,6 +8,7 @@
 #include <ctime>
 #include <deque>
 #include <future>
+#include <new>
 #include <utility>
 
 #include "common/check.h"
@@ -93,6 +94,13 @@ bool Parse(const std::string& path, bool content, Json::Value* fields) {
   try {
     KAVO::CONTENT_EXTRACT::ParseFile(path, options, *fields);
     return fields->isObject();
+  } catch (const std::bad_alloc&) {
+    throw;  // The file is as good as before, and is read when there is memory.
+  } catch (const Json::RuntimeError& error) {
+    if (std::string_view(error.what()).find("allocate") != std::string_view::npos) {
+      throw std::bad_alloc();
+    }
+    return false;
   } catch (...) {  // The platform's may throw anything.
     return false;
   }

@@ -58,12 +58,25 @@ struct Indexer::Batch {
 Indexer::Indexer(std::string id, Stats& stats, std::function<bool()> is_interrupted)
     : id_(std::move(id)), stats_(stats), is_interrupted_(std::move(is_interrupted)) {
   threads_.reserve(kThreads);
-  for (size_t i = 0; i < kThreads; ++i) {
-    threads_.emplace_back([this] { Work(); });
+  try {
+    for (size_t i = 0; i < kThreads; ++i) {
+      threads_.emplace_back([this] {
+        try {
+          Work();
+        } catch (...) {  // There is no memory even to begin.
+          Fail(std::current_exception());
+        }
+      });
+    }
+  } catch (...) {
+    End();
+    throw;
   }
 }
 
-Indexer::~Indexer() {
+Indexer::~Indexer() { End(); }
+
+void Indexer::End() {
   {
     const kavo::local::MutexLock lock(mutex_);
     ending_ = true;

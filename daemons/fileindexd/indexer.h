@@ -63,6 +63,7 @@ class Indexer {
   };
   struct Batch;
 
+  void End();
   void Work();
   bool TakeJob(bool may_wait, Job* job);
   void Extract(const Job& job, Batch* batch);

@@ -108,15 +108,15 @@ Json::Value Service::Carry(const std::string& type, const Json::Value& data) {
   } else if (type == "worker_create") {
     Post([this, share = ShareOf(data)] { Create(share); });
   } else if (type == "worker_delete") {
-    Post([this, share = ShareOf(data)] { Delete(share); });
+    Post([this, share = ShareOf(data)] { Delete(share, /*unless_indexed=*/false); });
   } else if (type == "notify_setting_changed") {
     bool is_upsert = false;
     GetJsonValue(is_upsert, data, "is_upsert", /*required=*/false);
     Post([this, share = ShareOf(data), is_upsert] {
-      if (const auto worker = Find(share)) {
-        worker->Kick();
-      } else if (is_upsert) {
+      if (is_upsert) {
         Create(share);
+      } else {
+        Delete(share, /*unless_indexed=*/true);
       }
     });
   } else {
@@ -203,12 +203,17 @@ void Service::Create(const std::string& share) {
   workers_.emplace(share, std::move(worker));
 }
 
-void Service::Delete(const std::string& share) {
+void Service::Delete(const std::string& share, bool unless_indexed) {
+  const bool is_indexed = fileindex::FolderMgr().IsShareIndexed(share);
   std::shared_ptr<Worker> worker;
   {
     const kavo::local::MutexLock lock(mutex_);
     const auto found = workers_.find(share);
     if (found == workers_.end()) {
+      return;
+    }
+    if (is_indexed && unless_indexed) {
+      found->second->Kick();
       return;
     }
     worker = std::move(found->second);
@@ -217,7 +222,7 @@ void Service::Delete(const std::string& share) {
   worker->Stop();
   worker.reset();
   // A share that is indexed no more starts from nothing when it comes back.
-  if (!fileindex::FolderMgr().IsShareIndexed(share)) {
+  if (!is_indexed) {
     (void)remove(ShareStateFile(share).c_str());
   }
 }

@@ -53,7 +53,9 @@ class Service {
   void Run();
   void StartIndexedShares();
   void Create(const std::string& share);
-  void Delete(const std::string& share);
+  // With `unless_indexed` a share that has folders keeps its worker, which looks at everything
+  // anew.
+  void Delete(const std::string& share, bool unless_indexed);
   void KickAll();
   std::shared_ptr<Worker> Find(const std::string& share);
 

@@ -130,7 +130,10 @@ Json::Value Worker::Describe() const {
 void Worker::Run() {
   state_ = LoadShareState(ShareStateFile(share_));
   while (!stopping_) {
-    kicked_ = false;
+    if (kicked_.exchange(false)) {
+      wait_ = std::chrono::seconds(0);
+      has_unread_ = true;  // To be asked of the engine, which may have lost the index.
+    }
     const Outcome outcome = RunGuarded();
     if (!stopping_) {
       WaitAfter(outcome);

@@ -176,6 +176,13 @@ Judge::Judge() {
   socket_ = std::move(ours);
 }
 
+bool Judge::AwaitEnd(int quit) const {
+  struct pollfd fds[] = {{socket_.Get(), 0, 0}, {quit, POLLIN, 0}};
+  while (poll(fds, 2, -1) <= 0) {
+  }
+  return fds[1].revents == 0;
+}
+
 std::vector<Verdict> Judge::Ask(const daemon::Peer& peer, const std::vector<std::string>& paths) {
   std::vector<Verdict> verdicts;
   verdicts.reserve(paths.size());

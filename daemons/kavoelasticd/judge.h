@@ -28,6 +28,10 @@ class Judge {
 
   bool IsThere() const { return socket_.Get() >= 0; }
 
+  // Returns when the process has ended, which it does only when it was killed, or when `quit` is
+  // readable: false. There is no other one then, as the rights to start it are gone.
+  bool AwaitEnd(int quit) const;
+
   // For each path whether the user may reach it and read it: modes, access control lists and groups
   // of each folder on the way and of the last component count as they do in open(). Nobody's
   // superuser: for uid 0 nothing is readable. Throws Failure kInternal when there is no answer in
@@ -39,10 +43,10 @@ class Judge {
                size_t count, std::vector<Verdict>& verdicts) KAVO_REQUIRES(mutex_);
   std::string Receive() KAVO_REQUIRES(mutex_);
 
-  kavo::local::Mutex mutex_;  // One question at a time.
   daemon::UniqueFd socket_;
-  bool is_waiting_ KAVO_GUARDED_BY(mutex_) =
-      false;  // An answer that nobody waits for any more is still to come.
+  kavo::local::Mutex mutex_;  // One question at a time.
+  // An answer that nobody waits for any more is still to come.
+  bool is_waiting_ KAVO_GUARDED_BY(mutex_) = false;
 };
 
 }  // namespace vexlo::elasticd

@@ -1,3 +1,4 @@
+#include <sys/eventfd.h>
 #include <unistd.h>
 
 #include <chrono>
@@ -34,6 +35,17 @@ void CommitIdle(const std::stop_token& stop, vexlo::elasticd::Engine& engine) {
   }
 }
 
+// Without the judge the searches of most users fail for good, and only a start makes another.
+void EndWithJudge(const std::stop_token& stop, const vexlo::elasticd::Judge& judge,
+                  vexlo::daemon::Daemon& daemon) {
+  const vexlo::daemon::UniqueFd quit(eventfd(0, EFD_CLOEXEC));
+  const std::stop_callback wake(stop, [&quit] { eventfd_write(quit.Get(), 1); });
+  if (judge.IsThere() && judge.AwaitEnd(quit.Get())) {
+    daemon.EndAtOnce("the process that judges who may read what was killed",
+                     vexlo::daemon::kFailed);
+  }
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -43,6 +55,7 @@ int main(int argc, char** argv) {
   return RunDaemon(options, argc, argv, [&judge](vexlo::daemon::Daemon& daemon) {
     vexlo::elasticd::Engine engine(kavo::local::Root() + "/var/lib/kavo/elastic/indexes.json");
     const std::jthread committer(CommitIdle, std::ref(engine));
+    const std::jthread ending(EndWithJudge, std::cref(*judge), std::ref(daemon));
     vexlo::elasticd::RequestStats stats;
     const auto search = [&](const Json::Value& request, const vexlo::daemon::Peer& peer) {
       const bool sees_all = peer.uid == 0 || peer.uid == geteuid();

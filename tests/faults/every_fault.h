@@ -71,6 +71,8 @@ struct FaultyWork {
   // Called without faults. Whether it was done (`done`) or not (the error), what is there has to be
   // right; `lasts` when all calls after the first failed, too.
   std::function<void(bool done, bool lasts)> judge;
+  // Otherwise the process may end when there is no memory at all, as if it were killed.
+  bool bears_lasting_no_memory = true;
 };
 
 // Bits of a child's exit status.
@@ -118,9 +120,10 @@ inline unsigned RunWithEveryFault(const FaultyWork& work, unsigned usual_step = 
   std::minstd_rand random(FaultsFromEnvironment("FAULTS_SEED", 1));
   unsigned faults = 0;
   for (const FaultKind& kind : kFaultKinds) {
-    const unsigned step = FaultsFromEnvironment(
-        "FAULTS_STEP", kind.error == ENOMEM ? std::max(usual_step, 16U) : usual_step);
-    for (int lasts = 0; lasts <= (kind.may_last ? 1 : 0); ++lasts) {
+    const unsigned step =
+        FaultsFromEnvironment("FAULTS_STEP", kind.error == ENOMEM ? 16 * usual_step : usual_step);
+    const bool may_last = kind.may_last && (work.bears_lasting_no_memory || kind.error != ENOMEM);
+    for (int lasts = 0; lasts <= (may_last ? 1 : 0); ++lasts) {
       int outcome = 0;
       int failures = 0;
       for (long at = 1; (outcome & kNotReached) == 0 && failures < kEnoughFailures;

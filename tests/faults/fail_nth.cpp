@@ -8,6 +8,7 @@
 #include <sys/epoll.h>
 #include <sys/file.h>
 #include <sys/inotify.h>
+#include <sys/mman.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/syscall.h>
@@ -17,6 +18,7 @@
 #include <atomic>
 #include <cerrno>
 #include <climits>
+#include <csignal>
 #include <cstdarg>
 #include <cstdint>
 #include <cstdlib>
@@ -29,6 +31,8 @@ char report[PATH_MAX];
 std::atomic<bool> armed = false;
 std::atomic<long> left = 0;
 std::atomic<const char*> failed = nullptr;
+DeathOrder* death = nullptr;
+pid_t mortal = 0;  // Not the processes that it forks.
 
 // Past the functions of this file, and of what may call them.
 void Report(const char* name) {
@@ -38,9 +42,9 @@ void Report(const char* name) {
   syscall(SYS_close, fd);
 }
 
-bool IsChosen(const char* name) {
+bool IsAmong(const char* calls, const char* name) {
   const size_t length = strlen(name);
-  for (const char* at = current.calls; (at = strstr(at, name)) != nullptr; at += length) {
+  for (const char* at = calls; (at = strstr(at, name)) != nullptr; at += length) {
     if (at[-1] == ',' && at[length] == ',') {
       return true;
     }
@@ -71,9 +75,17 @@ int NoteRuntime(dl_phdr_info* info, size_t /*size*/, void* /*data*/) {
   return 0;
 }
 
+void DieIfOrdered(const char* name) {
+  if (death != nullptr && death->left > 0 && IsAmong(death->calls, name) && getpid() == mortal &&
+      --death->left == 0) {
+    kill(mortal, SIGKILL);
+  }
+}
+
 // Whether this call fails, with errno set.
 bool Fires(const char* name) {
-  if (!armed || !IsChosen(name)) {
+  DieIfOrdered(name);
+  if (!armed || !IsAmong(current.calls, name)) {
     return false;
   }
   const long rest = --left;
@@ -250,6 +262,19 @@ long Number(const char* name) {
   return text == nullptr ? 0 : strtol(text, nullptr, 10);
 }
 
+void TakeDeathOrders() {
+  const char* const file = getenv("FAIL_DEATH");
+  if (file == nullptr) {
+    return;
+  }
+  const auto fd = static_cast<int>(syscall(SYS_openat, AT_FDCWD, file, O_RDWR | O_CLOEXEC));
+  void* const shared = mmap(nullptr, sizeof(DeathOrder), PROT_READ | PROT_WRITE, MAP_SHARED, fd, 0);
+  syscall(SYS_close, fd);
+  mortal = getpid();
+  death = shared == MAP_FAILED ? nullptr : static_cast<DeathOrder*>(shared);
+  unsetenv("FAIL_DEATH");
+}
+
 void ArmFromEnvironment() {
   const char* const program = getenv("FAIL_PROGRAM");
   const char* const wanted = getenv("FAIL_CALLS");
@@ -266,6 +291,7 @@ void ArmFromEnvironment() {
 }
 
 int MainWithFaults(int argc, char** argv, char** environment) {
+  TakeDeathOrders();
   ArmFromEnvironment();
   return program_main(argc, argv, environment);
 }

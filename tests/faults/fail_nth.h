@@ -10,17 +10,29 @@
 //   FAIL_LASTING  1 when all calls after that one fail, too
 //   FAIL_REPORT   a file that gets the name of the function that failed first
 //   FAIL_PROGRAM  the one program that is meant, by its file's name, of those that are started
+//   FAIL_DEATH    a file that holds a DeathOrder, through which the process can be told to die;
+//   what
+//                 it starts does not take that over
 //
 // The functions of 64-bit files count under the names without "64", stat, lstat and fstat as
 // "stat".
 #ifndef FAULTS_FAIL_NTH_H_
 #define FAULTS_FAIL_NTH_H_
 
+#include <atomic>
+
 struct FailNth {
   const char* calls = "";  // As FAIL_CALLS; must live until Disarm().
   int error = 0;
   long at = 1;
   bool lasting = false;
+};
+
+// What stands in a file that both sides map: the process ends as by SIGKILL instead of making the
+// call with which `left` comes to 0. To be set last; 0 for no order.
+struct DeathOrder {
+  std::atomic<long> left;
+  char calls[120];  // As FAIL_CALLS.
 };
 
 // One order at a time, for the whole process.

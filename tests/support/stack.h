@@ -84,11 +84,7 @@ class Stack {
     EXPECT_TRUE(!before.empty() || !HasEnded(name)) << name << "\n" << Logs();
   }
   // Whether it has ended by itself; End() has its status then.
-  bool HasEnded(const std::string& name) const {
-    siginfo_t info{};
-    const auto pid = static_cast<id_t>(programs_.at(name)->pid);
-    return waitid(P_PID, pid, &info, WEXITED | WNOHANG | WNOWAIT) == 0 && info.si_pid != 0;
-  }
+  bool HasEnded(const std::string& name) const { return HasEnded(*programs_.at(name)); }
   pid_t Pid(const std::string& name) const { return programs_.at(name)->pid; }
   void Signal(const std::string& name, int signal) { kill(programs_.at(name)->pid, signal); }
   // The exit status, or 128 and the signal.
@@ -105,11 +101,18 @@ class Stack {
     arguments_[name] = arguments;
   }
 
-  // The exit status of the tool with these arguments of a shell; its output goes to the logs.
-  int Tool(const std::string& arguments) const {
+  // The exit status of the tool with these arguments of a shell, or 128 and the signal that ended
+  // it; its output goes to the logs. `before` stands before its command. When it takes longer than
+  // the time it is killed.
+  int Tool(const std::string& arguments, const std::string& before = "",
+           std::chrono::microseconds longest = std::chrono::hours(1)) const {
     Program tool("exec 2>>'" + root_ / "logs/tool" + "'",
-                 std::string(FILEINDEX_PROGRAM) + " " + arguments + " >&2");
-    return tool.End();
+                 before + FILEINDEX_PROGRAM + " " + arguments + " >&2");
+    const auto deadline = Clock::now() + longest;
+    while (!HasEnded(tool) && Clock::now() < deadline) {
+      usleep(200);
+    }
+    return tool.End(HasEnded(tool) ? 0 : SIGKILL);
   }
 
   // Members of the share's entry besides name and path, each with a comma before it.
@@ -188,6 +191,12 @@ class Stack {
   }
 
  private:
+  static bool HasEnded(const Program& program) {
+    siginfo_t info{};
+    return waitid(P_PID, static_cast<id_t>(program.pid), &info, WEXITED | WNOHANG | WNOWAIT) == 0 &&
+           info.si_pid != 0;
+  }
+
   std::string SocketOf(const std::string& name) const {
     return root_ / ("var/run/" + name + ".sock");
   }

@@ -167,6 +167,7 @@ Worker::Outcome Worker::RunCycle() {
   }
   // The folder first: of one that is not there the platform cannot tell whether it is read-only.
   if (!IsDirExist(share.GetPath(), /*follow_link=*/false) || !share.CanBeIndexed()) {
+    wait_ = std::chrono::seconds(0);  // It is asked again when its queue has a line.
     return Outcome::kUnavailable;
   }
   watch_.Forget();
@@ -235,8 +236,11 @@ Worker::Outcome Worker::Judge(int code, const std::string& reason) {
   stats_.CountError(code, reason);
   switch (OfCycle(code)) {
     case Consequence::kUnavailable:
-      daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
-                  share_ + ": waiting for the share, reason=" + reason);
+      if (wait_.count() == 0) {
+        daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                    share_ + ": waiting for the share, reason=" + reason);
+      }
+      wait_ = NextWait(wait_);
       return Outcome::kUnavailable;
     case Consequence::kNoSpace:
       if (!std::exchange(space_is_told_, true)) {
@@ -270,7 +274,8 @@ void Worker::WaitAfter(Outcome outcome) {
   switch (outcome) {
     case Outcome::kDone:
     case Outcome::kUnavailable: {
-      // A line in the queue of a share that was away tells that it is back.
+      // A line in the queue of a share that was away tells that it is back. Where nothing could be
+      // asked of the share, its queue may not be watched, so it is tried again.
       const bool is_idle = outcome == Outcome::kDone;
       stats_.SetState(is_idle ? WorkerState::kIdle : WorkerState::kUnavailable);
       // Whoever reads contents says nothing when he is back. As long again as it has lasted so far,
@@ -279,7 +284,8 @@ void Worker::WaitAfter(Outcome outcome) {
           is_idle && unread_since_
               ? in(std::clamp<Clock::duration>(Clock::now() - *unread_since_, kShortestUnreadWait,
                                                kLongestUnreadWait))
-              : std::nullopt;
+          : !is_idle && wait_.count() > 0 ? in(wait_)
+                                          : std::nullopt;
       while (!is_called() && (!until || Clock::now() < *until)) {
         if (watch_.Wait(until, /*for_queue=*/true)) {
           watch_.Wait(in(coalescing_), /*for_queue=*/false);

@@ -745,6 +745,7 @@ TEST_F(Fileindexd, ACrawlGoesOnWhereItWasKilledAndStopsInTime) {
       all.push_back(fs::path(In(name)).parent_path());
     }
   }
+  usleep(100'000);  // What has changed within a tick of the clock is read again.
   StartEngine();
   const std::string states = kRoot / "var/lib/kavo/fileindexd";
   const auto after = [&states] {
@@ -756,6 +757,9 @@ TEST_F(Fileindexd, ACrawlGoesOnWhereItWasKilledAndStopsInTime) {
     const Coming saved(states, IN_MOVED_TO);
     StartIndexer();
     ASSERT_TRUE(AwaitState("crawling"));
+    while (Stats()["files"].asInt() == 0) {
+      usleep(1000);  // The engine is asked for what it has, first.
+    }
     SignalEngine(SIGSTOP);
     sleep(2);  // As long as a crawl goes on without saving where it stands.
     SignalEngine(SIGCONT);

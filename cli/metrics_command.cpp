@@ -48,7 +48,8 @@ ExitStatus CheckHealth(const Arguments& arguments, const Console& console) {
     const std::string worker = share["state"].asString();
     if (arguments.Has("--ready") && (worker == "failing" || worker == "unavailable")) {
       const std::string error = share["last_error"].asString();
-      std::string fault = "the share " + name + " is " + worker;
+      std::string fault = "the share " + name;
+      fault.append(" is ").append(worker);
       if (!error.empty()) {
         fault.append(": ").append(ForTerminal(error));
       }

@@ -273,27 +273,20 @@ void Worker::WaitAfter(Outcome outcome) {
   const auto is_called = [this] { return stopping_ || kicked_; };
   switch (outcome) {
     case Outcome::kDone:
-    case Outcome::kUnavailable: {
-      // A line in the queue of a share that was away tells that it is back. Where nothing could be
-      // asked of the share, its queue may not be watched, so it is tried again.
-      const bool is_idle = outcome == Outcome::kDone;
-      stats_.SetState(is_idle ? WorkerState::kIdle : WorkerState::kUnavailable);
+      stats_.SetState(WorkerState::kIdle);
       // Whoever reads contents says nothing when he is back. As long again as it has lasted so far,
       // however many cycles there were meanwhile.
-      const auto until =
-          is_idle && unread_since_
-              ? in(std::clamp<Clock::duration>(Clock::now() - *unread_since_, kShortestUnreadWait,
-                                               kLongestUnreadWait))
-          : !is_idle && wait_.count() > 0 ? in(wait_)
-                                          : std::nullopt;
-      while (!is_called() && (!until || Clock::now() < *until)) {
-        if (watch_.Wait(until, /*for_queue=*/true)) {
-          watch_.Wait(in(coalescing_), /*for_queue=*/false);
-          return;
-        }
-      }
+      AwaitLine(unread_since_
+                    ? in(std::clamp<Clock::duration>(Clock::now() - *unread_since_,
+                                                     kShortestUnreadWait, kLongestUnreadWait))
+                    : std::nullopt);
       return;
-    }
+    case Outcome::kUnavailable:
+      stats_.SetState(WorkerState::kUnavailable);
+      // A line in the queue of a share that was away tells that it is back. Where nothing could be
+      // asked of the share, its queue may not be watched, so it is tried again.
+      AwaitLine(wait_.count() > 0 ? in(wait_) : std::nullopt);
+      return;
     case Outcome::kPaused: {
       stats_.SetState(WorkerState::kPaused);
       while (!is_called() && pause_.IsOn()) {
@@ -321,6 +314,15 @@ void Worker::WaitAfter(Outcome outcome) {
         }
       } while (!is_called() && !HasSpace());
       return;
+  }
+}
+
+void Worker::AwaitLine(std::optional<Clock::time_point> until) {
+  while (!stopping_ && !kicked_ && (!until || Clock::now() < *until)) {
+    if (watch_.Wait(until, /*for_queue=*/true)) {
+      watch_.Wait(Clock::now() + coalescing_, /*for_queue=*/false);
+      return;
+    }
   }
 }
 

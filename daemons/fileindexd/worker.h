@@ -70,6 +70,8 @@ class Worker {
   Outcome RunCycle();
   Outcome Judge(int code, const std::string& reason);
   void WaitAfter(Outcome outcome);
+  // Until a line comes into the queue, and as long as others may come with it; or to the instant.
+  void AwaitLine(std::optional<std::chrono::steady_clock::time_point> until);
   bool MakeIndexIfAsked();
   void MakeIndex();
   bool IsInterrupted() const;

@@ -9,7 +9,6 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr unsigned kPage = 2000;
 constexpr size_t kMostGone = 10000;
 constexpr size_t kMostDiffering = 10000;
 constexpr unsigned kCommitStep = 4000;
@@ -164,12 +163,21 @@ class Differences {
 std::optional<Differences> FindDifferences(const std::string& id, const std::string& root,
                                            const WalkRules& rules, const ContentRules& content,
                                            const CrawlDeeds& deeds) {
-  FolderListing listing(id, root);
+  uint64_t seed = 0;
+  PagedListing<IndexedFolder> listing(
+      [&](const std::string& after, unsigned count) {
+        FolderPage page = ListFolders(id, root, after, count);
+        if (after.empty()) {  // It is the same for all, and read while the next page is asked for.
+          seed = page.seed;
+        }
+        return std::move(page.folders);
+      },
+      /*after=*/"");
   std::optional<IndexedFolder> first = listing.Next();
   if (!first) {
     return std::nullopt;
   }
-  DiskScan scan(root, rules, content, listing.Seed(), deeds.check);
+  DiskScan scan(root, rules, content, seed, deeds.check);
   Differences found(deeds);
   const auto next_on_disk = [&] { return found.AreTooMany() ? std::nullopt : scan.Next(); };
   const auto next_indexed = [&] {
@@ -207,21 +215,14 @@ void CompareRoot(Pass& pass, const std::string& id, const std::string& root,
 void CompareFolder(Pass& pass, const std::string& id, const Differing& folder,
                    const WalkRules& rules) {
   DiskWalk walk(folder.path, /*after=*/folder.path, rules);
-  std::vector<IndexedPath> page;
-  size_t next = 0;
-  bool is_last = !folder.is_indexed;
-  std::string after;
+  std::optional<PagedListing<IndexedPath>> listing;
+  if (folder.is_indexed) {
+    listing.emplace([&](const std::string& after,
+                        unsigned count) { return ListIn(id, folder.path, after, count); },
+                    /*after=*/"");
+  }
   pass.Merge(
-      walk, [&] { return walk.Next(); },
-      [&]() -> std::optional<IndexedPath> {
-        if (next == page.size() && !is_last) {
-          page = ListIn(id, folder.path, after, kPage);
-          next = 0;
-          is_last = page.size() < kPage;
-          after = page.empty() ? "" : page.back().path;
-        }
-        return next < page.size() ? std::optional(std::move(page[next++])) : std::nullopt;
-      });
+      walk, [&] { return walk.Next(); }, [&] { return listing ? listing->Next() : std::nullopt; });
 }
 
 // Carries out a crawl from its start by the digests; none where too much differs. Where it is cut
@@ -254,59 +255,6 @@ std::optional<CrawlResult> CrawlDifferences(const std::string& id, CrawlPoint po
 }
 
 }  // namespace
-
-FolderListing::FolderListing(std::string id, std::string root)
-    : id_(std::move(id)), root_(std::move(root)) {
-  next_page_ = std::async(std::launch::async, ListFolders, id_, root_, "", kPage);
-  TakePage();
-}
-
-void FolderListing::TakePage() {
-  FolderPage page = next_page_.get();
-  seed_ = page.seed;
-  page_ = std::move(page.folders);
-  next_ = 0;
-  if (page_.size() == kPage) {
-    next_page_ = std::async(std::launch::async, ListFolders, id_, root_, page_.back().path, kPage);
-  }
-}
-
-std::optional<IndexedFolder> FolderListing::Next() {
-  if (next_ == page_.size() && next_page_.valid()) {
-    TakePage();
-  }
-  return next_ < page_.size() ? std::optional(std::move(page_[next_++])) : std::nullopt;
-}
-
-IndexListing::IndexListing(std::string id, std::string root, std::string after)
-    : id_(std::move(id)),
-      root_(std::move(root)),
-      after_(std::move(after)),
-      is_root_done_(root_ <= after_) {
-  AskForPage();
-}
-
-void IndexListing::AskForPage() {
-  next_page_ = std::async(std::launch::async, ListBelow, id_, root_, after_, kPage);
-}
-
-std::optional<IndexedPath> IndexListing::Next() {
-  if (!is_root_done_) {
-    is_root_done_ = true;
-    if (auto found = FindDocument(id_, root_)) {
-      return found;
-    }
-  }
-  if (next_ == page_.size() && next_page_.valid()) {
-    page_ = next_page_.get();
-    next_ = 0;
-    if (page_.size() == kPage) {
-      after_ = page_.back().path;
-      AskForPage();
-    }
-  }
-  return next_ < page_.size() ? std::optional(std::move(page_[next_++])) : std::nullopt;
-}
 
 bool GoneList::Add(const std::string& path, bool with_all_below) {
   if (IsFull()) {
@@ -344,9 +292,19 @@ CrawlResult Crawl(const std::string& id, CrawlPoint point, const WalkRules& rule
   for (;;) {
     Pass pass(&point, deeds, /*keeps_place=*/true);
     DiskWalk walk(point.root, point.after, rules);
-    IndexListing listing(id, point.root, point.after);
+    // The root stands before what is below it.
+    bool is_root_done = point.root <= point.after;
+    PagedListing<IndexedPath> listing(
+        [&](const std::string& after, unsigned count) {
+          return ListBelow(id, point.root, after, count);
+        },
+        point.after);
+    const auto next_indexed = [&] {
+      auto found = std::exchange(is_root_done, true) ? std::nullopt : FindDocument(id, point.root);
+      return found ? std::move(found) : listing.Next();
+    };
     pass.Merge(
-        walk, [&] { return walk.Next(); }, [&] { return listing.Next(); });
+        walk, [&] { return walk.Next(); }, next_indexed);
     if (!pass.End()) {
       return pass.Result();
     }

@@ -42,47 +42,42 @@ void MergeByPath(const NextOnDisk& next_on_disk, const NextIndexed& next_indexed
   }
 }
 
-// What the index has at and below a folder, page by page. The next page is asked for, by a thread
-// of its own, while one is gone through: so the walk over the disk and the engine are both at work.
-// What is written meanwhile at paths behind those that were given may be in it or not.
-class IndexListing {
+// A list of the index, page by page, in the order of its paths. The next page is asked for, by a
+// thread of its own, while one is gone through: so the walk over the disk and the engine are both
+// at work. What is written meanwhile at paths behind those that were given may be in it or not.
+template <typename Item>
+class PagedListing {
  public:
-  // Begins with the first page at once.
-  IndexListing(std::string id, std::string root, std::string after);
-  // Throws as ListBelow() does.
-  std::optional<IndexedPath> Next();
+  // The page of up to `count` behind a path; one that is not full is the last. Called by one thread
+  // at a time.
+  using Ask = std::function<std::vector<Item>(const std::string& after, unsigned count)>;
+
+  // Begins with the first page at once. What `ask` refers to outlives the object.
+  PagedListing(Ask ask, std::string after) : ask_(std::move(ask)) { Begin(std::move(after)); }
+
+  // Throws as `ask` does.
+  std::optional<Item> Next() {
+    if (next_ == page_.size() && next_page_.valid()) {
+      page_ = next_page_.get();
+      next_ = 0;
+      if (page_.size() == kPage) {
+        Begin(page_.back().path);
+      }
+    }
+    return next_ < page_.size() ? std::optional(std::move(page_[next_++])) : std::nullopt;
+  }
 
  private:
-  void AskForPage();
+  static constexpr unsigned kPage = 2000;
 
-  const std::string id_;
-  const std::string root_;
-  std::string after_;
-  std::vector<IndexedPath> page_;
-  size_t next_ = 0;  // In the page.
-  bool is_root_done_;
-  std::future<std::vector<IndexedPath>> next_page_;  // Waited for where it is dropped.
-};
+  void Begin(std::string after) {
+    next_page_ = std::async(std::launch::async, ask_, std::move(after), kPage);
+  }
 
-// The folders at and below one whose digests the index has, page by page, in the order of their
-// paths with "/" behind them; each page is asked for while the one before is gone through.
-class FolderListing {
- public:
-  // Waits for the first page. Throws as ListFolders() does.
-  FolderListing(std::string id, std::string root);
-  uint64_t Seed() const { return seed_; }
-  // Throws as ListFolders() does.
-  std::optional<IndexedFolder> Next();
-
- private:
-  void TakePage();
-
-  const std::string id_;
-  const std::string root_;
-  uint64_t seed_ = 0;
-  std::vector<IndexedFolder> page_;
-  size_t next_ = 0;                    // In the page.
-  std::future<FolderPage> next_page_;  // Waited for where it is dropped.
+  const Ask ask_;
+  std::vector<Item> page_;
+  size_t next_ = 0;                           // In the page.
+  std::future<std::vector<Item>> next_page_;  // Waited for where it is dropped.
 };
 
 // Paths that the index has and the disk has not, until they are deleted. What lies below one of

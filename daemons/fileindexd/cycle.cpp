@@ -82,19 +82,30 @@ void Cycle::Handle(const fileindex::OP& op) {
   const std::string path = node->GetPath();
   stats_.CountOperation(op.op);
   try {
-    Carry(op, path);
+    CarryTwice(op, path);
   } catch (const Error& error) {
     if (OfOperation(error.GetErrorCode()) != Consequence::kGoOn) {
       throw;
-    }
-    if (error.GetErrorCode() == ERR_SYSTEM) {
-      scope_.CheckShare();  // The fault may be the share's: then the operation waits for it.
     }
     Count(error.GetErrorCode(), error.what(), path);
   } catch (const std::bad_alloc&) {
     throw;
   } catch (const std::exception& error) {
     Count(ERR_INTERNAL, error.what(), path);
+  }
+}
+
+// What the system refused once it may grant at the next try; where the fault is the share's, the
+// operation waits for it.
+void Cycle::CarryTwice(const fileindex::OP& op, const std::string& path) {
+  try {
+    Carry(op, path);
+  } catch (const Error& error) {
+    if (error.GetErrorCode() != ERR_SYSTEM) {
+      throw;
+    }
+    scope_.CheckShare();
+    Carry(op, path);
   }
 }
 
@@ -376,9 +387,10 @@ void Cycle::Reconcile(const std::string& root, const Json::Value& types, const c
       [this](const std::string& path) { return scope_.LeadsToFolder(path); },
       [this](const std::string& path) { return scope_.IsInShare(path) && scope_.Allows(path); }};
   CrawlDeeds deeds;
+  bool is_first_time = true;  // What cannot be read is tried once more, and then passed over.
   deeds.check = [this] { Check(); };
   deeds.compare = [&](const DiskEntry& entry, const IndexedPath* indexed, bool first_pass) {
-    Compare(entry, indexed, first_pass ? types : Json::Value::nullSingleton());
+    Compare(entry, indexed, first_pass && is_first_time ? types : Json::Value::nullSingleton());
   };
   deeds.is_gone = IsGone;
   deeds.remove = [this](std::vector<GoneList::Gone> gone) { Remove(gone); };
@@ -397,7 +409,11 @@ void Cycle::Reconcile(const std::string& root, const Json::Value& types, const c
     content = {[this](const std::string& path) { return scope_.WantsContent(path); },
                [this](const std::string& folder) { return scope_.ContentsIn(folder); }};
   }
-  const CrawlResult result = Crawl(id_, point, rules, content, deeds);
+  CrawlResult result = Crawl(id_, point, rules, content, deeds);
+  if (result.unknown > 0) {
+    is_first_time = false;
+    result = Crawl(id_, {point.root, point.cause, /*after=*/""}, rules, content, deeds);
+  }
   if (result.unknown > 0) {
     Count(ERR_SYSTEM,
           std::to_string(result.unknown) + " folders or files cannot be read, the last: " +

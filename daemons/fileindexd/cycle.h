@@ -51,6 +51,7 @@ class Cycle {
   void Finish();
 
  private:
+  void CarryTwice(const fileindex::OP& op, const std::string& path);
   void Carry(const fileindex::OP& op, const std::string& path);
   void CarryKnown(const fileindex::OP& op, const std::string& path);
   void Delete(const std::string& path);

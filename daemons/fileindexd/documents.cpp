@@ -87,7 +87,7 @@ bool Stat(const std::string& path, struct stat* info) {
   return file.Get() >= 0 && fstat(file.Get(), info) == 0;
 }
 
-bool Parse(const std::string& path, bool content, Json::Value* fields) {
+bool ParseOnce(const std::string& path, bool content, Json::Value* fields) {
   Json::Value options;
   options[fileindex::elastic::extraction::kOptionNeedMeta] = content;
   *fields = Json::Value(Json::objectValue);
@@ -104,6 +104,11 @@ bool Parse(const std::string& path, bool content, Json::Value* fields) {
   } catch (...) {  // The platform's may throw anything.
     return false;
   }
+}
+
+// What the system refused once it may grant at the next try.
+bool Parse(const std::string& path, bool content, Json::Value* fields) {
+  return ParseOnce(path, content, fields) || ParseOnce(path, content, fields);
 }
 
 void AddCopies(Json::Value* fields) {
@@ -252,10 +257,14 @@ FolderPage ListFolders(const std::string& id, const std::string& folder, const s
 
 Json::Value MakePut(const std::string& id, const std::string& path, bool content) {
   // The stamp first: a change while the file is read makes the document look old, never new.
-  const std::optional<Stamp> stamp = StampOfPath(path, content);
+  std::optional<Stamp> stamp = StampOfPath(path, content);
   Json::Value fields;
-  const bool is_parsed = stamp && (Parse(path, content, &fields) ||
-                                   (content && Parse(path, /*content=*/false, &fields)));
+  bool is_parsed = stamp && Parse(path, content, &fields);
+  if (stamp && !is_parsed && content) {
+    // Better its name and dates than nothing; the next comparison sees what the document lacks.
+    is_parsed = Parse(path, /*content=*/false, &fields);
+    stamp->content = false;
+  }
   // Of a file that went while it was read there is a part at best.
   if (!stamp || IsGone(path)) {
     return MakeItem(kDelete, id, path);

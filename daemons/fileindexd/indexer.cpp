@@ -188,10 +188,21 @@ bool Indexer::TakeJob(bool may_wait, Job* job) {
   return true;
 }
 
+Json::Value Indexer::MakePutTwice(const Job& job) const {
+  try {
+    return MakePut(id_, job.path, job.content);
+  } catch (const Error& error) {
+    if (error.GetErrorCode() != ERR_SYSTEM) {
+      throw;
+    }
+  }
+  return MakePut(id_, job.path, job.content);
+}
+
 void Indexer::Extract(const Job& job, Batch* batch) {
   batch->paths.push_back(job.path);
   try {
-    Json::Value item = MakePut(id_, job.path, job.content);
+    Json::Value item = MakePutTwice(job);
     if (IsDelete(item)) {
       const kavo::local::MutexLock lock(mutex_);
       gone_.push_back(job.path);

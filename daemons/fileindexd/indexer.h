@@ -66,6 +66,7 @@ class Indexer {
   void End();
   void Work();
   bool TakeJob(bool may_wait, Job* job);
+  Json::Value MakePutTwice(const Job& job) const;
   void Extract(const Job& job, Batch* batch);
   void Send(Batch* batch);
   void Finish(const std::vector<std::string>& paths);

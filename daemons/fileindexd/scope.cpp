@@ -1,8 +1,10 @@
 #include "daemons/fileindexd/scope.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <utility>
 
+#include "common/check.h"
 #include "common/error.h"
 #include "common/file.h"
 #include "common/sdk/share.h"
@@ -10,8 +12,17 @@
 #include "fileindex/util/file_type.h"
 #include "fileindex/util/path_policy.h"
 #include "fileindex/util/share_path.h"
+#include "kavo/filesystem.h"
 
 namespace vexlo::fileindexd {
+namespace {
+
+// Whether the errno tells of the machine's state, and nothing of the path.
+bool IsOfMachine(int error) {
+  return error == EIO || error == EMFILE || error == ENFILE || error == ENOMEM || error == EINTR;
+}
+
+}  // namespace
 
 Scope::Scope(std::string share, std::string share_path)
     : share_(std::move(share)), share_path_(std::move(share_path)) {
@@ -77,7 +88,10 @@ bool Scope::Allows(const std::string& path) const {
     return true;
   }
   CheckShare();
-  return false;
+  // What is refused leaves the index, so that a question that failed must not count as a refusal.
+  VEXLO_CHECK(KAVOGetFSType(path.c_str(), /*flags=*/0) < 0 && IsOfMachine(errno), ERR_SYSTEM,
+              "the file system cannot be told, path=" + path);
+  return fileindex::CanFullPathBeIndexed(path);
 }
 
 void Scope::CheckShare() const {

@@ -14,6 +14,7 @@
 #include "daemons/common/log.h"
 #include "daemons/fileindexd/consequence.h"
 #include "daemons/fileindexd/cycle.h"
+#include "daemons/fileindexd/documents.h"
 #include "fileindex/elastic_control/share_index.h"
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
@@ -166,8 +167,10 @@ Worker::Outcome Worker::RunCycle() {
     return Outcome::kPaused;
   }
   // The folder first: of one that is not there the platform cannot tell whether it is read-only.
-  if (!IsDirExist(share.GetPath(), /*follow_link=*/false) || !share.CanBeIndexed()) {
-    wait_ = std::chrono::seconds(0);  // It is asked again when its queue has a line.
+  const bool is_there = IsDirExist(share.GetPath(), /*follow_link=*/false);
+  if (!is_there || !share.CanBeIndexed()) {
+    // It is asked again when its queue has a line; where it could not be looked at, by itself.
+    wait_ = is_there || IsGone(share.GetPath()) ? std::chrono::seconds(0) : NextWait(wait_);
     return Outcome::kUnavailable;
   }
   watch_.Forget();

@@ -67,7 +67,13 @@ std::string ErrnoText(const std::string& what, const std::string& path) {
 
 bool Exists(const std::string& path) {
   struct stat status;
-  return lstat(path.c_str(), &status) == 0;
+  if (lstat(path.c_str(), &status) == 0) {
+    return true;
+  }
+  if (errno != ENOENT && errno != ENOTDIR) {
+    Fail("looking for it failed", path);
+  }
+  return false;
 }
 
 void MakeFolders(const std::string& path) {

@@ -9,6 +9,7 @@ namespace vexlo::elasticd {
 // "WHAT, path=PATH, reason=..." with the meaning of errno.
 std::string ErrnoText(const std::string& what, const std::string& path);
 
+// Throws Failure kStorage when that cannot be told: what counts as missing is made anew.
 bool Exists(const std::string& path);
 
 // Makes the folder with those above it. Throws Failure kStorage.

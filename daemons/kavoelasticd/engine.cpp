@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <exception>
+#include <new>
 #include <random>
 #include <utility>
 #include <vector>
@@ -113,6 +114,8 @@ Json::Value Engine::Answer(const std::function<Json::Value()>& work) {
     return work();
   } catch (const Failure& failure) {
     return Refusal(failure.GetCode(), failure.what());
+  } catch (const std::bad_alloc&) {
+    return Refusal(Code::kStorage, kNoMemory);
   } catch (const std::exception& error) {
     daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
                 std::string("a request failed, reason=") + error.what());

@@ -19,11 +19,13 @@ enum class Code {
   kDocumentMissing = 2006,  // no document at that path
   kBadDocument = 2007,      // a field does not fit the mappings
   kBadMappings = 2008,      // the mappings or settings cannot be used
-  kStorage = 2009,          // the disk or the database refused
+  kStorage = 2009,          // the disk, the database or the memory refused
   kNoSpace = 2010,          // the disk is full
   kLost = 2011,             // changes since the last commit were rolled back; send them again
   kInternal = 2012,         // a fault of this program
 };
+
+inline constexpr char kNoMemory[] = "there is no memory at present";
 
 // Becomes {"success": false, "error": {...}}. Not logged by whoever throws it: most are answers.
 class Failure : public std::runtime_error {

@@ -4,6 +4,7 @@
 
 #include <atomic>
 #include <cstddef>
+#include <new>
 #include <optional>
 #include <thread>
 #include <utility>
@@ -11,6 +12,7 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "daemons/common/frame_server.h"
+#include "daemons/kavoelasticd/failure.h"
 #include "kavo/local/shares.h"
 
 namespace vexlo::elasticd {
@@ -21,10 +23,10 @@ constexpr size_t kLongBytes = size_t{1} << 20;
 std::string SocketPath() { return kavo::local::Root() + "/var/run/kavoelasticd.sock"; }
 
 // Never one of the codes that make callers wait and try again: none of these passes by waiting.
-std::string ErrorText(ErrorCode code, const std::string& message) {
+std::string ErrorText(int code, const std::string& message) {
   Json::Value reply(Json::objectValue);
   reply["success"] = false;
-  reply["error"]["code"] = static_cast<int>(code);
+  reply["error"]["code"] = code;
   reply["error"]["msg"] = message;
   return JsonToString(reply);
 }
@@ -58,12 +60,14 @@ daemon::FrameServerOptions SearchOptions(const SearchHandler& handler, bool is_o
 
 std::string AnswerText(const Handler& handler, const std::string& request) {
   std::string reply;
-  {
+  try {
     Json::Value value;
     if (!JsonFromString(value, request) || !value.isObject()) {
       return ErrorText(ERR_BAD_PARAMETER, "the request is no JSON object");
     }
     reply = JsonToString(handler(value));
+  } catch (const std::bad_alloc&) {
+    reply = ErrorText(static_cast<int>(Code::kStorage), kNoMemory);
   }
   // Each worker would keep as much as its longest request took.
   if (request.size() + reply.size() >= kLongBytes) {

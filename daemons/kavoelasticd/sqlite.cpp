@@ -57,8 +57,21 @@ Connection::Connection(const std::string& path, Use use)
   sqlite3_create_function(db, "member", 1, SQLITE_UTF8, members_.get(), Member, nullptr, nullptr);
   // Deleted text is overwritten by default in some builds, which doubles what a delete writes.
   Run("PRAGMA secure_delete=OFF; PRAGMA temp_store=MEMORY");
-  if (use == Use::kRead) {
-    Run("PRAGMA query_only=ON; PRAGMA cache_size=-8192");
+  switch (use) {
+    case Use::kRead:
+      Run("PRAGMA query_only=ON; PRAGMA cache_size=-8192");
+      break;
+    case Use::kWrite:
+      // Where a file cannot be opened for writing at the moment (no descriptor is left, say),
+      // SQLite is content with reading it, and the connection would never write: the database here,
+      // the log and its index when the first transaction opens them.
+      if (sqlite3_db_readonly(db, "main") != 0) {
+        throw SqlError(SQLITE_CANTOPEN, "opened for reading alone, path=" + path);
+      }
+      Run("BEGIN IMMEDIATE; ROLLBACK");
+      break;
+    case Use::kCreate:
+      break;
   }
 }
 

@@ -170,6 +170,7 @@ TEST(WorkFaults, ACommitIsWholeOrToldToHaveFailed) {
     ASSERT_EQ(store.Do("commit"), "ok");
   }
   fs::copy(folder, saved, fs::copy_options::recursive);
+  std::unique_ptr<Store> store;
   const FaultyWork work = {
       "Commit",
       [&] {
@@ -177,24 +178,30 @@ TEST(WorkFaults, ACommitIsWholeOrToldToHaveFailed) {
         fs::copy(saved, folder, fs::copy_options::recursive);
       },
       [&] {
-        Store store(folder);
+        store = std::make_unique<Store>(folder);
         Json::Value deleted;
         deleted["doc_id"] = "/v/deleted";
-        std::vector<std::string> answers = {store.Add("/v/new", "new"),
-                                            store.Add("/v/changed", "new"),
-                                            store.Do("document_del_by_id", deleted)};
-        answers.push_back(store.Do("commit"));
+        std::vector<std::string> answers = {store->Add("/v/new", "new"),
+                                            store->Add("/v/changed", "new"),
+                                            store->Do("document_del_by_id", deleted)};
+        answers.push_back(store->Do("commit"));
         return std::count(answers.begin(), answers.end(), "ok") == 4;
       },
       [&](bool done, bool /*lasts*/) {
         if (fs::exists(folder + "/i/index.db.damaged-1")) {
           // A page that cannot be read counts as damaged. The file stays, and is restored here.
           EXPECT_FALSE(done);
+          store.reset();
           fs::remove_all(folder);
           fs::copy(saved, folder, fs::copy_options::recursive);
+        } else if (store != nullptr) {
+          store->Do("commit");  // Tells of a loss.
+          EXPECT_EQ(store->Add("/v/kept", "old"), "ok");
+          EXPECT_EQ(store->Do("commit"), "ok");
         }
-        Store store(folder);
-        const std::map<std::string, std::string> words = store.Words();
+        store = std::make_unique<Store>(folder);
+        const std::map<std::string, std::string> words = store->Words();
+        store.reset();
         const std::map<std::string, std::string> want = {
             {"/v/kept", "old"}, {"/v/changed", "new"}, {"/v/new", "new"}};
         if (done) {

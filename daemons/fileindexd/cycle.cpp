@@ -1,7 +1,6 @@
 #include "daemons/fileindexd/cycle.h"
 
 #include <algorithm>
-#include <new>
 #include <set>
 #include <system_error>
 #include <utility>
@@ -12,6 +11,7 @@
 #include "common/json.h"
 #include "common/string.h"
 #include "daemons/common/log.h"
+#include "daemons/common/no_memory.h"
 #include "daemons/fileindexd/consequence.h"
 #include "daemons/fileindexd/documents.h"
 #include "daemons/fileindexd/rename_plan.h"
@@ -88,9 +88,10 @@ void Cycle::Handle(const fileindex::OP& op) {
       throw;
     }
     Count(error.GetErrorCode(), error.what(), path);
-  } catch (const std::bad_alloc&) {
-    throw;
   } catch (const std::exception& error) {
+    if (daemon::IsLackOfMemory(error)) {
+      throw;
+    }
     Count(ERR_INTERNAL, error.what(), path);
   }
 }
@@ -331,11 +332,24 @@ void Cycle::ReconcileNewFolders() {
     if (!is_folder(folder)) {
       Reconcile(folder, Json::Value(), kByItself);
       state_.crawled.erase(folder);
+      state_.settings.erase(folder);
       state_changed_ = true;
     }
   }
   for (const std::string& folder : folders) {
     if (!state_.crawled.contains(folder)) {
+      Reconcile(folder, Json::Value(), kByItself);
+    }
+  }
+}
+
+void Cycle::ReconcileOtherSettings() {
+  for (const std::string& folder : scope_.Folders()) {
+    const auto known = state_.settings.find(folder);
+    if (known == state_.settings.end()) {
+      state_.settings[folder] = scope_.SettingsOf(folder);  // Was crawled before they were noted.
+      state_changed_ = true;
+    } else if (known->second != scope_.SettingsOf(folder)) {
       Reconcile(folder, Json::Value(), kByItself);
     }
   }
@@ -467,7 +481,13 @@ void Cycle::Remove(const std::vector<GoneList::Gone>& gone) {
 // A folder counts as crawled when everything in it was compared, whatever was asked for besides.
 void Cycle::MarkCrawled(const std::string& root) {
   for (const std::string& folder : scope_.Folders()) {
-    if (IsSameOrBelow(folder, root) && state_.crawled.insert(folder).second) {
+    if (!IsSameOrBelow(folder, root)) {
+      continue;
+    }
+    const bool is_new = state_.crawled.insert(folder).second;
+    std::string settings = scope_.SettingsOf(folder);
+    if (std::string& known = state_.settings[folder]; is_new || known != settings) {
+      known = std::move(settings);
       state_changed_ = true;
     }
   }

@@ -40,6 +40,10 @@ class Cycle {
   // Those that were never crawled, and those that were and are not configured any more.
   void ReconcileNewFolders();
 
+  // Those whose settings are others than they were compared with. To be called when no operation
+  // that tells of the change is to come: that one says what is to be read again.
+  void ReconcileOtherSettings();
+
   // Takes what is in the index without what stands in it, as nobody was there to read it. False
   // when there is such a thing left: still nobody is there, or nothing is at its path (any more).
   bool IndexUnread();

@@ -15,6 +15,7 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "common/string.h"
+#include "daemons/common/no_memory.h"
 #include "daemons/common/unique_fd.h"
 #include "fileindex/comm.h"
 #include "fileindex/elastic_control/schema.h"
@@ -94,11 +95,9 @@ bool ParseOnce(const std::string& path, bool content, Json::Value* fields) {
   try {
     KAVO::CONTENT_EXTRACT::ParseFile(path, options, *fields);
     return fields->isObject();
-  } catch (const std::bad_alloc&) {
-    throw;  // The file is as good as before, and is read when there is memory.
-  } catch (const Json::RuntimeError& error) {
-    if (std::string_view(error.what()).find("allocate") != std::string_view::npos) {
-      throw std::bad_alloc();
+  } catch (const std::exception& error) {
+    if (daemon::IsLackOfMemory(error)) {
+      throw std::bad_alloc();  // The file is as good as before, and is read when there is memory.
     }
     return false;
   } catch (...) {  // The platform's may throw anything.

@@ -76,6 +76,18 @@ std::optional<ContentByType> Scope::ContentsIn(const std::string& folder) const 
   return contents;
 }
 
+std::string Scope::SettingsOf(const std::string& folder) const {
+  const auto config = folders_.GetMostSuitableCfg(folder);
+  const Json::Value types = config == nullptr ? Json::Value() : config->GetIndexCfg();
+  std::string settings;
+  for (const auto& type : types.isObject() ? types.getMemberNames() : Json::Value::Members()) {
+    if (types[type].asBool()) {
+      settings.append(settings.empty() ? "" : ",").append(type);
+    }
+  }
+  return settings;
+}
+
 bool Scope::HaveSameSettings(const std::string& a, const std::string& b) const {
   const auto at_a = folders_.GetMostSuitableCfg(a);
   const auto at_b = folders_.GetMostSuitableCfg(b);

@@ -32,6 +32,8 @@ class Scope {
   bool WantsContent(const std::string& path) const { return folders_.IsFullPathNeedMeta(path); }
   // The same for the files directly in a covered folder; none where it depends on more.
   std::optional<ContentByType> ContentsIn(const std::string& folder) const;
+  // The types whose contents are indexed in the folder, in alphabetical order with commas between.
+  std::string SettingsOf(const std::string& folder) const;
   // Whether files of every type are treated alike at both paths.
   bool HaveSameSettings(const std::string& a, const std::string& b) const;
 

@@ -1,7 +1,9 @@
 #include "daemons/fileindexd/service.h"
 
 #include <linux/capability.h>
+#include <sys/stat.h>
 
+#include <cerrno>
 #include <charconv>
 #include <cstdio>
 #include <utility>
@@ -12,6 +14,7 @@
 #include "daemons/common/frame_server.h"
 #include "daemons/common/log.h"
 #include "daemons/fileindexd/consequence.h"
+#include "daemons/fileindexd/settle.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/paths.h"
 
@@ -47,6 +50,16 @@ std::string ShareOf(const Json::Value& data) {
   return share;
 }
 
+// Another text after each change of the list of folders, which is replaced.
+std::string StampOfFolders() {
+  const std::string path = fileindex::kFileIndexFoldersCfgPath.Get();
+  struct stat info {};
+  VEXLO_CHECK(lstat(path.c_str(), &info) != 0 && errno != ENOENT && errno != ENOTDIR, ERR_LOAD,
+              "lstat failed, path=" + path);
+  return std::to_string(info.st_ino) + " " + std::to_string(info.st_ctim.tv_sec) + "." +
+         std::to_string(info.st_ctim.tv_nsec);
+}
+
 }  // namespace
 
 bool ReadArguments(const std::vector<std::string>& arguments, ServiceOptions* options) {
@@ -65,10 +78,12 @@ bool ReadArguments(const std::vector<std::string>& arguments, ServiceOptions* op
 }
 
 Service::Service(ServiceOptions options) : options_(options), thread_([this] { Run(); }) {
-  Post([this] { StartIndexedShares(); });
+  folders_watch_.emplace(fileindex::kFileIndexFoldersLockPath.Get(),
+                         [this] { Post([this] { Settle(); }); });
 }
 
 Service::~Service() {
+  folders_watch_.reset();
   Stop(std::chrono::milliseconds(0));
   thread_.join();
 }
@@ -149,10 +164,10 @@ void Service::Run() {
   kavo::local::MutexLock lock(mutex_);
   for (;;) {
     const auto is_called = [this]() KAVO_REQUIRES(mutex_) { return ending_ || !tasks_.empty(); };
-    if (!start_again_) {
+    if (!settle_again_) {
       changed_.Wait(lock, is_called);
-    } else if (!changed_.WaitUntil(lock, *start_again_, is_called)) {
-      tasks_.push_back([this] { StartIndexedShares(); });
+    } else if (!changed_.WaitUntil(lock, *settle_again_, is_called)) {
+      tasks_.push_back([this] { Settle(); });
     }
     if (ending_) {
       return;
@@ -170,24 +185,42 @@ void Service::Run() {
   }
 }
 
-void Service::StartIndexedShares() {
+void Service::Settle() {
+  try {
+    StartWorkers();
+    SettleFolders();
+    settle_again_.reset();
+    settle_wait_ = std::chrono::seconds(0);
+  } catch (const Error& error) {
+    settle_wait_ = NextWait(settle_wait_);
+    settle_again_ = std::chrono::steady_clock::now() + settle_wait_;
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                std::string("the folders are not known or not settled, reason=") + error.what());
+  }
+}
+
+void Service::StartWorkers() {
+  const std::string stamp = StampOfFolders();
+  if (stamp == folders_stamp_) {
+    return;
+  }
   try {
     pause_.Reload();
   } catch (const Error& error) {
     daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
                 std::string("the pause is not known, reason=") + error.what());
   }
-  try {
-    for (const std::string& share : fileindex::FolderMgr().GetIndexedShares()) {
-      Create(share);
+  const std::set<std::string> indexed = fileindex::FolderMgr().GetIndexedShares();
+  for (const std::string& share : WorkingShares()) {
+    if (!indexed.contains(share)) {
+      Delete(share, /*unless_indexed=*/true);
     }
-    start_again_.reset();
-  } catch (const Error& error) {
-    start_wait_ = NextWait(start_wait_);
-    start_again_ = std::chrono::steady_clock::now() + start_wait_;
-    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
-                std::string("the folders are not known, reason=") + error.what());
   }
+  for (const std::string& share : indexed) {
+    Create(share);
+    Find(share)->KickSettled();
+  }
+  folders_stamp_ = stamp;
 }
 
 void Service::Create(const std::string& share) {
@@ -225,6 +258,15 @@ void Service::Delete(const std::string& share, bool unless_indexed) {
   if (!is_indexed) {
     (void)remove(ShareStateFile(share).c_str());
   }
+}
+
+std::set<std::string> Service::WorkingShares() {
+  std::set<std::string> shares;
+  const kavo::local::MutexLock lock(mutex_);
+  for (const auto& [share, worker] : workers_) {
+    shares.insert(share);
+  }
+  return shares;
 }
 
 void Service::KickAll() {

@@ -10,10 +10,12 @@
 #include <map>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <thread>
 
 #include "daemons/common/run_daemon.h"
+#include "daemons/fileindexd/lock_watch.h"
 #include "daemons/fileindexd/worker.h"
 #include "kavo/local/mutex.h"
 
@@ -30,7 +32,7 @@ bool ReadArguments(const std::vector<std::string>& arguments, ServiceOptions* op
 // One thread starts and ends workers, so that whoever takes a command never waits for one.
 class Service {
  public:
-  // Starts a worker for each share with an indexed folder.
+  // Starts a worker for each share with an indexed folder, now and whenever the folders change.
   explicit Service(ServiceOptions options);
   ~Service();
   Service(const Service&) = delete;
@@ -51,12 +53,15 @@ class Service {
   Json::Value Describe();
   void Post(Task task);
   void Run();
-  void StartIndexedShares();
+  // Completes what was left of a change of the folders, and gives each indexed share its worker.
+  void Settle();
+  void StartWorkers();
   void Create(const std::string& share);
   // With `unless_indexed` a share that has folders keeps its worker, which looks at everything
   // anew.
   void Delete(const std::string& share, bool unless_indexed);
   void KickAll();
+  std::set<std::string> WorkingShares();
   std::shared_ptr<Worker> Find(const std::string& share);
 
   const ServiceOptions options_;
@@ -67,11 +72,14 @@ class Service {
   std::deque<Task> tasks_ KAVO_GUARDED_BY(mutex_);
   bool ending_ KAVO_GUARDED_BY(mutex_) = false;
 
-  // The thread's own: when to look for the list of folders again, while it cannot be read.
-  std::optional<std::chrono::steady_clock::time_point> start_again_;
-  std::chrono::seconds start_wait_{0};
+  // The thread's own: the list of folders that was looked at last, and when to do it again where
+  // that failed.
+  std::string folders_stamp_;
+  std::optional<std::chrono::steady_clock::time_point> settle_again_;
+  std::chrono::seconds settle_wait_{0};
 
   std::thread thread_;
+  std::optional<LockWatch> folders_watch_;  // Last, as it posts.
 };
 
 // The daemon's work: serves the command socket until the daemon is to end. What a worker has not

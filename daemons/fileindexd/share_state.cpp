@@ -21,6 +21,11 @@ ShareState FromJson(const Json::Value& value) {
   ShareState state;
   const std::vector<std::string> crawled = JsonArr2Vec<std::string>(value["crawled"]);
   state.crawled.insert(crawled.begin(), crawled.end());
+  if (const Json::Value& settings = value["settings"]; settings.isObject()) {
+    for (const std::string& folder : settings.getMemberNames()) {
+      GetJsonValue(state.settings[folder], settings, folder, /*required=*/true);
+    }
+  }
   GetJsonValue(state.rebuilt, value, "rebuilt", /*required=*/false);
   if (value.isMember("missed")) {
     for (const std::string& path : JsonArr2Vec<std::string>(value["missed"])) {
@@ -62,6 +67,9 @@ ShareState LoadShareState(const std::string& file) {
 void SaveShareState(const std::string& file, const ShareState& state) {
   Json::Value value(Json::objectValue);
   value["crawled"] = Vec2JsonArr<std::string>({state.crawled.begin(), state.crawled.end()});
+  for (const auto& [folder, settings] : state.settings) {
+    value["settings"][folder] = settings;
+  }
   value["rebuilt"] = state.rebuilt;
   if (const std::set<std::string>& missed = state.missed.Paths(); !missed.empty()) {
     value["missed"] = Vec2JsonArr<std::string>({missed.begin(), missed.end()});

@@ -3,6 +3,7 @@
 #ifndef DAEMONS_FILEINDEXD_SHARE_STATE_H_
 #define DAEMONS_FILEINDEXD_SHARE_STATE_H_
 
+#include <map>
 #include <optional>
 #include <set>
 #include <string>
@@ -24,6 +25,8 @@ struct CrawlPoint {
 
 struct ShareState {
   std::set<std::string> crawled;  // Full paths of indexed folders.
+  // What each of them was compared with last (Scope::SettingsOf), unless that is not known.
+  std::map<std::string, std::string> settings;
   std::optional<CrawlPoint> crawl;
   // The index was made anew as the status file asked for, and is still to be filled.
   bool rebuilt = false;

@@ -104,6 +104,11 @@ void Worker::Kick() {
   watch_.Wake();
 }
 
+void Worker::KickSettled() {
+  settled_ = true;
+  Kick();
+}
+
 void Worker::Stop() {
   stopping_ = true;
   watch_.Wake();
@@ -131,6 +136,7 @@ Json::Value Worker::Describe() const {
 void Worker::Run() {
   state_ = LoadShareState(ShareStateFile(share_));
   while (!stopping_) {
+    settings_are_settled_ = settled_.exchange(false) || settings_are_settled_;
     if (kicked_.exchange(false)) {
       wait_ = std::chrono::seconds(0);
       has_unread_ = true;  // To be asked of the engine, which may have lost the index.
@@ -197,6 +203,10 @@ Worker::Outcome Worker::RunCycle() {
   } else {
     cycle().ReconcileNewFolders();
   }
+  // With a snapshot from before, the queue is still to be taken.
+  if (settings_are_settled_ && !was_left) {
+    cycle().ReconcileOtherSettings();
+  }
   const bool all_is_read = !may_have_unread || cycle().IndexUnread();
   cycle().Finish();
   has_unread_ = cycle().TakeHasUnread() || !all_is_read;
@@ -207,6 +217,7 @@ Worker::Outcome Worker::RunCycle() {
     state_.rebuilt = false;
     SaveShareState(ShareStateFile(share_), state_);
   }
+  settings_are_settled_ = settings_are_settled_ && was_left;
   queue.DeleteTmp();  // Also where its lines came down to nothing.
   wait_ = std::chrono::seconds(0);
   space_is_told_ = false;

@@ -55,6 +55,8 @@ class Worker {
   const std::string& Share() const { return share_; }
   // The settings, the pause or the share may be others: looks at everything anew.
   void Kick();
+  // The same, and nobody is changing the folders: what was to be queued of it is.
+  void KickSettled();
   void Stop();
   // True when the thread has ended within the time.
   bool AwaitEnd(std::chrono::steady_clock::time_point until);
@@ -82,6 +84,7 @@ class Worker {
   const std::chrono::milliseconds coalescing_;
   std::atomic<bool> stopping_ = false;
   std::atomic<bool> kicked_ = false;
+  std::atomic<bool> settled_ = true;
   Stats stats_;
   QueueWatch watch_;
   mutable kavo::local::Mutex queue_path_mutex_;
@@ -92,7 +95,8 @@ class Worker {
   std::chrono::seconds wait_{0};
   // Since when some documents lack their text because nobody was there to read it.
   std::optional<std::chrono::steady_clock::time_point> unread_since_;
-  bool has_unread_ = true;  // Perhaps: nobody has looked yet.
+  bool has_unread_ = true;             // Perhaps: nobody has looked yet.
+  bool settings_are_settled_ = false;  // And were not looked at since.
   bool space_is_told_ = false;
   bool index_is_missing_ = false;
 

@@ -2,13 +2,13 @@
 
 #include <algorithm>
 #include <exception>
-#include <new>
 #include <random>
 #include <utility>
 #include <vector>
 
 #include "common/check.h"
 #include "daemons/common/log.h"
+#include "daemons/common/no_memory.h"
 #include "daemons/kavoelasticd/commands.h"
 #include "daemons/kavoelasticd/disk.h"
 #include "daemons/kavoelasticd/failure.h"
@@ -114,9 +114,10 @@ Json::Value Engine::Answer(const std::function<Json::Value()>& work) {
     return work();
   } catch (const Failure& failure) {
     return Refusal(failure.GetCode(), failure.what());
-  } catch (const std::bad_alloc&) {
-    return Refusal(Code::kStorage, kNoMemory);
   } catch (const std::exception& error) {
+    if (daemon::IsLackOfMemory(error)) {
+      return Refusal(Code::kStorage, kNoMemory);
+    }
     daemon::Log(daemon::Level::kError, VEXLO_SOURCE, __LINE__,
                 std::string("a request failed, reason=") + error.what());
     return Refusal(Code::kInternal, error.what());

@@ -4,7 +4,6 @@
 
 #include <atomic>
 #include <cstddef>
-#include <new>
 #include <optional>
 #include <thread>
 #include <utility>
@@ -12,6 +11,7 @@
 #include "common/error.h"
 #include "common/json.h"
 #include "daemons/common/frame_server.h"
+#include "daemons/common/no_memory.h"
 #include "daemons/kavoelasticd/failure.h"
 #include "kavo/local/shares.h"
 
@@ -66,7 +66,10 @@ std::string AnswerText(const Handler& handler, const std::string& request) {
       return ErrorText(ERR_BAD_PARAMETER, "the request is no JSON object");
     }
     reply = JsonToString(handler(value));
-  } catch (const std::bad_alloc&) {
+  } catch (const std::exception& error) {
+    if (!daemon::IsLackOfMemory(error)) {
+      throw;
+    }
     reply = ErrorText(static_cast<int>(Code::kStorage), kNoMemory);
   }
   // Each worker would keep as much as its longest request took.

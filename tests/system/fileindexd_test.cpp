@@ -20,6 +20,8 @@
 #include "common/json.h"
 #include "fileindex/comm.h"
 #include "fileindex/elastic_control/share_index.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/index_mgr/monitor.h"
 #include "fileindex/optree/event.h"
 #include "fileindex/paths.h"
 #include "fileindex/status_mgr.h"
@@ -87,10 +89,15 @@ class Fileindexd : public testing::Test {
       kRoot.MakeFolder(folder);
     }
     SetShare("");
-    WriteText(kRoot / "var/packages/Vexlo/etc/fileindex.folders",
-              "[" + FolderText("/docs/in") + "]");
     fs::create_directory(docs_ / "in");
+    SetFolders(FolderText("/docs/in"));
     Start(extractor_, KAVOCONTENTEXTRACTD_PROGRAM, "kavocontentextractd");
+  }
+  // As a command leaves them: listed, and registered.
+  static void SetFolders(const std::string& folders) {
+    WriteText(kRoot / "var/packages/Vexlo/etc/fileindex.folders", "[" + folders + "]");
+    vexlo::fileindex::FolderMgr registered;
+    vexlo::fileindex::UpsertEVNotifydCfg("docs", registered);
   }
   ~Fileindexd() override {
     End(extractor_, SIGKILL);
@@ -524,9 +531,8 @@ TEST_F(Fileindexd, FollowsTheSettings) {
   fs::create_directories(docs_ / "new");
   WriteText(docs_ / "new/b.txt", "beta");
   StartAll();
-  const std::string folders = kRoot / "var/packages/Vexlo/etc/fileindex.folders";
   const auto change = [&](const std::string& text) {
-    WriteText(folders, "[" + text + "]");
+    SetFolders(text);
     EXPECT_TRUE(Command(R"({"type":"notify_setting_changed",
                             "data":{"share_name":"docs","is_upsert":true}})")["success"]
                     .asBool());
@@ -706,9 +712,7 @@ TEST_F(Fileindexd, AnswersEveryCommandAtOnce) {
 
 // By digests, with changes of which nobody was told: of the disk, and of the index by others.
 TEST_F(Fileindexd, AComparisonFindsWhatOneEntryByEntryDoes) {
-  WriteText(
-      kRoot / "var/packages/Vexlo/etc/fileindex.folders",
-      "[" + FolderText("/docs/in") + "," + FolderText("/docs/in/a", /*document=*/false) + "]");
+  SetFolders(FolderText("/docs/in") + "," + FolderText("/docs/in/a", /*document=*/false));
   fs::create_directories(docs_ / "out");
   StartAll();
   RandomTree tree(docs_ / "in", docs_ / "out", 7);

@@ -184,6 +184,11 @@ constexpr char kJudge[] = "judge";
 constexpr char kWrites[] = ",open,write,truncate,sync,rename,unlink,flock,";
 constexpr char kTalks[] = ",connect,send,recv,";
 constexpr char kAll[] = ",open,write,truncate,sync,rename,unlink,flock,connect,send,recv,";
+constexpr Moment kFolderMoments[] = {
+    {"folder add", kTool, kAll, 60, kAdd},
+    {"folder set", kTool, kAll, 60, "folder set "},
+    {"folder delete", kTool, kAll, 60, kDelete},
+};
 constexpr Moment kMoments[] = {
     {"commit", "kavoelasticd", ",write,truncate,sync,", 30},
     {"request", "kavoelasticd", kTalks, 20},
@@ -193,9 +198,9 @@ constexpr Moment kMoments[] = {
     {"crawl", "fileindexd", kTalks, 12, "folder reindex /docs/in"},
     {"append", "evnotifyd", kWrites, 4},
     {"extraction", "kavocontentextractd", ",open,read,send,recv,", 10},
-    {"folder add", kTool, kAll, 60, kAdd},
-    {"folder set", kTool, kAll, 60, "folder set "},
-    {"folder delete", kTool, kAll, 60, kDelete},
+    kFolderMoments[0],
+    kFolderMoments[1],
+    kFolderMoments[2],
 };
 
 // Through which a process learns at which call it is to die.
@@ -324,9 +329,12 @@ class Torture {
     }
   }
 
-  // All that is listed is in the index as it is on the disk.
+  // A last command is cut short, and made good by the daemon. Then all that is listed is in the
+  // index as it is on the disk.
   void Judge() {
     ++tally_.audits;
+    while (!KillTool(kFolderMoments[tree_.Below(std::size(kFolderMoments))])) {
+    }
     // A command that was cut short is made good first. Of a share without folders the watcher may
     // have appended a last line behind the removal of its queue.
     EXPECT_TRUE(Stack::Await([&] { return AreFoldersSettled(); })) << stack_.Logs();

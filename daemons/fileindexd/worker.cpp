@@ -213,7 +213,10 @@ Worker::Outcome Worker::RunCycle() {
   unread_since_ =
       has_unread_ ? unread_since_.value_or(Clock::now()) : std::optional<Clock::time_point>();
   if (fills) {
-    StatusMgr().UnsetShareStatus(share_, kBothBits);
+    // Not for nothing: what is saved by somebody between the reading and the saving is lost.
+    if (StatusMgr status; (status.GetShareStatus(share_) & kBothBits) != 0) {
+      status.UnsetShareStatus(share_, kBothBits);
+    }
     state_.rebuilt = false;
     SaveShareState(ShareStateFile(share_), state_);
   }

@@ -44,4 +44,9 @@ TEST(Check, LogsOneLineThenThrows) {
   EXPECT_EQ(log.Take(), want);
 }
 
+TEST(Check, AModuleLogsUnderOneName) {
+  EXPECT_STREQ(internal::SourceNameOf("src/fileindex/optree/event.cpp").text, "optree");
+  EXPECT_STREQ(internal::SourceNameOf("src/fileindex/queue_mgr.cpp").text, "queue_mgr");
+}
+
 }  // namespace vexlo

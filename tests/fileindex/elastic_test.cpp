@@ -10,6 +10,7 @@
 
 #include "common/error.h"
 #include "common/json.h"
+#include "fileindex/caught.h"
 #include "fileindex/comm.h"
 #include "fileindex/elastic_control/documents.h"
 #include "fileindex/elastic_control/share_index.h"
@@ -92,17 +93,11 @@ class Elastic : public testing::Test {
     happened += "# " + name;
     random_number = 0;
     const SyslogCapture quiet;
-    std::string thrown;
-    try {
-      call();
-    } catch (const vexlo::Error& error) {
-      const std::string reason = error.what();
-      thrown = "! " + std::to_string(error.GetErrorCode()) + (reason.empty() ? "" : " ") + reason;
-    }
+    const std::string thrown = Caught(call);
     for (const std::string& request : engine_.Take()) {
       happened += "\n> " + request;
     }
-    happened += (thrown.empty() ? "" : "\n") + thrown + "\n";
+    happened += (thrown.empty() ? "" : "\n! ") + thrown + "\n";
   }
   // What happened, less the requests.
   static std::string WithoutRequests() {
@@ -142,15 +137,12 @@ TEST_F(Elastic, AReplyIsCheckedInDepth) {
     SCOPED_TRACE(row.name);
     engine_.Script({row.reply});
     SyslogCapture log;
-    std::string thrown;
-    try {
+    const std::string thrown = Caught([&row] {
       Json::Value response = "stale";
       Json::Value request;
       request[row.is_compound ? "compound" : "command"].append("x");
       vexlo::SendRequestImpl(response, request);
-    } catch (const vexlo::Error& error) {
-      thrown = std::to_string(error.GetErrorCode()) + " " + error.what();
-    }
+    });
     EXPECT_EQ(thrown.substr(0, row.want.empty() ? thrown.size() : row.want.size()), row.want);
     EXPECT_EQ(log.Take().size(), row.want_logged);
   }
@@ -221,7 +213,7 @@ TEST_F(Elastic, EachOperationHasItsRequest) {
 > {"command":"document_set_by_id","data":{"data":{"KAVOMDFSName":"name","KAVOMDParent":"parent","KAVOMDSearchAncestor":"parent","KAVOMDSearchFileName":"name","options":{"need_meta":false}},"doc_id":"/a","id":"fileindex_s"}}
 # attributes, no document
 > {"command":"document_get_by_query","data":{"id":"fileindex_s","query":{"qsl":{"term":{"KAVOMDPath":"/int"}}}}}
-! 917
+! 917 
 # delete below
 > {"command":"document_del_by_query","data":{"id":"fileindex_s","query":{"qsl":{"prefix":{"KAVOMDPath":"/a/"}}}}}
 # paths
@@ -298,7 +290,7 @@ TEST_F(Elastic, ARenameMovesWhatLiesBelowInBatches) {
     EXPECT_EQ(log.Take().size(), count / 10000);
   }
   Do("no document", {Found("")}, [] { IndexRename("s", "/w", "/v/a"); });
-  EXPECT_TRUE(happened.ends_with("\n! 917\n")) << happened;
+  EXPECT_TRUE(happened.ends_with("\n! 917 \n")) << happened;
   Do("no parent", {Found("{}"), ok, Found(R"({"KAVOMDFSName":""})")},
      [] { IndexRename("s", "/w", "/v/a"); });
   EXPECT_NE(happened.find("\n! 120 Missing property: KAVOMDParent, data="), std::string::npos);

@@ -3,14 +3,13 @@
 
 #include <random>
 
-#include "common/error.h"
 #include "common/json.h"
 #include "common/sdk/share.h"
+#include "fileindex/caught.h"
 #include "fileindex/util/path_index.h"
 #include "support/faults.h"
 #include "support/private_root.h"
 
-using std::to_string;
 using vexlo::JsonFromString;
 using vexlo::fileindex::Folder;
 using vexlo::fileindex::FolderMgr;
@@ -75,16 +74,6 @@ std::string Paths(const std::vector<FolderPtr>& folders) {
   return paths;
 }
 
-// "CODE REASON" of the Error, or "".
-template <typename Act>
-std::string Caught(Act act) {
-  try {
-    return act(), "";
-  } catch (const vexlo::Error& error) {
-    return to_string(error.GetErrorCode()) + " " + error.what();
-  }
-}
-
 void SetShares() {
   kRoot.MakeFolder("tmp");
   kRoot.SetShares(R"({"name": "p", "path": ")" + kRoot.MakeFolder("v1/p") +
@@ -98,31 +87,6 @@ FolderMgr Loaded(const std::vector<Json::Value>& records) {
   }
   WriteText(kFile, vexlo::JsonToString(folders));
   return {};
-}
-
-TEST(FolderMgr, LoadsAllOfTheFileOrNothing) {
-  const std::string record = "{'path':'/p','name':'','document':1,'audio':0,'video':true,";
-  const std::string whole = record + "'photo':false";
-  struct Row {
-    const char* name;
-    std::string text, want;
-  };
-  for (const Row& row : {
-           Row{"LeastRecord", "[" + whole + "}]", "/p "},
-           Row{"OptionalOfAnotherType", "[" + whole + ",'owner':{}}]", "/p "},
-           Row{"Torn", "[" + whole, "504 Cannot load json: " + kFile},
-           Row{"NoPhoto", "[" + whole + "}," + record + "'x':1}]", "120 Missing property: photo"},
-           Row{"Reserved", "[" + whole + ",'group':'all'}]", "120 \"all\" is reserved group name"},
-       }) {
-    SCOPED_TRACE(row.name);
-    std::string text = row.text, got;
-    std::replace(text.begin(), text.end(), '\'', '"');
-    WriteText(kFile, text);
-    const std::string error = Caught([&] { got = Paths(FolderMgr().GetFolders()); });
-    EXPECT_EQ(error.empty() ? got : error.substr(0, row.want.size()), row.want) << error;
-  }
-  unlink(kFile.c_str());
-  EXPECT_TRUE(FolderMgr().GetFolders().empty());
 }
 
 TEST(FolderMgr, GivesBackWhatWasSaved) {

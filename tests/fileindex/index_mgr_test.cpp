@@ -9,9 +9,9 @@
 #include <filesystem>
 #include <optional>
 
-#include "common/error.h"
 #include "common/json.h"
 #include "common/sdk/share.h"
+#include "fileindex/caught.h"
 #include "fileindex/comm.h"
 #include "fileindex/elastic_control/share_index.h"
 #include "fileindex/folder_mgr.h"
@@ -170,12 +170,7 @@ using Act = std::function<void()>;
 std::string Recorded(const Act& act, size_t failing = SIZE_MAX) {
   steps.clear();
   failing_step = failing;
-  std::string caught;
-  try {
-    act();
-  } catch (const vexlo::Error& error) {
-    caught = std::to_string(error.GetErrorCode()) + " " + error.what();
-  }
+  const std::string caught = Caught(act);
   failing_step = SIZE_MAX;
   return WithoutRoot(caught);
 }
@@ -389,6 +384,8 @@ TEST_F(IndexMgr, RefusesAWholeListForOneBadElement) {
            Row{"Refused", [] { FolderSet(List(Record("/p"), Record("/p/.git")), false); },
                "903 Path cannot index: /p/.git"},
            Row{"UnknownShare", [] { FolderAdd(List(Record("/x")), true); }, "800 x"},
+           Row{"ReservedGroup", [] { FolderAdd(List(Record("/p/a", true, "all")), false); },
+               "120 \"all\" is reserved group name"},
            Row{"DeleteOfNoText", [] { FolderDelete(List("/p", 7)); }, "120 7"},
            Row{"DeleteInUnknownShare", [] { FolderDelete(List("/x/a")); }, "800 x"},
            Row{"ReindexOfNoText", [] { FolderReindex(List("/p", 7)); }, "120 7"},
@@ -404,7 +401,10 @@ TEST_F(IndexMgr, RefusesAWholeListForOneBadElement) {
     EXPECT_EQ(World(), before);
   }
   WriteText(kEtc + "/fileindex.folders", "{}");
-  EXPECT_EQ(Recorded([] { FolderAdd(Json::Value(), false); }).substr(0, 4), "504 ");
+  EXPECT_EQ(Recorded([] { FolderAdd(Json::Value(), false); }),
+            WithoutRoot("504 Cannot load json: " + kEtc + "/fileindex.folders"));
+  WriteText(kEtc + "/fileindex.folders", "[" + JsonToString(Record("/p")) + R"(,{"path":"/m"}])");
+  EXPECT_TRUE(Recorded([] { FolderMgr(); }).starts_with("120 Missing property: "));
 }
 
 TEST_F(IndexMgr, ListsAndSumsUp) {

@@ -13,6 +13,7 @@
 
 #include "common/error.h"
 #include "common/json.h"
+#include "fileindex/caught.h"
 #include "support/naive_tree.h"
 #include "support/queue_file.h"
 #include "support/temp_folder.h"
@@ -105,6 +106,12 @@ TEST_F(Tree, BadPathsLeaveTheirNodesAndWalksGoBelowFirst) {
   };
   tree.TraverseNodeDescendant(tree.root, visit, /*skip_self=*/true);
   EXPECT_EQ(paths, "/a/x/1 /a/x /a/y /a /b/z /b ");
+}
+
+TEST_F(Tree, AQueueThatCannotBeOpenedIsAnError) {
+  const SyslogCapture quiet;
+  EXPECT_EQ(Caught([&] { const OPTree tree(queue); }),
+            "502 Failed to open queue, reason=No such file or directory");
 }
 
 TEST_F(Tree, CallbackThatThrowsEndsTheDelivery) {

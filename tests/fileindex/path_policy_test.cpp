@@ -5,7 +5,7 @@
 #include <functional>
 #include <map>
 
-#include "common/error.h"
+#include "fileindex/caught.h"
 #include "fileindex/util/share_path.h"
 #include "kavo/filesystem.h"
 #include "kavo/share.h"
@@ -88,13 +88,8 @@ class PathPolicy : public testing::Test {
         decides = verdict.rule + std::string(verdict.answer == RuleVerdict::kCannotTell ? "?" : "");
       }
     }
-    std::string thrown;
     bool can_be_indexed = false;
-    try {
-      can_be_indexed = CanFullPathBeIndexed(path);
-    } catch (const vexlo::Error& error) {
-      thrown = error.what();
-    }
+    const std::string thrown = Caught([&] { can_be_indexed = CanFullPathBeIndexed(path); });
     EXPECT_EQ(decides.ends_with("?"), !thrown.empty()) << thrown;
     EXPECT_EQ(can_be_indexed, decides.empty());
     return decides;
@@ -196,11 +191,9 @@ TEST_F(PathPolicy, PathsBeginWithTheirShare) {
                "120 Cannot find share: music"},
        }) {
     const SyslogCapture quiet;
-    try {
-      EXPECT_EQ(row.ask(), row.want);
-    } catch (const vexlo::Error& error) {
-      EXPECT_EQ(std::to_string(error.GetErrorCode()) + " " + error.what(), row.want);
-    }
+    std::string got;
+    const std::string error = Caught([&] { got = row.ask(); });
+    EXPECT_EQ(error.empty() ? got : error, row.want);
   }
 }
 

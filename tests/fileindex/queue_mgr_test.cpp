@@ -14,7 +14,7 @@
 #include <sstream>
 #include <string>
 
-#include "common/error.h"
+#include "fileindex/caught.h"
 #include "support/syslog_capture.h"
 #include "support/temp_folder.h"
 
@@ -62,15 +62,13 @@ struct Queue : testing::Test {
 
   // "true", "false", or the code and the reason of what was thrown.
   template <typename Question>
-  std::string Ask(Question question, const std::string& path) const {
-    try {
-      return (QueueMgr(live).*question)(path) ? "true" : "false";
-    } catch (const Error& error) {
-      return std::to_string(error.GetErrorCode()) + " " + error.what();
-    }
+  static std::string Ask(Question question, const std::string& path, const std::string& queue) {
+    bool answer = false;
+    const std::string error = Caught([&] { answer = (QueueMgr(queue).*question)(path); });
+    return !error.empty() ? error : answer ? "true" : "false";
   }
   std::string HasReindex(const std::string& path) const {
-    return Ask(&QueueMgr::IsFullPathHasReindex, path);
+    return Ask(&QueueMgr::IsFullPathHasReindex, path, live);
   }
 
   const TempFolder folder;
@@ -128,12 +126,7 @@ TEST_F(Queue, RenamesUnderTheLockAndUnlocks) {
   ASSERT_EQ(flock(fd, LOCK_UN), 0);
   ASSERT_EQ(mkdir(snapshot.c_str(), 0755), 0);
   const SyslogCapture quiet;
-  try {
-    manager.PrepareTmpQueue();
-    ADD_FAILURE() << "renamed";
-  } catch (const Error& error) {
-    EXPECT_STREQ(error.what(), "rename failed, reason=Is a directory");
-  }
+  EXPECT_EQ(Caught([&] { manager.PrepareTmpQueue(); }), "502 rename failed, reason=Is a directory");
   EXPECT_EQ(locked, 2);
   EXPECT_EQ(flock(fd, LOCK_EX | LOCK_NB), 0) << "still locked";
   close(fd);
@@ -161,7 +154,7 @@ TEST_F(Queue, AnswersForPaths) {
     for (const bool in_snapshot : {false, true}) {
       SCOPED_TRACE(row.text + " asked for " + row.path);
       Put(in_snapshot ? "" : row.text, in_snapshot ? row.text : kNone);
-      EXPECT_EQ(Ask(&QueueMgr::IsFullPathProcessing, row.path), row.processing);
+      EXPECT_EQ(Ask(&QueueMgr::IsFullPathProcessing, row.path, live), row.processing);
       EXPECT_EQ(HasReindex(row.path), row.reindex);
     }
   }
@@ -230,14 +223,7 @@ TEST_F(Queue, AnswersAgainAsOneWhoReadsAllOfIt) {
       std::filesystem::remove(copy + end, none);
       std::filesystem::copy_file(live + end, copy + end, none);
     }
-    QueueMgr fresh(copy);
-    std::string want;
-    try {
-      want = fresh.IsFullPathHasReindex(asked) ? "true" : "false";
-    } catch (const Error& error) {
-      want = std::to_string(error.GetErrorCode()) + " " + error.what();
-    }
-    ASSERT_EQ(got, want) << step;
+    ASSERT_EQ(got, Ask(&QueueMgr::IsFullPathHasReindex, asked, copy)) << step;
   }
 }
 

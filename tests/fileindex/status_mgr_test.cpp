@@ -7,9 +7,9 @@
 #include <optional>
 #include <thread>
 
-#include "common/error.h"
 #include "common/json.h"
 #include "common/lock.h"
+#include "fileindex/caught.h"
 #include "fileindex/communication.h"
 #include "support/fake_engine.h"
 #include "support/faults.h"
@@ -51,14 +51,14 @@ INTERPOSED int usleep(useconds_t microseconds) { return Wait(microseconds / 1000
 
 namespace {
 
-// "CODE REASON" of an Error, the text that a wait was broken off with, or "".
+// As Caught(), and the text that a wait was broken off with.
 using Act = std::function<void(StatusMgr&)>;
-std::string Caught(const Act& act) {
+std::string Outcome(const Act& act) {
   try {
-    StatusMgr manager;
-    return act(manager), "";
-  } catch (const vexlo::Error& error) {
-    return to_string(error.GetErrorCode()) + " " + error.what();
+    return Caught([&] {
+      StatusMgr manager;
+      act(manager);
+    });
   } catch (const char* text) {
     return text;
   }
@@ -109,7 +109,7 @@ TEST(StatusMgr, ChangesTheFileAndTellsTheDaemon) {
     std::replace(want.begin(), want.end(), '\'', '"');
     before.empty() ? void(unlink(kFile.c_str())) : WriteText(kFile, before);
     FakeEngine daemon(kSocketFile);
-    EXPECT_EQ(Caught(row.act).substr(0, 3), row.code);
+    EXPECT_EQ(Outcome(row.act).substr(0, 3), row.code);
     EXPECT_EQ(Parsed(ReadText(kFile)), Parsed(want));
     EXPECT_EQ(daemon.Take(),
               std::vector<std::string>(row.want_sent.empty() ? 0 : 1, row.want_sent));
@@ -122,13 +122,13 @@ TEST(StatusMgr, SavesWhatItReadAndNothingWhenASaveFails) {
   EXPECT_EQ(first.GetPauseInfo() + first.GetShareStatus("a"), -1);
   first.SetShareStatus("b", 2);
   second.SetShareStatus("b", 1);
-  EXPECT_EQ(Caught(kResume).substr(0, 3), "502");  // Without a daemon the change stays.
+  EXPECT_EQ(Outcome(kResume).substr(0, 3), "502");  // Without a daemon the change stays.
   const std::string text = ReadText(kFile);
   EXPECT_EQ(Parsed(text), Parsed(R"({"resume_time":-1,"share":{"b":1}})"));
   for (const std::string function : {"write", "fsync", "rename", "chmod"}) {
     const ScopedFault fault(function.c_str(), EIO);
-    EXPECT_EQ(Caught(kSet), function == "chmod" ? "502 chmod failed, reason=Input/output error"
-                                                : "505 Failed to save json: " + kFile);
+    EXPECT_EQ(Outcome(kSet), function == "chmod" ? "502 chmod failed, reason=Input/output error"
+                                                 : "505 Failed to save json: " + kFile);
     EXPECT_EQ(ReadText(kFile) == text, function != "chmod") << function;
     EXPECT_EQ(std::distance(std::filesystem::directory_iterator(kFolder), {}), 1);
   }
@@ -142,7 +142,7 @@ TEST(StatusMgr, IsWholeAtEveryMomentAmongManyWriters) {
       const Act acts[] = {set, Pause(1, kLockFile + to_string(writer)), kResume};
       std::string error;
       for (int i = 0; i < 24 && error.empty(); i += error.empty() ? 1 : 0) {
-        error = Caught(acts[i % 3]);
+        error = Outcome(acts[i % 3]);
         error = error.starts_with("506 Exceed") ? "" : error;  // The lock is in demand.
       }
       _exit(error.empty() ? 0 : 1);
@@ -151,7 +151,7 @@ TEST(StatusMgr, IsWholeAtEveryMomentAmongManyWriters) {
   int status = 0;
   for (pid_t ended = 0; ended >= 0; ended = waitpid(-1, &status, WNOHANG)) {
     EXPECT_EQ(status, 0);
-    EXPECT_EQ(Caught([](StatusMgr& manager) { manager.GetShareStatus("0"); }), "");
+    EXPECT_EQ(Outcome([](StatusMgr& manager) { manager.GetShareStatus("0"); }), "");
   }
   EXPECT_EQ(StatusMgr().GetPauseInfo(), -1);  // Each of them resumed last.
   EXPECT_EQ(std::filesystem::status(kFile).permissions(), std::filesystem::perms{0644});
@@ -193,12 +193,12 @@ TEST(SendCommandToDaemon, TellsWhetherTheDaemonTookIt) {
     waits.clear();
     on_wait();
     interruptions = row.cuts;
-    EXPECT_EQ(Caught(send), row.want);
+    EXPECT_EQ(Outcome(send), row.want);
     EXPECT_EQ(waits, row.want_waits);
   }
   const RawClient deaf(UnixSocket(kSocketFile, SOCK_STREAM, bind));
   ASSERT_EQ(listen(deaf.fd, 1), 0);
-  EXPECT_EQ(Caught(send), "502 write failed, reason=Resource temporarily unavailable");
+  EXPECT_EQ(Outcome(send), "502 write failed, reason=Resource temporarily unavailable");
   EXPECT_EQ(signal(SIGPIPE, SIG_DFL), SIG_IGN);
 }
 

@@ -110,7 +110,6 @@ TEST(KAVOQuotaIsEnough, ComparesWithTheUsersLimits) {
       {"OnlyCounted", 1234, 9, {1, 0, 5000, 0, kCounted}, "enough"},
       {"NotAllowedToAsk", 1234, 9, {1, 0, 5000, 0, kCounted, EPERM}, "enough"},
       {"Root", 0, 9, {1, 0, 5000}, "enough"},
-      {"AnotherUser", 1235, 9, {1, 0, 5000}, "enough"},
   };
   for (const auto& row : rows) {
     given = &row.quota;
@@ -139,34 +138,6 @@ TEST(KAVOQuotaIsEnough, ComparesWithTheRoomOnTheVolume) {
     EXPECT_EQ(Ask(user, endless.Path(), UINT64_MAX), "enough");
     EXPECT_EQ(Ask(user, volume / "missing", 0), strerror(ENOENT));
   }
-  WriteText(volume / "rest", std::string(kRoom, 'x'));
-  EXPECT_EQ(Ask(0, volume.Path(), 1), "no space");
-  EXPECT_EQ(Ask(0, volume.Path(), 0), "enough");
-}
-
-TEST(KAVOQuotaIsEnough, AsksARealFileSystem) {
-  const TempFolder folder;
-  const auto volume = ScopedMount::Image("truncate -s 16M $IMAGE; mkfs.ext4 -q -O quota $IMAGE",
-                                         folder / "volume", "usrquota");
-  SKIP_IF_REFUSED(volume);
-  constexpr uint64_t kUsed = 64 << 10;
-  WriteText(volume / "file", std::string(kUsed, 'x'));
-  ASSERT_EQ(chown((volume / "file").c_str(), 1234, 1234), 0);
-  const int fd = open(volume.Path().c_str(), O_RDONLY | O_CLOEXEC);
-  dqblk limits{};
-  limits.dqb_bhardlimit = 1024;
-  limits.dqb_valid = QIF_BLIMITS;
-  const long set = syscall(SYS_quotactl_fd, fd, QCMD(Q_SETQUOTA, USRQUOTA), 1234, &limits);
-  close(fd);
-  if (set != 0 && errno == ENOSYS) {
-    GTEST_SKIP() << "the kernel has no quotactl_fd()";
-  }
-  ASSERT_EQ(set, 0) << strerror(errno);
-  constexpr uint64_t kMetadata = 16 << 10;  // At most; it is counted, too.
-  EXPECT_EQ(Ask(1234, volume.Path(), (1024 << 10) - kUsed - kMetadata), "enough");
-  EXPECT_EQ(Ask(1234, volume / "file", (1024 << 10) - kUsed + 1), "quota");
-  EXPECT_EQ(Ask(1235, volume.Path(), 1024 << 10), "enough");
-  EXPECT_EQ(Ask(0, volume.Path(), 1024 << 10), "enough");
 }
 
 }  // namespace

@@ -62,9 +62,10 @@ class PathPolicy : public testing::Test {
       kRoot.MakeFolder("volume1/" + share);
     }
     kRoot.SetShares(shares);
-    for (const char* folder : {"photo/a/.git", "photo/#snapshot/.snapshots/1", "photo/#recycle/old",
-                               "photo/x#recycle", "homes/ann/#recycle", "homes/#recycle",
-                               "photo/a/@eaDir", "photo/mounted", "vault/open"}) {
+    for (const char* folder :
+         {"photo/a/.git", "photo/#snapshot/.snapshots/1", "photo/#recycle/old", "photo/x#recycle",
+          "homes/ann/#recycle", "homes/#recycle", "photo/#recycle/.git", "photo/a/@eaDir",
+          "photo/@eaDirs", "photo/mounted", "vault/open"}) {
       kRoot.MakeFolder(std::string("volume1/") + folder);
     }
     WriteText(volume + "/photo/Thumbs.db", "");
@@ -101,8 +102,12 @@ TEST_F(PathPolicy, TheFirstRuleThatRefusesDecides) {
            std::pair{"photo/thumbs.db", ""},
            std::pair{"photo/#snapshot", ""},
            std::pair{"photo/x#recycle", ""},
+           std::pair{"photo/@eaDirs", ""},
            std::pair{"photo/#snapshot/.snapshots/1", "snapshot"},
            std::pair{"photo/missing", "file_system"},
+           // Two rules refuse each of these.
+           std::pair{"photo/#snapshot/.snapshots/missing", "snapshot"},
+           std::pair{"photo/#recycle/.git", "recycle_bin"},
            std::pair{"locked", "share"},
            std::pair{"photo/#recycle/old", "recycle_bin"},
            std::pair{"homes/ann/#recycle", "recycle_bin"},

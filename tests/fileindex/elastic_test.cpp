@@ -23,19 +23,7 @@
 #include "support/private_root.h"
 #include "support/syslog_capture.h"
 
-using vexlo::fileindex::elastic::IndexAttr;
-using vexlo::fileindex::elastic::IndexCommit;
-using vexlo::fileindex::elastic::IndexDel;
-using vexlo::fileindex::elastic::IndexDelDir;
-using vexlo::fileindex::elastic::IndexGetByPrefixPath;
-using vexlo::fileindex::elastic::IndexRename;
-using vexlo::fileindex::elastic::IndexUpsert;
-using vexlo::fileindex::elastic::ShareIndexCreate;
-using vexlo::fileindex::elastic::ShareIndexDelete;
-using vexlo::fileindex::elastic::ShareIndexMigrate;
-using vexlo::fileindex::elastic::ShareIndexPause;
-using vexlo::fileindex::elastic::ShareIndexRename;
-using vexlo::fileindex::elastic::ShareIndexResume;
+namespace elastic = vexlo::fileindex::elastic;
 
 namespace {
 
@@ -147,14 +135,14 @@ TEST_F(Elastic, AReplyIsCheckedInDepth) {
     EXPECT_EQ(log.Take().size(), row.want_logged);
   }
   const ScopedFault fault("sendmsg", EPIPE);
-  Do("not sent", {}, [] { IndexDel("s", "/a"); });
+  Do("not sent", {}, [] { elastic::IndexDel("s", "/a"); });
   EXPECT_TRUE(happened.ends_with("\n! 913 Send failed\n")) << happened;
 }
 
 TEST(ElasticSocket, IsAwaitedFor31SecondsAndConnectedToAnyway) {
   SyslogCapture log;
   happened.clear();
-  EXPECT_THROW(IndexDel("s", "/a"), vexlo::Error);
+  EXPECT_THROW(elastic::IndexDel("s", "/a"), vexlo::Error);
   const std::vector<std::string> lines = log.Take();
   ASSERT_EQ(lines.size(), 32U);
   EXPECT_EQ(happened.size(), 31 * std::string(" 1").size());
@@ -165,7 +153,7 @@ TEST_F(Elastic, ABusyEngineIsAwaited) {
   const std::string tool = kRoot.MakeFolder("usr/kavo/bin") + "/kavoqpxnotify";
   WriteText(tool, "#!/bin/sh\nprintf '%s\\n' \"$@\" >> '" + kRoot / "notices" + "'\nexit 5\n");
   ASSERT_EQ(chmod(tool.c_str(), 0755), 0);
-  const auto pause = [] { ShareIndexPause("s"); };
+  const auto pause = [] { elastic::ShareIndexPause("s"); };
   Do("not ready", Refusals({607, 608, 610, 609}), pause);
   Do("busy", Refusals({1400, 607, 1401, 1400, 1400, 1400, 1400}), pause);
   EXPECT_EQ(WithoutRequests(), R"(# not ready 30 30 30
@@ -188,20 +176,24 @@ TEST_F(Elastic, ABusyEngineIsAwaited) {
 }
 
 TEST_F(Elastic, EachOperationHasItsRequest) {
-  Do("rename", {}, [] { ShareIndexRename("old", "new", "/db"); });
-  Do("create, no share", {}, [] { ShareIndexCreate("gone"); });
-  Do("upsert", {}, [] { IndexUpsert("s", "/a", true); });
-  Do("upsert, extraction throws", {}, [] { IndexUpsert("s", "/int", true); });
-  Do("attributes", {Found("{}")}, [] { IndexAttr("s", "/a"); });
-  Do("attributes, no document", {Found("")}, [] { IndexAttr("s", "/int"); });
-  Do("delete below", {}, [] { IndexDelDir("s", "/a"); });
+  Do("rename", {}, [] { elastic::ShareIndexRename("old", "new", "/db"); });
+  Do("migrate", {}, [] { elastic::ShareIndexMigrate("s", "/db"); });
+  Do("create, no share", {}, [] { elastic::ShareIndexCreate("gone"); });
+  Do("upsert", {}, [] { elastic::IndexUpsert("s", "/a", true); });
+  Do("upsert, extraction throws", {}, [] { elastic::IndexUpsert("s", "/int", true); });
+  Do("attributes", {Found("{}")}, [] { elastic::IndexAttr("s", "/a"); });
+  Do("attributes, no document", {Found("")}, [] { elastic::IndexAttr("s", "/int"); });
+  Do("delete document", {}, [] { elastic::IndexDel("s", "/a"); });
+  Do("delete below", {}, [] { elastic::IndexDelDir("s", "/a"); });
   std::vector<std::string> paths = {"0"};
   Do("paths", {Found(R"({"KAVOMDPath":"2"},{},7,{"KAVOMDPath":"1"})")},
-     [&paths] { IndexGetByPrefixPath("an id", "/a", paths); });
+     [&paths] { elastic::IndexGetByPrefixPath("an id", "/a", paths); });
   EXPECT_EQ(paths, (std::vector<std::string>{"0", "2", "1"}));
-  Do("commit, no share", {Refusal(500)}, [] { IndexCommit("gone"); });
+  Do("commit, no share", {Refusal(500)}, [] { elastic::IndexCommit("gone"); });
   EXPECT_EQ(happened, R"(# rename
 > {"command":"index_config_set","data":{"data":{"id":"fileindex_new","path":"/db"},"id":"fileindex_old"}}
+# migrate
+> {"command":"index_config_set","data":{"data":{"path":"/db"},"id":"fileindex_s"}}
 # create, no share
 ! 800 gone
 # upsert
@@ -214,6 +206,8 @@ TEST_F(Elastic, EachOperationHasItsRequest) {
 # attributes, no document
 > {"command":"document_get_by_query","data":{"id":"fileindex_s","query":{"qsl":{"term":{"KAVOMDPath":"/int"}}}}}
 ! 917 
+# delete document
+> {"command":"document_del_by_id","data":{"doc_id":"/a","id":"fileindex_s"}}
 # delete below
 > {"command":"document_del_by_query","data":{"id":"fileindex_s","query":{"qsl":{"prefix":{"KAVOMDPath":"/a/"}}}}}
 # paths
@@ -225,7 +219,7 @@ TEST_F(Elastic, EachOperationHasItsRequest) {
 }
 
 TEST_F(Elastic, ANewIndexGetsTheMappings) {
-  ShareIndexCreate("my photo");
+  elastic::ShareIndexCreate("my photo");
   Json::Value request;
   ASSERT_TRUE(vexlo::JsonFromString(request, engine_.Take().at(0)));
   Json::Value properties;
@@ -285,14 +279,14 @@ TEST_F(Elastic, ARenameMovesWhatLiesBelowInBatches) {
     }
     engine_.Script(replies);
     SyslogCapture log;
-    IndexRename("s", "/w/N.Dir.TXT", "/v/a");
+    elastic::IndexRename("s", "/w/N.Dir.TXT", "/v/a");
     EXPECT_TRUE(engine_.Take() == want);
     EXPECT_EQ(log.Take().size(), count / 10000);
   }
-  Do("no document", {Found("")}, [] { IndexRename("s", "/w", "/v/a"); });
+  Do("no document", {Found("")}, [] { elastic::IndexRename("s", "/w", "/v/a"); });
   EXPECT_TRUE(happened.ends_with("\n! 917 \n")) << happened;
   Do("no parent", {Found("{}"), ok, Found(R"({"KAVOMDFSName":""})")},
-     [] { IndexRename("s", "/w", "/v/a"); });
+     [] { elastic::IndexRename("s", "/w", "/v/a"); });
   EXPECT_NE(happened.find("\n! 120 Missing property: KAVOMDParent, data="), std::string::npos);
 }
 
@@ -303,7 +297,7 @@ TEST_F(Elastic, ACommitWithoutRoomMarksTheShare) {
   kRoot.MakeFolder("tmp");
   const std::string status = kRoot.MakeFolder("var/packages/Vexlo/etc") + "/fileindex.status";
   WriteText(status, R"({"share": {"full": 2}, "resume_time": 5})");
-  Do("full", {Refusal(500)}, [] { IndexCommit("full"); });
+  Do("full", {Refusal(500)}, [] { elastic::IndexCommit("full"); });
   EXPECT_NE(happened.find("\n! 1003 Share (full) space not enough\n"), std::string::npos);
   Json::Value saved;
   ASSERT_TRUE(vexlo::JsonFromString(saved, ReadText(status)));

@@ -4,10 +4,8 @@
 #include <random>
 
 #include "common/json.h"
-#include "common/sdk/share.h"
 #include "fileindex/caught.h"
 #include "fileindex/util/path_index.h"
-#include "support/faults.h"
 #include "support/private_root.h"
 
 using vexlo::JsonFromString;
@@ -20,13 +18,6 @@ namespace {
 const PrivateRoot kRoot;
 const std::string kFolder = kRoot.MakeFolder("var/packages/Vexlo/etc");
 const std::string kFile = kFolder + "/fileindex.folders";
-const std::string kStatusFile = kFolder + "/fileindex.status";
-
-}  // namespace
-
-INTERPOSED time_t time(time_t* /*copy*/) { return 1000; }
-
-namespace {
 
 using FolderPtr = std::shared_ptr<Folder>;
 
@@ -111,13 +102,11 @@ TEST(FolderMgr, TellsWhatAChangeMeansForAPath) {
   };
   const std::string rest = "/p /p/a ";
   for (const Row& row : {
-           Row{"NothingCovered", Make("/m"), "", "/m:davp", rest + "/m "},
            Row{"Same", Make("/p", "dv"), "", "/p:", "/p/a /p "},
            Row{"Changed", Make("/p/a", "dp", "'group':'g','owner':'o'"), "", "/p/a:dap", rest},
            Row{"CoveredBefore", Make("/p/ab", "d"), "", "/p/ab:v", rest + "/p/ab "},
            Row{"DeletesTheInner", nullptr, "/p/a", "/p/a:dav", "/p "},
            Row{"DeletesTheOuter", nullptr, "/p", "/p:davp", "/p/a "},
-           Row{"DeletesNoFolderOfACoveredPath", nullptr, "/p/x", "/p:", rest},
            Row{"DeletesNoFolder", nullptr, "/m", "none", rest},
            Row{"UnknownShare", nullptr, "/gone/x", "800", rest},
        }) {
@@ -156,11 +145,6 @@ TEST(FolderMgr, AnswersByTheDeepestFolderThatCovers) {
   FolderPtr found;
   manager.Get(found, "/p");
   EXPECT_EQ(found->GetFullPath(), volume + "/p");
-  // A folder of a share that is gone stops the questions, and can be removed.
-  FolderMgr broken = Loaded({Data("/gone"), Data("/p")});
-  EXPECT_EQ(Caught([&] { broken.IsFullPathIndexed(volume); }).substr(0, 3), "800");
-  broken.DeleteByShare("gone");
-  EXPECT_TRUE(broken.IsFullPathIndexed(volume + "/p"));
 }
 
 TEST(PathIndex, AgreesWithAPassOverAllPaths) {
@@ -225,41 +209,6 @@ TEST(FolderMgr, ListsAPage) {
     EXPECT_EQ(error.empty() ? Paths(page) : error, row.want);
     EXPECT_EQ(total, row.want_total);
   }
-}
-
-TEST(Folder, TellsHowItsIndexingStands) {
-  SetShares();
-  unlink(kFile.c_str());
-  kRoot.MakeFolder("var/lib/kavo/fileindex/queue");
-  kRoot.MakeFolder("v1/p/b");
-  const std::string queue = vexlo::sdk::SDKShare("p").GetQueuePath();
-  const std::string event = R"({"event":8,"path":")" + kRoot / "v1/p/a" + R"("})";
-  struct Row {
-    const char* name;
-    std::string path, status, queue, want;
-  };
-  for (const Row& row : {
-           Row{"Elsewhere", "/p/b", "{}", event, "{'text':'finished'}"},
-           Row{"Paused", "/p", "{'resume_time':1001}", event, "{'text':'paused'}"},
-           Row{"PauseRanOut", "/p", "{'resume_time':1000}", event, "{'text':'processing'}"},
-           Row{"PausedIdle", "/p", "{'resume_time':0}", "", "{'text':'finished'}"},
-           Row{"NeedsReindex", "/p", "{'share':{'p':3}}", event, "{'text':'need_reindex'}"},
-           Row{"InvalidPath", "/p/@eaDir", "{'share':{'p':1}}", event,
-               "{'text':'error','desc':'invalid_path'}"},
-       }) {
-    SCOPED_TRACE(row.name);
-    WriteText(kStatusFile, vexlo::JsonToString(Parsed(row.status)));
-    WriteText(queue, row.queue);
-    Json::Value status;
-    Make(row.path)->GetStatus(status);
-    EXPECT_EQ(status, Parsed(row.want));
-  }
-  const FolderPtr folder = Make("/p");
-  EXPECT_EQ(folder->GetDataWithAdditional(Parsed("[]")), folder->GetData());
-  const Json::Value data = folder->GetDataWithAdditional(Parsed("['status','status']"));
-  EXPECT_EQ(data["additional"], Parsed("{'status':{'text':'need_reindex'}}"));
-  EXPECT_EQ(Caught([&] { folder->GetDataWithAdditional(Parsed("['size']")); }),
-            "120 Unknown additioal: size");
 }
 
 }  // namespace

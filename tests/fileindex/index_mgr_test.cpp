@@ -417,6 +417,9 @@ TEST_F(IndexMgr, ListsAndSumsUp) {
   EXPECT_EQ(result["total"].asUInt(), 3U);
   EXPECT_EQ(result["folder"][0]["path"], "/p/a");
   EXPECT_EQ(result["folder"][0]["additional"]["status"]["text"], "finished");
+  EXPECT_EQ(
+      Recorded([&] { vexlo::fileindex::FolderList(result, 0, 0, "", "", "", "", List("size")); }),
+      "120 Unknown additioal: size");
   // "need_reindex" and "processing" each prevail over the other that came before.
   std::filesystem::create_directories(kRoot / "v/m/x");
   std::filesystem::create_directories(kRoot / "v/p/y");
@@ -429,8 +432,13 @@ TEST_F(IndexMgr, ListsAndSumsUp) {
                                   R"({"group":true,"name":"g","text":"processing"},)"
                                   R"({"group":true,"name":"h","text":"need_reindex"},)"
                                   R"({"group":true,"name":"i","text":"error"}],"status":"error"})");
-  StatusMgr().Pause(0);
-  EXPECT_EQ(vexlo::fileindex::GetIndexProcessingStatus(), "paused");
+  for (const auto& [resume_time, want] :
+       {std::pair{"0", "paused"}, {"4000000000", "paused"}, {"1", "processing"}}) {
+    WriteText(kEtc + "/fileindex.status", R"({"resume_time":)" + std::string(resume_time) + "}");
+    EXPECT_EQ(vexlo::fileindex::GetIndexProcessingStatus(), want);
+    vexlo::fileindex::FolderList(result, 0, 0, "", "", "", "/m/x", List("status"));
+    EXPECT_EQ(result["folder"][0]["additional"]["status"]["text"], want);
+  }
   kRoot.SetShares(R"({"name": "p", "path": ")" + kRoot / "v/p" + R"("}, {"name": "m", "path": ")" +
                   kRoot / "v/m" + R"(", "read_only": true})");
   EXPECT_EQ(vexlo::fileindex::GetIndexProcessingStatus(), "finished");

@@ -76,8 +76,6 @@ TEST(KLIBCExec, TellsHowTheProgramEnded) {
 TEST(KLIBCExec, HandsOnArgumentsAndNothingElse) {
   EXPECT_EQ(OutputOf("/usr/bin/printf", "[%s]", "-n", "", "a b", "'\"$HOME`", "*\n;\\", "\xff"),
             "[-n][][a b]['\"$HOME`][*\n;\\][\xff]");
-  EXPECT_EQ(OutputOf("/bin/cat", "/proc/self/cmdline"),
-            std::string("/bin/cat\0/proc/self/cmdline\0", 28));
   EXPECT_EQ(OutputOf("/bin/readlink", "/proc/self/fd/0"), "/dev/null\n");
   // NOLINTNEXTLINE(android-cloexec-dup): one that is inherited is what this is about.
   const int leaked = dup(STDERR_FILENO);

@@ -88,13 +88,9 @@ TEST(KAVOGetFSType, KnowsTheNumbersOfTheKernel) {
 TEST(TypeOfFuse, GoesByNameThenBySource) {
   // Type and source with a blank between them.
   const std::map<std::string, std::vector<std::string>> rows = {
-      {"remote",
-       {"fuse.sshfs nas", "fuse.rclone drive:", "fuse s3fs", "virtiofs tag", "fuse.x host:/export",
-        "fuse [fe80::1]:/export", "fuse https://host/dav"}},
+      {"remote", {"fuse.sshfs nas", "virtiofs tag", "fuse [fe80::1]:/export", "fuse https://h/d"}},
       {"image", {"fuse.squashfuse /a.sqfs", "fuse.archivemount host:/a.tar"}},
-      {"",
-       {"fuse.mergerfs /disk1:/disk2", "fuse.x disk1:disk2/a", "fuse.x :/a", "fuseblk /dev/sda1",
-        "fuse.ssh sshfs", " "}},
+      {"", {"fuse.mergerfs /disk1:/disk2", "fuse.x :/a", "fuse.ssh sshfs", " "}},
   };
   for (const auto& [want, mounts] : rows) {
     for (const std::string& mount : mounts) {

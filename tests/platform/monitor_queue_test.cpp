@@ -89,7 +89,6 @@ TEST_F(MonitorQueueTest, RefusesWhatIsMalformed) {
       {"ConfigIsAnObject", R"({"queue": "/q", "config": {}})", "app", "\"config\" must be a list"},
       {"PathEndsInSlash", Watching(R"("path": "/a/", "mask": 1)"), "app", "\"path\" must be abs"},
       {"PathIsQueue", Watching(R"("path": "/q", "mask": 1)"), "app", "\"path\" must be another"},
-      {"MaskOver", Watching(path + R"("mask": 4294967296)"), "app", "\"mask\" must be a whole"},
       {"IgnoreAPath", Watching(path + R"("mask": 1, "ignore": ["x/y"])"), "app", "list names"},
   };
   for (const auto& row : cases) {
@@ -111,7 +110,6 @@ TEST_F(MonitorQueueTest, NeverOverwritesWhatItCannotRead) {
     std::string says;
   } cases[] = {
       {"Empty", "", "not JSON"},
-      {"QueuesNull", R"({"queues": null})", "\"queues\" must be a list"},
       {"BadQueue", R"({"queues": [{"queue": "q", "config": [], "type": 1}]})", "must be absolute"},
       {"Twice", "{\"queues\": [" + queue + "," + queue + "]}", "same path and type"},
   };

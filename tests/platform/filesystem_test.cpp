@@ -3,7 +3,6 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
-#include <sys/sysmacros.h>
 #include <sys/vfs.h>
 
 #include <map>
@@ -14,7 +13,6 @@
 
 #include "kavo/last_error.h"
 #include "platform/local/fs_type.h"
-#include "platform/local/mount_info.h"
 #include "support/faults.h"
 #include "support/private_mounts.h"
 #include "support/temp_folder.h"
@@ -48,8 +46,6 @@ INTERPOSED int statx(int folder, const char* path, int flags, unsigned mask,
 
 namespace {
 
-using kavo::local::FindMount;
-using kavo::local::Mount;
 using kavo::local::TypeOfFuse;
 
 std::string KindOf(int type) {
@@ -97,24 +93,6 @@ TEST(TypeOfFuse, GoesByNameThenBySource) {
       const size_t blank = mount.find(' ');
       EXPECT_EQ(KindOf(TypeOfFuse(mount.substr(0, blank), mount.substr(blank + 1))), want) << mount;
     }
-  }
-}
-
-TEST(FindMount, ReadsTheListOfMounts) {
-  const std::string text =
-      "36 35 98:0 / /a rw,noatime master:1 propagate_from:2 - fuse.sshfs host:/x\\040y\\134\\9 rw\n"
-      "\nno line\n37 35 0:41 / / - /m rw - tmpfs  rw\n"
-      "136 35 0:41 /- /n\\040- rw - ext4 /dev/\\303\\244 rw\n38 35 0:42 / /o rw";
-  const std::tuple<std::optional<uint64_t>, dev_t, const char*> rows[] = {
-      {36, 0, "fuse.sshfs|host:/x y\\\\9"},
-      {136, 0, "ext4|/dev/\u00e4"},
-      {38, 0, "none"},
-      {{}, makedev(98, 0), "fuse.sshfs|host:/x y\\\\9"},
-      {{}, makedev(0, 41), "tmpfs|"},
-  };
-  for (const auto& [id, device, want] : rows) {
-    const std::optional<Mount> mount = FindMount(text, id, device);
-    EXPECT_EQ(mount ? mount->type + "|" + mount->source : "none", want) << id.value_or(device);
   }
 }
 

@@ -137,7 +137,6 @@ TEST_F(Shares, SettingsAreThoseOfThePresentFile) {
   EXPECT_EQ(photo->ftpPrivilege, 7U);
   EXPECT_EQ(settings(photo.get()), "00100");
   EXPECT_EQ(settings(Get("homes").get()), "00010");
-  EXPECT_EQ(settings(Get("inner").get()), "01000");
   EXPECT_EQ(settings(Get("mounted").get()), "10101");
   {
     const ScopedFault fault("statvfs", ENOENT, 1, /*lasting=*/true);

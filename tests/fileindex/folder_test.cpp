@@ -107,6 +107,7 @@ TEST(FolderMgr, TellsWhatAChangeMeansForAPath) {
            Row{"CoveredBefore", Make("/p/ab", "d"), "", "/p/ab:v", rest + "/p/ab "},
            Row{"DeletesTheInner", nullptr, "/p/a", "/p/a:dav", "/p "},
            Row{"DeletesTheOuter", nullptr, "/p", "/p:davp", "/p/a "},
+           Row{"DeletesNoFolderOfACoveredPath", nullptr, "/p/x", "/p:", rest},
            Row{"DeletesNoFolder", nullptr, "/m", "none", rest},
            Row{"UnknownShare", nullptr, "/gone/x", "800", rest},
        }) {

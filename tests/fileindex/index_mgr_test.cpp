@@ -60,14 +60,6 @@ std::string NameOf(int fd) {
   return std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(fd), error);
 }
 
-std::string Between(const std::string& text, const std::string& begin, const std::string& end) {
-  const size_t from = text.find(begin);
-  return from == std::string::npos
-             ? ""
-             : text.substr(from + begin.size(),
-                           text.find(end, from + begin.size()) - from - begin.size());
-}
-
 }  // namespace
 
 INTERPOSED ssize_t write(int fd, const void* data, size_t size) {
@@ -93,9 +85,11 @@ INTERPOSED ssize_t sendmsg(int fd, const struct msghdr* message, int flags) {
     text.append(static_cast<const char*>(message->msg_iov[i].iov_base),
                 message->msg_iov[i].iov_len);
   }
-  const std::string command = Between(text, "\"command\":\"", "\"");
+  Json::Value request;
+  vexlo::JsonFromString(request, text.substr(std::min(text.size(), sizeof(uint64_t))));
+  const std::string command = request.isObject() ? request["command"].asString() : "";
   const bool fails = command.starts_with("index_") && command != "index_list" &&
-                     Step(command + " " + Between(text, "\"id\":\"", "\""));
+                     Step(command + " " + request["data"]["id"].asString());
   errno = fails ? EPIPE : errno;
   return fails ? -1 : real(fd, message, flags);
 }
@@ -121,16 +115,13 @@ INTERPOSED int KAVOQuotaIsEnough(uid_t /*user*/, const char* path, uint64_t /*by
   return fails ? 0 : 1;
 }
 INTERPOSED int KLIBCErrGet() { return last_error; }
-INTERPOSED int KLIBServiceStart(const char* name) {
-  return Step(std::string("start ") + name) ? -1 : 0;
-}
-INTERPOSED int KLIBServicectlStart(const char* name) { return KLIBServiceStart(name); }
-INTERPOSED int KLIBServicectlStop(const char* name) {
-  return Step(std::string("stop ") + name) ? -1 : 0;
-}
-INTERPOSED int KAVOSMBSetSpotlight(const char* share, int is_on) {
-  return Step(std::string(is_on != 0 ? "searchable " : "unsearchable ") + share) ? -1 : 0;
-}
+#define STEP(name, parameters, step) \
+  INTERPOSED int name parameters { return Step(step) ? -1 : 0; }
+STEP(KLIBServiceStart, (const char* name), std::string("start ") + name)
+STEP(KLIBServicectlStart, (const char* name), std::string("start ") + name)
+STEP(KLIBServicectlStop, (const char* name), std::string("stop ") + name)
+STEP(KAVOSMBSetSpotlight, (const char* share, int is_on),
+     std::string(is_on != 0 ? "searchable " : "unsearchable ") + share)
 INTERPOSED int KLIBCExec(const char* path, ...) {
   va_list arguments;
   va_start(arguments, path);

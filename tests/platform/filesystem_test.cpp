@@ -3,6 +3,7 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <sys/sysmacros.h>
 #include <sys/vfs.h>
 
 #include <map>
@@ -13,6 +14,7 @@
 
 #include "kavo/last_error.h"
 #include "platform/local/fs_type.h"
+#include "platform/local/mount_info.h"
 #include "support/faults.h"
 #include "support/private_mounts.h"
 #include "support/temp_folder.h"
@@ -46,6 +48,8 @@ INTERPOSED int statx(int folder, const char* path, int flags, unsigned mask,
 
 namespace {
 
+using kavo::local::FindMount;
+using kavo::local::Mount;
 using kavo::local::TypeOfFuse;
 
 std::string KindOf(int type) {
@@ -94,6 +98,19 @@ TEST(TypeOfFuse, GoesByNameThenBySource) {
       EXPECT_EQ(KindOf(TypeOfFuse(mount.substr(0, blank), mount.substr(blank + 1))), want) << mount;
     }
   }
+}
+
+TEST(FindMount, ReadsTheListOfMounts) {
+  const std::string text =
+      "36 35 98:0 / /a rw,noatime master:1 propagate_from:2 - fuse.sshfs host:/x\\040y\\134\\9 rw\n"
+      "\nno line\n136 35 0:41 /- /n\\040- rw - ext4 /dev/\\303\\244 rw\n38 35 0:42 / /o rw";
+  const auto find = [&text](std::optional<uint64_t> id, dev_t device) {
+    const std::optional<Mount> mount = FindMount(text, id, device);
+    return mount ? mount->type + "|" + mount->source : "none";
+  };
+  EXPECT_EQ(find(36, 0), "fuse.sshfs|host:/x y\\\\9");
+  EXPECT_EQ(find({}, makedev(0, 41)), "ext4|/dev/\u00e4");
+  EXPECT_EQ(find(38, 0) + find(6, 0), "nonenone");
 }
 
 TEST(RealMounts, MemoryAndBind) {

@@ -48,14 +48,13 @@ class PathPolicy : public testing::Test {
   static void SetUpTestSuite() {
     const std::string volume = kRoot.MakeFolder("volume1");
     std::string shares;
-    for (const std::string share : {"photo", "homes", "locked", "vault", "fixed", "@eaDir"}) {
-      shares += R"({"name": ")" + share + R"(", "path": ")" + volume + "/" + share + R"(")" +
-                (share == "locked"  ? R"(, "encrypted": true)"
-                 : share == "vault" ? R"(, "encryption": true)"
-                 : share == "fixed" ? R"(, "read_only": true)"
-                                    : "") +
-                (share == "@eaDir" ? "}" : "},");
-      kRoot.MakeFolder("volume1/" + share);
+    for (const auto& [share, flags] : {std::pair{"photo", ""},
+                                       {"homes", ""},
+                                       {"locked", R"(, "encrypted": true)"},
+                                       {"vault", R"(, "encryption": true)"}}) {
+      shares.append(shares.empty() ? "" : ",").append(R"({"name": ")").append(share);
+      shares.append(R"(", "path": ")").append(kRoot.MakeFolder(std::string("volume1/") + share));
+      shares.append("\"").append(flags).append("}");
     }
     kRoot.SetShares(shares);
     for (const char* folder :

@@ -100,6 +100,12 @@ TEST(TypeOfFuse, GoesByNameThenBySource) {
   }
 }
 
+TEST(KLIBFhsPathInSnapshot, GoesByWholeNamesWithoutLooking) {
+  EXPECT_EQ(Snapshot("/missing/.snapshots/1/file"), "inside");
+  EXPECT_EQ(Snapshot("/missing/.snapshotsx"), strerror(ENOENT));
+  EXPECT_EQ(Snapshot("/missing/x.snapshots/a"), strerror(ENOENT));
+}
+
 TEST(FindMount, ReadsTheListOfMounts) {
   const std::string text =
       "36 35 98:0 / /a rw,noatime master:1 propagate_from:2 - fuse.sshfs host:/x\\040y\\134\\9 rw\n"

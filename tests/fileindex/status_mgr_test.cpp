@@ -189,6 +189,17 @@ TEST(SendCommandToDaemon, TellsWhetherTheDaemonTookIt) {
   const RawClient deaf(UnixSocket(kSocketFile, SOCK_STREAM, bind));
   ASSERT_EQ(listen(deaf.fd, 1), 0);
   EXPECT_EQ(Outcome(send), "502 write failed, reason=Resource temporarily unavailable");
+  // A length is no reason to take memory.
+  waits.clear();
+  std::thread liar([&deaf] {
+    for (int i = 0; i < 2; ++i) {  // The one before is waiting still.
+      const RawClient client(accept(deaf.fd, nullptr, nullptr));
+      client.Receive(Frame(R"({"data":null,"type":"x"})" + std::string(1, '\0')).size());
+      client.Send(std::string("\0\0\0\0\0\0\0\x80yes", 11));
+    }
+  });
+  EXPECT_EQ(Outcome([](StatusMgr&) { SendCommandToDaemon("x", Json::Value()); }), "broken off");
+  liar.join();
   EXPECT_EQ(signal(SIGPIPE, SIG_DFL), SIG_IGN);
 }
 

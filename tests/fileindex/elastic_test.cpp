@@ -189,6 +189,7 @@ TEST_F(Elastic, EachOperationHasItsRequest) {
   Do("paths", {Found(R"({"KAVOMDPath":"2"},{},7,{"KAVOMDPath":"1"})")},
      [&paths] { elastic::IndexGetByPrefixPath("an id", "/a", paths); });
   EXPECT_EQ(paths, (std::vector<std::string>{"0", "2", "1"}));
+  Do("commit, room left", {Refusal(500)}, [] { elastic::IndexCommit("my photo"); });
   Do("commit, no share", {Refusal(500)}, [] { elastic::IndexCommit("gone"); });
   EXPECT_EQ(happened, R"(# rename
 > {"command":"index_config_set","data":{"data":{"id":"fileindex_new","path":"/db"},"id":"fileindex_old"}}
@@ -212,6 +213,9 @@ TEST_F(Elastic, EachOperationHasItsRequest) {
 > {"command":"document_del_by_query","data":{"id":"fileindex_s","query":{"qsl":{"prefix":{"KAVOMDPath":"/a/"}}}}}
 # paths
 > {"command":"document_get_by_query","data":{"id":"an id","query":{"load_field":["KAVOMDPath"],"qsl":{"prefix":{"KAVOMDPath":"/a/"}}}}}
+# commit, room left
+> {"command":"commit","data":{"id":"fileindex_my photo"}}
+! 500 Request failed, msg=no
 # commit, no share
 > {"command":"commit","data":{"id":"fileindex_gone"}}
 ! 800 gone

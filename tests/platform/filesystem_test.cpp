@@ -100,10 +100,13 @@ TEST(TypeOfFuse, GoesByNameThenBySource) {
   }
 }
 
-TEST(KLIBFhsPathInSnapshot, GoesByWholeNamesWithoutLooking) {
+TEST(KLIBFhsPathInSnapshot, GoesByWholeNamesAndFollowsNoLink) {
   EXPECT_EQ(Snapshot("/missing/.snapshots/1/file"), "inside");
   EXPECT_EQ(Snapshot("/missing/.snapshotsx"), strerror(ENOENT));
   EXPECT_EQ(Snapshot("/missing/x.snapshots/a"), strerror(ENOENT));
+  const TempFolder folder;
+  ASSERT_EQ(symlink("nowhere", (folder / "link").c_str()), 0);
+  EXPECT_EQ(Snapshot(folder / "link"), "") << "it was followed";
 }
 
 TEST(FindMount, ReadsTheListOfMounts) {

@@ -372,6 +372,9 @@ TEST_F(IndexMgr, RefusesAWholeListForOneBadElement) {
   for (const Row& row : {
            Row{"Twice", [] { FolderAdd(List(Record("/p/a"), Record("/p/a")), false); },
                "901 Duplicated ID: /p/a"},
+           Row{"InTheList", [] { FolderAdd(List(Record("/p/a/b"), Record("/p")), true); },
+               "901 Duplicated ID: /p"},
+           Row{"AddOfNoList", [] { FolderAdd(Record("/p/a"), false); }, "120 {"},
            Row{"Refused", [] { FolderSet(List(Record("/p"), Record("/p/.git")), false); },
                "903 Path cannot index: /p/.git"},
            Row{"UnknownShare", [] { FolderAdd(List(Record("/x")), true); }, "800 x"},

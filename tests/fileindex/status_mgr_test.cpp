@@ -92,6 +92,7 @@ TEST(StatusMgr, ChangesTheFileAndTellsTheDaemon) {
            Row{"Unset", kUnset, "{'share':{'\xE9':4294967295}}", "{'share':{'\xE9':4294967292}}"},
            Row{"Clear", kClear, "{'share':{'a':1,'\xE9':2}}", "{'share':{'a':1}}"},
            Row{"NoObject", kSet, "[1]", "[1]", "120"},
+           Row{"SharesAreNoObject", kClear, "{'share':[]}", "{'share':[]}", "120"},
            Row{"NoJson", kSet, "7 {", "7 {", "504"},
            Row{"Pause", Pause(2), "{'a':1}", "{'a':1,'resume_time':2000007200}", "",
                pause("2000007200")},

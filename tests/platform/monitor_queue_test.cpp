@@ -82,13 +82,18 @@ TEST_F(MonitorQueueTest, RefusesWhatIsMalformed) {
     std::string says;
   } cases[] = {
       {"AppWithSlash", good, "a/b", bad_name},
+      {"AppUp", good, "..", bad_name},
+      {"AppNul", good, std::string("a\0b", 3), bad_name},
       {"AppLong", good, std::string(201, 'a'), bad_name},
+      {"NoObject", "[]", "app", "must be an object"},
       {"NoQueue", R"({"config": []})", "app", "\"queue\" is missing"},
       {"QueueRelative", R"({"queue": "q", "config": []})", "app", "\"queue\" must be absolute"},
       {"QueueNul", R"({"queue": "/q\u0000", "config": []})", "app", "\"queue\" must be absolute"},
       {"ConfigIsAnObject", R"({"queue": "/q", "config": {}})", "app", "\"config\" must be a list"},
+      {"FolderIsAText", R"({"queue": "/q", "config": ["/a"]})", "app", "must be an object"},
       {"PathEndsInSlash", Watching(R"("path": "/a/", "mask": 1)"), "app", "\"path\" must be abs"},
       {"PathIsQueue", Watching(R"("path": "/q", "mask": 1)"), "app", "\"path\" must be another"},
+      {"MaskOver", Watching(path + R"("mask": 4294967296)"), "app", "\"mask\" must be a whole"},
       {"IgnoreAPath", Watching(path + R"("mask": 1, "ignore": ["x/y"])"), "app", "list names"},
   };
   for (const auto& row : cases) {

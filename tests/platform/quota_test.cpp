@@ -95,11 +95,13 @@ TEST(KAVOQuotaIsEnough, ComparesWithTheUsersLimits) {
   } const rows[] = {
       {"UpToTheHardLimit", 1234, 1048, {2, 0, 1000}, "enough"},
       {"OneOverTheHardLimit", 1234, 1049, {2, 0, 1000}, "quota"},
+      {"UsedMoreThanTheLimit", 1234, 1, {2, 0, 5000}, "quota"},
       {"NothingIsWritten", 1234, 0, {2, 0, 5000}, "enough"},
       {"LimitBeyond64Bits", 1234, 9999, {UINT64_MAX / 1000, 0, 5000}, "enough"},
       {"SoftLimitInGrace", 1234, 9, {0, 1, 5000, future}, "enough"},
       {"SoftLimitAfterGrace", 1234, 9, {0, 1, 5000, past}, "quota"},
       {"OnlyCounted", 1234, 9, {1, 0, 5000, 0, kCounted}, "enough"},
+      {"NotOn", 1234, 9, {1, 0, 5000, 0, kCounted, ESRCH}, "enough"},
       {"NotAllowedToAsk", 1234, 9, {1, 0, 5000, 0, kCounted, EPERM}, "enough"},
       {"Root", 0, 9, {1, 0, 5000}, "enough"},
   };

@@ -104,6 +104,7 @@ TEST_F(Shares, PathsFindTheirShare) {
            {photo + "/a/inner/#recycle/b", "inner /volume1/photo/a/inner", 1, 0},
            {"/volume1/homes/#recycle/#recycle", "homes /volume1/homes", 1, 1},
            {"/volume1/homes/ann/#recycle", "homes /volume1/homes", 0, 1},
+           {"/volume1/homes/ann/x/#recycle", "homes /volume1/homes", 0, 0},
        }) {
     EXPECT_EQ(HolderOf(path), holder) << path.substr(0, 50);
     EXPECT_EQ(KAVOShareIsShareRecycle(path.c_str()), in_bin) << path.substr(0, 50);

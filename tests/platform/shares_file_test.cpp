@@ -47,11 +47,15 @@ TEST(ReadShares, SaysWhatIsWrongAndWhere) {
   const std::string queues = kavo::local::Root() + "/var/lib/kavo";
   const BadFile bad_files[] = {
       {"CutShort", With("").substr(0, 50), ":2: not JSON: "},
+      {"Extra", "{\"shares\": []}\n{}", ":2: not JSON: "},
       {"DuplicateKey", With(",\n\"path\": \"/x\""), ":3: not JSON: Duplicate key: 'path'"},
       {"NestingBomb", "{\"shares\": " + std::string(1'000'000, '['), ": not JSON: nested too deep"},
+      {"RootIsAList", "[]", ":1: the file must hold an object with the key \"shares\""},
       {"NoShares", "//\n{}", ":2: \"shares\" must be a list"},
       {"OtherKey", "{\"shares\": [],\n\"share\": []}", ":2: unknown key \"share\""},
       {"NoPath", "{\"shares\": [\n{\"name\": \"x\"}]}", ":2: share \"x\": \"path\" is missing"},
+      {"NameIsANumber", Named("5", "\"/5\""), ":2: share 1: \"name\" must be a text"},
+      {"NameEmpty", Named("\"\"", "\"/\""), ":2: share 1: \"name\" must have 1 to 255 bytes"},
       {"NameWithSlash", Named("\"a/b\"", "\"/a/b\""), bad_name},
       {"NameDotDot", Named("\"..\"", "\"/..\""), bad_name},
       {"NameNul", Named(R"("a\u0000")", R"("/a\u0000")"), bad_name},
@@ -64,6 +68,7 @@ TEST(ReadShares, SaysWhatIsWrongAndWhere) {
       {"AmongQueues", Named("\"a\"", '"' + queues + "/fileindex/db/a\""), a + "must lie apart"},
       {"SameName", With("},\n{\"name\": \"photo\", \"path\": \"/photo\""), photo + "\"name\" is"},
       {"UnknownKey", With(",\n\"readonly\": true"), photo + "unknown key \"readonly\""},
+      {"FlagIsANumber", With(",\n\"recycle\": 1"), photo + "\"recycle\" must be true or false"},
       {"FtpOver", With(",\n\"ftp_privilege\": 4294967296"), photo + "\"ftp_privilege\" must"},
   };
   const TempFolder folder;

@@ -6,7 +6,6 @@
 
 #include "common/error.h"
 #include "support/syslog_capture.h"
-#include "support/temp_folder.h"
 
 namespace vexlo {
 
@@ -43,7 +42,6 @@ TEST(Json, ValuesAreReadWithTheseConversions) {
       {"null", R"("")", "false", "0", "0", no},
       {"3.7", R"("3.7000000000000002")", "true", "3", "3", no},
       {"2147483648", R"("2147483648")", "true", no, "2147483648", "2147483648"},
-      {"4294967296", R"("4294967296")", "true", no, no, "4294967296"},
       {"9223372036854775808", R"("9223372036854775808")", "true", no, no, no},
       {R"("5")", R"("5")", no, no, no, no},
       {"[]", no, no, no, no, no},
@@ -74,29 +72,12 @@ TEST(Json, TextsAreReadStrictly) {
   }
 }
 
-TEST(Json, BytesComeBackAsTheyWere) {
-  const TempFolder folder;
-  for (const std::string& name : {"caf\xE9"s, "\xED\xA0\x80\xC3"s, "a\0b"s,
-                                  "\x01\x1F\x7F\"\\\n\t/"s, "\xF0\x9F\x98\x80 \xC3\xBC"s, ""s}) {
-    Json::Value value;
-    value[name] = name;
-    Json::Value read;
-    ASSERT_TRUE(JsonToFile(value, folder / "file") && JsonFromFile(read, folder / "file"));
-    EXPECT_EQ(read, value);
-    EXPECT_EQ(Parse(JsonToString(value)), value);
-    std::string text;
-    AppendJsonText(text, name);
-    EXPECT_EQ(Parse(text), Json::Value(name));
-  }
-}
-
 TEST(Json, ChangesAreMerged) {
   const SyslogCapture quiet;
   const std::vector<std::array<std::string, 3>> rows = {
       // Target, changes, what comes of it ("" for an error).
       {R"({"a":1,"b":{"d":2}})", R"({"a":null,"b":{"c":1}})", R"({"b":{"c":1,"d":2}})"},
       {R"({"a":1})", R"({"a":{"x":{"y":null}}})", R"({"a":{"x":{}}})"},
-      {R"({"a":[1,2]})", R"({"a":[3],"b":null})", R"({"a":[3]})"},
       {"null", R"({"a":1})", R"({"a":1})"},
       {R"({"a":1})", "[1]", ""},
       {"[1]", "{}", ""},

@@ -5,6 +5,7 @@
 #include <sys/file.h>
 #include <sys/stat.h>
 
+#include <algorithm>
 #include <functional>
 #include <memory>
 #include <vector>
@@ -31,8 +32,6 @@ INTERPOSED int flock(int fd, int operation) noexcept {
   return ScopedFault::Fires("flock") ? -1 : real(fd, operation);
 }
 
-FAULTABLE(int, pthread_mutex_unlock, (pthread_mutex_t * mutex) noexcept, (mutex))
-
 namespace vexlo {
 
 const TempFolder kFolder;
@@ -49,18 +48,13 @@ std::string Failure(const std::string& file, bool exclusive) {
   }
 }
 
-TEST(Lock, AMutexIsHeldByOneAndAFailureToGiveItBackIsLogged) {
+TEST(Lock, AMutexIsHeldByOne) {
   Mutex mutex;
-  SyslogCapture log;
-  for (const bool fails : {false, true}) {
-    {
-      const ScopedFault fault(fails ? "pthread_mutex_unlock" : "", EPERM);
-      const LockMutex lock(mutex);
-      EXPECT_FALSE(mutex.TryLock());
-    }
-    EXPECT_EQ(log.Take().size(), fails ? 1U : 0U);
+  {
+    const LockMutex lock(mutex);
+    EXPECT_FALSE(mutex.TryLock());
   }
-  EXPECT_TRUE(mutex.Unlock());
+  EXPECT_TRUE(mutex.TryLock() && mutex.Unlock());
 }
 
 TEST(Lock, SharedOnesCoexistAndAnExclusiveOneWaitsForAll) {
@@ -72,9 +66,7 @@ TEST(Lock, SharedOnesCoexistAndAnExclusiveOneWaitsForAll) {
   close(next_fd);
   EXPECT_EQ(Failure(kPath, /*exclusive=*/true), "Exceed max retry, path=" + kPath);
   EXPECT_EQ(pauses.size(), 64U);
-  for (const useconds_t pause : pauses) {
-    EXPECT_TRUE(pause <= 900000 && pause % 100000 == 0) << pause;
-  }
+  EXPECT_LE(*std::max_element(pauses.begin(), pauses.end()), 900000U);
   EXPECT_GT(std::set(pauses.begin(), pauses.end()).size(), 4U) << "the pauses do not vary";
   EXPECT_EQ(dup(0), next_fd) << "descriptors are left open";
   close(next_fd);
@@ -128,7 +120,6 @@ TEST(Lock, NobodyKeepsRootFromALockInASharedFolder) {
       {"a link", links, "Too many levels of symbolic links", kSomebody, false, false},
       {"a name of another file", names, "Too many links", 0, false, false},
       {"a pipe", pipes, "", kSomebody, false, false},
-      {"their file", writes, "", kSomebody, false, false},
       {"their file, held", writes, "Exceed max retry", kSomebody, true, false},
       {"our file, held", writes, "Exceed max retry", 0, true, true},
   };
@@ -153,27 +144,22 @@ TEST(Lock, NobodyKeepsRootFromALockInASharedFolder) {
 
 TEST(Lock, LocksTheFileThatThePathNamesNow) {
   pauses.clear();
-  const std::vector<std::function<void()>> moves = {
-      [&] { rename(kPath.c_str(), (kFolder / "snapshot").c_str()); },
-      [&] { rename((kFolder / "new").c_str(), kPath.c_str()); },
-      [&] { unlink(kPath.c_str()); },
+  const std::function<void()> moves[] = {
+      [] { rename(kPath.c_str(), (kFolder / "snapshot").c_str()); },
+      [] { rename((kFolder / "new").c_str(), kPath.c_str()); },
+      [] { unlink(kPath.c_str()); },
   };
   for (const auto& move : moves) {
-    WriteText(kPath, "");
-    WriteText(kFolder / "new", "");
-    before_flock = move;
-    const LockFile lock(kPath, /*exclusive=*/true);
-    EXPECT_TRUE(pauses.empty()) << "nobody to wait for";
-    EXPECT_NE(Failure(kPath, true), "") << "a second holder";
-    pauses.clear();
-  }
-  for (const auto& move : moves) {
-    WriteText(kPath, "");
-    WriteText(kFolder / "new", "");
-    before_flock = move;
-    const LockFile lock(kPath, /*exclusive=*/true, std::try_to_lock);
-    EXPECT_TRUE(lock.IsHeld());
-    EXPECT_FALSE(LockFile(kPath, /*exclusive=*/true, std::try_to_lock).IsHeld());
+    for (const bool tries : {false, true}) {
+      WriteText(kPath, "");
+      WriteText(kFolder / "new", "");
+      before_flock = move;
+      const auto lock = tries ? LockFile(kPath, /*exclusive=*/true, std::try_to_lock)
+                              : LockFile(kPath, /*exclusive=*/true);
+      EXPECT_TRUE(lock.IsHeld());
+      EXPECT_TRUE(pauses.empty()) << "nobody to wait for";
+      EXPECT_FALSE(LockFile(kPath, /*exclusive=*/true, std::try_to_lock).IsHeld());
+    }
   }
   EXPECT_EQ(Failure(kFolder / "snapshot", true), "");
 }

@@ -16,25 +16,14 @@ TEST(FileType, Names) {
     FileType want;
   };
   for (const Row& row : {
-           Row{"README", FILE_TYPE_DOCUMENT},
            Row{"/volume1/docs.mp3/a-name-without-a-dot", FILE_TYPE_DOCUMENT},
-           Row{"notes.", FILE_TYPE_DOCUMENT},
            Row{"", FILE_TYPE_DOCUMENT},
-           Row{"/volume1/photo/", FILE_TYPE_DOCUMENT},
-           Row{"photo.JPEG", FILE_TYPE_PHOTO},
            Row{"/volume1/video/movie.DVR-MS", FILE_TYPE_VIDEO},
-           Row{"song.Flac", FILE_TYPE_AUDIO},
-           Row{"archive.zip", FILE_TYPE_DOCUMENT},
-           Row{"archive.tar.gz", FILE_TYPE_DOCUMENT},
            Row{"/volume1/a/odd.tx?", FILE_TYPE_DOCUMENT},
            Row{"/v/x.emulecollection", FILE_TYPE_DOCUMENT},
            Row{"/v/x.emulecollections", FILE_TYPE_OTHER},
-           Row{"/v/.jpg", FILE_TYPE_PHOTO},
-           Row{"photo.jpg ", FILE_TYPE_OTHER},
            Row{std::string("/volume1/photo.jpg\0", 19), FILE_TYPE_OTHER},
-           Row{std::string("a.jpg\0", 6), FILE_TYPE_OTHER},
            Row{"/volume1/photo/.DS_Store", FILE_TYPE_OTHER},
-           Row{"/volume1/caf\xC3\xA9.caf\xE9", FILE_TYPE_OTHER},
        }) {
     EXPECT_EQ(GetFileTypeByFullPath(row.path), row.want) << row.path;
   }

@@ -130,7 +130,7 @@ class Daemons {
   std::string In() const { return root_ / "vol/docs/in"; }
   std::string In(const std::string& name) const { return In() + "/" + name; }
   // Makes the file's folder, too.
-  void Write(const std::string& name, const std::string& text) const {
+  void Write(const std::string& name, const std::string& text = "text") const {
     std::filesystem::create_directories(std::filesystem::path(In(name)).parent_path());
     WriteText(In(name), text);
   }

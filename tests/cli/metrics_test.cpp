@@ -15,8 +15,6 @@
 namespace vexlo::cli {
 namespace {
 
-using namespace std::chrono_literals;
-
 // Every sample is announced, has the form of the text format, and comes once.
 void ExpectValid(const std::string& text) {
   static const std::regex kAnnouncement("# (HELP|TYPE) ([a-z_]+) .+");

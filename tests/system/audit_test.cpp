@@ -325,6 +325,7 @@ TEST_F(AuditTest, TheDoctorFindsWhatIsWrongAndSaysWhatHelps) {
       EXPECT_NE(found.out.find(line), std::string::npos) << line << "is not in\n" << found.out;
     }
   };
+  const std::string remedy = "\n         $ ";
   expect({"error    evnotifyd: does not run, so changes of files go unseen",
           "warning  kavocontentextractd: does not run, ",
           "ok       kavoelasticd: listens and answers; 1 index is active\n",
@@ -340,18 +341,18 @@ TEST_F(AuditTest, TheDoctorFindsWhatIsWrongAndSaysWhatHelps) {
   fake.Script({R"({"queues":[{"lines":1,"overflows":2,"queue":"/q","roots":["/elsewhere"],
       "reason":"4 watches are needed, 3 allowed by fs.inotify.max_user_watches",
       "state":"degraded","watches":100000000}]})"});
-  expect({"warning  shares: indexing is paused without an end\n         $ fileindex resume\n",
-          "warning  kavoelasticd: the index of 'docs' is paused, so it is not searched\n"
-          "         $ fileindex index resume 'docs'\n",
+  expect({"warning  shares: indexing is paused without an end" + remedy + "fileindex resume\n",
+          "warning  kavoelasticd: the index of 'docs' is paused, so it is not searched" + remedy +
+              "fileindex index resume 'docs'\n",
           "warning  shares: 'docs' is marked for a reindex", "$ fileindex folder reindex '/docs'\n",
           "error    fileindexd: does not run, so changes wait in the queues",
-          "folders: .[1]: there is no share 'films' for '/films/x'\n"
-          "         $ fileindex folder prune\n",
+          "folders: .[1]: there is no share 'films' for '/films/x'" + remedy +
+              "fileindex folder prune\n",
           "warning  evnotifyd: not all changes are seen at once for /q: 4 watches are needed",
-          "error    evnotifyd: nobody watches the indexed folder '" + In() +
-              "'\n         $ fileindex folder set '",
+          "error    evnotifyd: nobody watches the indexed folder '" + In() + "'" + remedy +
+              "fileindex folder set '",
           "warning  inotify: 100,000,000 folders are watched of ",
-          "         $ sudo sysctl fs.inotify.max_user_watches=200016384\n",
+          remedy + "sudo sysctl fs.inotify.max_user_watches=200016384\n",
           "warning  inotify: events were lost 2 times"});
 
   ShareIndexResume("docs");
@@ -360,16 +361,16 @@ TEST_F(AuditTest, TheDoctorFindsWhatIsWrongAndSaysWhatHelps) {
   chmod(locks.c_str(), 0500);
   const std::string lock = vexlo::fileindex::kFileIndexStatusLockPath.Get();
   chmod(lock.c_str(), 0);
-  expect({"warning  clock: 1 file is dated in the future", "         $ touch -c 'it'\\''s'\n",
-          "error    state: '" + locks +
-              "' cannot be written: Permission denied\n         $ chmod u+rwx '" + locks + "'\n",
-          "error    state: the lock file '", "         $ sudo chmod a+r '"});
+  expect({"warning  clock: 1 file is dated in the future", remedy + "touch -c 'it'\\''s'\n",
+          "error    state: '" + locks + "' cannot be written: Permission denied" + remedy +
+              "chmod u+rwx '" + locks + "'\n",
+          "error    state: the lock file '", remedy + "sudo chmod a+r '"});
   chmod(locks.c_str(), 0700);
   chmod(lock.c_str(), 0600);
 
   End("kavoelasticd", SIGTERM);
   expect({"error    kavoelasticd: does not run, so nothing is searched or indexed",
-          "         $ '" KAVOELASTICD_PROGRAM "' &\n"});
+          remedy + "'" KAVOELASTICD_PROGRAM "' &\n"});
 }
 
 }  // namespace

@@ -124,9 +124,14 @@ TEST_F(Fileindexd, CarriesOutOperationsThatAreHardToTell) {
       {"AttributesOfWhatWasNeverIndexedAndThatHideALostChange",
        [&] { WriteToken("new.txt"), WriteToken("late.txt"); },
        {Line(EV_ATTRIB, In("new.txt")), Line(EV_ATTRIB, In("late.txt"))}},
-      {"DeleteOfWhatIsThereAgain",
-       [&] { fs::rename(out, In("moved")); },
-       {Line(EV_RENAME, In("moved"), out, true), Line(EV_DELETE, In("old"), "", true)}},
+      {"FolderInTheFilesPlace",
+       [&] {
+         fs::remove(In("late.txt"));
+         WriteToken("late.txt/inside.txt");
+         fs::rename(out, In("moved"));
+       },
+       {Line(EV_RENAME, In("moved"), out, true), Line(EV_DELETE, In("late.txt")),
+        Line(EV_CREATE, In("late.txt"), "", true)}},
       {"CrashedQueue",
        [&] {
          fs::remove_all(In("old"));
@@ -328,29 +333,20 @@ TEST_F(Fileindexd, AnswersEveryCommandAtOnce) {
       {R"({"type":"pause","data":{"resume_time":"soon"}})", false},
       {R"({"type":"worker_create","data":{}})", false},
       {R"({"type":"worker_create","data":{"share_name":"no such share"}})", true},
-      {R"({"data":null})", false},
       {"[]", false},
-      {"", false},
-      {std::string("\0\0", 2), false}};
+      {"", false}};
   for (const auto& [text, want] : cases) {
     EXPECT_EQ(IsDone(text), want) << text;
   }
-  const std::string socket = vexlo::fileindex::kFileIndexDaemonSocketPath.Get();
-  for (const uint64_t length : {UINT64_MAX, uint64_t{100} << 20}) {
-    const RawClient client(socket, LengthBytes(length) + "{");
-    EXPECT_NE(client.Receive(100).find("the request is too long"), std::string::npos) << length;
-  }
+  const RawClient client(vexlo::fileindex::kFileIndexDaemonSocketPath.Get(),
+                         LengthBytes(UINT64_MAX) + "{");
+  EXPECT_NE(client.Receive(100).find("the request is too long"), std::string::npos);
   ASSERT_TRUE(AwaitState("idle"));
   Program tool("exec 2>&1", FILEINDEX_PROGRAM " status --all");
   EXPECT_EQ(tool.End(), 0);
   // How wide the columns are depends on whether the share that there is not is listed yet.
   EXPECT_NE(tool.text.find("\ndocs "), std::string::npos) << tool.text;
   EXPECT_NE(tool.text.find("0 lines  0 changes, 1 file "), std::string::npos) << tool.text;
-  // It is the next one's, whoever left it.
-  End("fileindexd", SIGKILL);
-  EXPECT_TRUE(fs::exists(socket));
-  Start("fileindexd");
-  EXPECT_TRUE(IsDone(R"({"type":"stats"})"));
 }
 
 // By digests, with changes of which nobody was told: of the disk, and of the index by others.

@@ -11,9 +11,7 @@
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "fileindex/util/custom_event.h"
-#include "kavo/local/monitor_queues.h"
 #include "kavo/local/shares.h"
-#include "kavo/monitor_queue.h"
 #include "support/private_root.h"
 
 namespace {
@@ -23,7 +21,6 @@ namespace index = vexlo::fileindex;
 
 const std::string kEtc = kRoot.MakeFolder("var/packages/Vexlo/etc");
 const std::string kQueueFolder = kRoot.MakeFolder("var/lib/kavo/fileindex/queue");
-const std::string kWatchFolder = kRoot.MakeFolder("var/lib/kavo/evnotify");
 const std::string kShares = kRoot / "etc/kavo";
 const std::string kDocs = kRoot.MakeFolder("vol/docs");
 
@@ -42,7 +39,7 @@ void ExpectOnly(const std::string& folder, const std::set<std::string>& names) {
 
 // Nothing but the shares.
 void Clear() {
-  for (const std::string& folder : {kEtc, kQueueFolder, kWatchFolder, kShares}) {
+  for (const std::string& folder : {kEtc, kQueueFolder, kShares}) {
     for (const auto& entry : std::filesystem::directory_iterator(folder)) {
       std::filesystem::remove(entry);
     }
@@ -185,14 +182,6 @@ bool SaveFolders() {
   return true;
 }
 
-bool Register() {
-  Json::Value queue;
-  queue["queue"] = "/queues/new";
-  queue["config"] = Json::arrayValue;
-  return EVNOTIFYD::MonitorQueue::Upsert(EVNOTIFYD::MonitorQueue(queue), "app",
-                                         EVNOTIFYD::MONITOR_QUEUE_TYPE_APPLICATION);
-}
-
 bool EditShares() {
   const std::string file = kShares + "/shares.json";
   const auto shares = kavo::local::ReadShares(file);
@@ -223,9 +212,6 @@ std::vector<FaultyWork> SavingEachFile() {
              shares["other"].asInt() == 2 && status["resume_time"].asInt() == 7 ? "old" : "lost",
              shares["docs"].asInt() == 1 ? "new" : "not yet"};
        }},
-      {"Registrations", kWatchFolder + "/app.json",
-       R"({"queues":[{"queue":"/queues/old","config":[],"type":0}]})", Register,
-       [](const Json::Value& file) { return Members(file["queues"], "queue"); }},
       {"Shares", kShares + "/shares.json", R"({"shares":[{"name":"old","path":"/old"}]})",
        EditShares, [](const Json::Value& file) { return Members(file["shares"], "name"); }},
   };

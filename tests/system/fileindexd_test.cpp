@@ -270,7 +270,7 @@ TEST_F(Fileindexd, FollowsTheSettings) {
   EXPECT_EQ(All(), Paths{"new"});
 }
 
-TEST_F(Fileindexd, TakesCareOfTheStatusBits) {
+TEST_F(Fileindexd, TakesCareOfTheStatusBitsAndEndsAPause) {
   Write("a", "alpha");
   StartAll();
   Write("b", "untold");

@@ -38,6 +38,8 @@ class AuditTest : public testing::Test, protected Daemons {
     Start("fileindexd");
     ASSERT_TRUE(Await([this] { return Run("audit --grace 0").status == 0; }))
         << Run("audit --grace 0").out;
+    // A pause that is said while the end of the first cycle is noted would be lost.
+    ASSERT_TRUE(Await([this] { return Indexing()["state"] == "idle"; })) << Logs();
   }
 
   struct Result {

@@ -1,11 +1,11 @@
 // The fileindex program as a person or a script runs it.
 #include <signal.h>
-#include <sys/wait.h>
 
-#include <cstdio>
 #include <filesystem>
-#include <fstream>
+#include <set>
 #include <span>
+#include <string>
+#include <vector>
 
 #include "support/program.h"
 #include "support/temp_folder.h"

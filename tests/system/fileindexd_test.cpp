@@ -8,7 +8,6 @@
 #include <functional>
 #include <set>
 
-#include "common/error.h"
 #include "common/file.h"
 #include "common/json.h"
 #include "common/sdk/share.h"

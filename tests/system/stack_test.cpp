@@ -222,14 +222,14 @@ TEST(Stack, RestsWhilePausedOrWhileTheShareCannotBeIndexed) {
     const bool is_pause = why == "paused";
     if (is_pause) {
       EXPECT_EQ(stack.Tool("pause"), 0);
-      EXPECT_TRUE(AwaitState(stack, "paused"));
+      ASSERT_TRUE(AwaitState(stack, "paused"));
     } else {
       stack.SetShare(",\"" + why + "\":true");
     }
     const std::set<std::string> tokens = MakeFiles(stack.In());
     stack.Restart("fileindexd", SIGKILL);
-    EXPECT_TRUE(AwaitState(stack, is_pause ? "paused" : "unavailable")) << stack.Logs();
-    EXPECT_TRUE(AwaitQueued(stack));
+    ASSERT_TRUE(AwaitState(stack, is_pause ? "paused" : "unavailable")) << stack.Logs();
+    ASSERT_TRUE(AwaitQueued(stack));
     EXPECT_EQ(Differences(before, ListIndex("docs", tokens)), "");
     if (is_pause) {
       EXPECT_EQ(stack.Tool("resume"), 0);

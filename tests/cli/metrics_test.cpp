@@ -2,12 +2,11 @@
 #include "cli/metrics.h"
 
 #include <gtest/gtest.h>
-#include <regex.h>
 
-#include <iterator>
+#include <fstream>
+#include <regex>
 #include <set>
 #include <sstream>
-#include <vector>
 
 #include "common/json.h"
 #include "daemons/kavoelasticd/request_stats.h"
@@ -16,41 +15,23 @@
 namespace vexlo::cli {
 namespace {
 
-using namespace std::chrono_literals;
-
-// Groups of the first match, the whole of it first; none where the text does not match.
-std::vector<std::string> Match(const std::string& text, const char* pattern) {
-  regex_t compiled;
-  EXPECT_EQ(regcomp(&compiled, pattern, REG_EXTENDED), 0);
-  regmatch_t found[3];
-  std::vector<std::string> groups;
-  if (regexec(&compiled, text.c_str(), std::size(found), found, 0) == 0) {
-    for (const regmatch_t& group : found) {
-      groups.push_back(group.rm_so < 0
-                           ? ""
-                           : text.substr(static_cast<size_t>(group.rm_so),
-                                         static_cast<size_t>(group.rm_eo - group.rm_so)));
-    }
-  }
-  regfree(&compiled);
-  return groups;
-}
-
 // Every sample is announced, has the form of the text format, and comes once.
 void ExpectValid(const std::string& text) {
+  static const std::regex kAnnouncement("# (HELP|TYPE) ([a-z_]+) .+");
+  static const std::regex kSample(
+      R"re(([a-z_]+)(\{([a-z]+="([^"\\]|\\["\\n])*",?)+\})? -?[0-9.e+-]+)re");
   std::set<std::string> seen;
   std::string announced;
   std::istringstream lines(text);
   for (std::string line; std::getline(lines, line);) {
-    if (const auto parts = Match(line, "^# (HELP|TYPE) ([a-z_]+) .+$"); !parts.empty()) {
+    std::smatch parts;
+    if (std::regex_match(line, parts, kAnnouncement)) {
       announced = parts[2];
       EXPECT_TRUE(seen.insert(line).second) << line;
       continue;
     }
-    const auto parts =
-        Match(line, R"re(^([a-z_]+)(\{([a-z]+="([^"\\]|\\["\\n])*",?)+\})? -?[0-9.e+-]+$)re");
-    ASSERT_FALSE(parts.empty()) << line;
-    EXPECT_TRUE(parts[1].starts_with(announced)) << line;
+    ASSERT_TRUE(std::regex_match(line, parts, kSample)) << line;
+    EXPECT_TRUE(parts.str(1).starts_with(announced)) << line;
     EXPECT_TRUE(seen.insert(line.substr(0, line.rfind(' '))).second) << line;
   }
 }

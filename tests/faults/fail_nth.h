@@ -9,7 +9,6 @@
 //   FAIL_ERROR    the errno; 0 has a call transfer one byte (those that transfer none succeed)
 //   FAIL_LASTING  1 when all calls after that one fail, too
 //   FAIL_REPORT   a file that gets the name of the function that failed first
-//   FAIL_PROGRAM  the one program that is meant, by its file's name, of those that are started
 //   FAIL_DEATH    a file that holds a DeathOrder, through which the process can be told to die;
 //   what
 //                 it starts does not take that over

@@ -11,9 +11,7 @@
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "fileindex/util/custom_event.h"
-#include "kavo/local/monitor_queues.h"
 #include "kavo/local/shares.h"
-#include "kavo/monitor_queue.h"
 #include "support/private_root.h"
 
 namespace {
@@ -23,7 +21,6 @@ namespace index = vexlo::fileindex;
 
 const std::string kEtc = kRoot.MakeFolder("var/packages/Vexlo/etc");
 const std::string kQueueFolder = kRoot.MakeFolder("var/lib/kavo/fileindex/queue");
-const std::string kWatchFolder = kRoot.MakeFolder("var/lib/kavo/evnotify");
 const std::string kShares = kRoot / "etc/kavo";
 const std::string kDocs = kRoot.MakeFolder("vol/docs");
 
@@ -42,7 +39,7 @@ void ExpectOnly(const std::string& folder, const std::set<std::string>& names) {
 
 // Nothing but the shares.
 void Clear() {
-  for (const std::string& folder : {kEtc, kQueueFolder, kWatchFolder, kShares}) {
+  for (const std::string& folder : {kEtc, kQueueFolder, kShares}) {
     for (const auto& entry : std::filesystem::directory_iterator(folder)) {
       std::filesystem::remove(entry);
     }
@@ -105,7 +102,7 @@ FaultyWork CustomEvent() {
             // Who cannot tell the share, or can write nothing at all, has the error.
             EXPECT_TRUE(paths.contains("new") || !done);
             if (!lasts) {
-              ExpectOnly(kEtc, {"fileindex.status", "fileindex.folders"});
+              ExpectOnly(kEtc, {"fileindex.status"});
             }
           }};
 }
@@ -141,125 +138,96 @@ FaultyWork Cycle() {
           }};
 }
 
-FaultyWork SavingFolders() {
-  static const std::string kFile = kEtc + "/fileindex.folders";
-  return {"SavingFolders",
-          [] {
-            Clear();
-            Json::Value list(Json::arrayValue);
-            list.append(Record("/docs/old"));
-            WriteText(kFile, vexlo::JsonToString(list));
-          },
-          [] {
-            const vexlo::LockFile lock(index::kFileIndexFoldersLockPath.Get(), /*exclusive=*/true);
-            index::FolderMgr folders;
-            std::shared_ptr<index::Folder> before;
-            folders.Upsert(before, std::make_shared<index::Folder>(Record("/docs/new")));
-            folders.Save();
-            return true;
-          },
-          [](bool done, bool lasts) {
-            std::set<std::string> paths;
-            for (const Json::Value& folder : Load(kFile)) {
-              paths.insert(folder["path"].asString());
-            }
-            EXPECT_TRUE(paths.contains("/docs/old"));
-            EXPECT_TRUE(paths.contains("/docs/new") || !done);
-            if (!lasts) {
-              ExpectOnly(kEtc, {"fileindex.status", "fileindex.folders"});
-            }
-          }};
-}
+// A file that is replaced whole, with something "old" in it, to which saving adds something "new".
+struct SavedFile {
+  const char* name;
+  std::string path;
+  std::string text;
+  std::function<bool()> save;
+  std::function<std::set<std::string>(const Json::Value&)> read;
+};
 
-FaultyWork SavingStatus() {
-  static const std::string kFile = kEtc + "/fileindex.status";
-  return {"SavingStatus",
-          [] {
+FaultyWork Saving(const SavedFile& file) {
+  return {file.name,
+          [file] {
             Clear();
-            WriteText(kFile, R"({"share":{"other":2},"resume_time":7})");
+            WriteText(file.path, file.text);
           },
-          [] {
-            index::StatusMgr().SetShareStatus("docs", index::SS_NEED_REINDEX);
-            return true;
-          },
-          [](bool done, bool lasts) {
-            const Json::Value status = Load(kFile);
-            EXPECT_EQ(status["share"]["other"].asInt(), 2);
-            EXPECT_EQ(status["resume_time"].asInt(), 7);
-            EXPECT_TRUE(status["share"]["docs"].asInt() == 1 || !done);
-            if (!lasts) {
-              ExpectOnly(kEtc, {"fileindex.status", "fileindex.folders"});
-            }
-          }};
-}
-
-FaultyWork Registering() {
-  static const std::string kFile = kWatchFolder + "/app.json";
-  static const auto queue = [](const std::string& name) {
-    Json::Value description;
-    description["queue"] = kQueueFolder + "/" + name;
-    description["config"] = Json::arrayValue;
-    return description;
-  };
-  return {"Registering",
-          [] {
-            Clear();
-            Json::Value file;
-            file["queues"].append(queue("old"));
-            file["queues"][0]["type"] = 0;
-            WriteText(kFile, vexlo::JsonToString(file));
-          },
-          [] {
-            return EVNOTIFYD::MonitorQueue::Upsert(EVNOTIFYD::MonitorQueue(queue("new")), "app",
-                                                   EVNOTIFYD::MONITOR_QUEUE_TYPE_APPLICATION);
-          },
-          [](bool done, bool lasts) {
-            std::set<std::string> queues;
-            const Json::Value file = Load(kFile);
-            for (const Json::Value& entry : file["queues"]) {
-              queues.insert(std::filesystem::path(entry["queue"].asString()).filename());
-            }
-            EXPECT_TRUE(queues.contains("old"));
-            EXPECT_TRUE(queues.contains("new") || !done);
-            if (!lasts) {
-              ExpectOnly(kWatchFolder, {"app.json", "app.json.lock"});
-            }
-          }};
-}
-
-FaultyWork EditingShares() {
-  static const std::string kFile = kShares + "/shares.json";
-  return {"EditingShares", Clear,
-          [] {
-            for (const kavo::local::Share& share : kavo::local::ReadShares(kFile)) {
-              if (share.name == "new") {
-                return true;
-              }
-            }
-            kavo::local::Share share;
-            share.name = "new";
-            share.path = kRoot / "vol/new";
-            kavo::local::AddShare(kFile, share);
-            return true;
-          },
-          [](bool done, bool lasts) {
-            std::set<std::string> names;
-            const Json::Value file = Load(kFile);
-            for (const Json::Value& share : file["shares"]) {
-              names.insert(share["name"].asString());
-            }
-            EXPECT_TRUE(names.contains("docs"));
+          file.save,
+          [file](bool done, bool lasts) {
+            const std::set<std::string> names = file.read(Load(file.path));
+            EXPECT_TRUE(names.contains("old"));
             EXPECT_TRUE(names.contains("new") || !done);
             if (!lasts) {
-              ExpectOnly(kShares, {"shares.json", "shares.json.lock"});
+              const std::filesystem::path path = file.path;
+              ExpectOnly(path.parent_path(), {path.filename(), path.filename().string() + ".lock"});
             }
           }};
+}
+
+std::set<std::string> Members(const Json::Value& list, const char* member) {
+  std::set<std::string> names;
+  for (const Json::Value& each : list) {
+    names.insert(std::filesystem::path(each[member].asString()).filename());
+  }
+  return names;
+}
+
+bool SaveFolders() {
+  const vexlo::LockFile lock(index::kFileIndexFoldersLockPath.Get(), /*exclusive=*/true);
+  index::FolderMgr folders;
+  std::shared_ptr<index::Folder> before;
+  folders.Upsert(before, std::make_shared<index::Folder>(Record("/docs/new")));
+  folders.Save();
+  return true;
+}
+
+bool EditShares() {
+  const std::string file = kShares + "/shares.json";
+  const auto shares = kavo::local::ReadShares(file);
+  kavo::local::Share share;
+  share.name = "new";
+  share.path = kRoot / "vol/new";
+  if (std::none_of(shares.begin(), shares.end(),
+                   [&](const kavo::local::Share& known) { return known.name == share.name; })) {
+    kavo::local::AddShare(file, share);
+  }
+  return true;
+}
+
+std::vector<FaultyWork> SavingEachFile() {
+  Json::Value folders(Json::arrayValue);
+  folders.append(Record("/docs/old"));
+  const SavedFile files[] = {
+      {"Folders", kEtc + "/fileindex.folders", vexlo::JsonToString(folders), SaveFolders,
+       [](const Json::Value& list) { return Members(list, "path"); }},
+      {"Status", kEtc + "/fileindex.status", R"({"share":{"other":2},"resume_time":7})",
+       [] {
+         index::StatusMgr().SetShareStatus("docs", index::SS_NEED_REINDEX);
+         return true;
+       },
+       [](const Json::Value& status) {
+         const Json::Value& shares = status["share"];
+         return std::set<std::string>{
+             shares["other"].asInt() == 2 && status["resume_time"].asInt() == 7 ? "old" : "lost",
+             shares["docs"].asInt() == 1 ? "new" : "not yet"};
+       }},
+      {"Shares", kShares + "/shares.json", R"({"shares":[{"name":"old","path":"/old"}]})",
+       EditShares, [](const Json::Value& file) { return Members(file["shares"], "name"); }},
+  };
+  std::vector<FaultyWork> works;
+  works.reserve(std::size(files));
+  for (const SavedFile& file : files) {
+    works.push_back(Saving(file));
+  }
+  return works;
 }
 
 TEST(LibraryFaults, LoseNothingAndKeepNothing) {
   kRoot.MakeFolder("tmp");
-  for (const FaultyWork& work :
-       {CustomEvent(), Cycle(), SavingFolders(), SavingStatus(), Registering(), EditingShares()}) {
+  std::vector<FaultyWork> works = SavingEachFile();
+  works.insert(works.end(), {CustomEvent(), Cycle()});
+  for (const FaultyWork& work : works) {
     printf("%s: %u faults\n", work.name, RunWithEveryFault(work));
   }
 }

@@ -26,9 +26,7 @@
 #include "fileindex/folder_mgr.h"
 #include "fileindex/paths.h"
 #include "fileindex/queue_mgr.h"
-#include "fileindex/status_mgr.h"
 #include "kavo/local/monitor_queues.h"
-#include "kavo/local/shares.h"
 #include "kavo/monitor_queue.h"
 #include "support/private_root.h"
 #include "support/syslog_capture.h"
@@ -112,20 +110,16 @@ void Install() {
   kRoot.SetShares(R"({"name":"docs","path":")" + kRoot.MakeFolder("vol/docs") + "\"}");
 }
 
-Json::Value Record(const std::string& path) {
+void AddFolder(const std::string& path) {
   Json::Value record;
   record["path"] = record["name"] = path;
   for (const char* type : {"document", "audio", "video", "photo"}) {
     record[type] = true;
   }
-  return record;
-}
-
-void AddFolder(const std::string& path) {
   const vexlo::LockFile lock(index::kFileIndexFoldersLockPath.Get(), /*exclusive=*/true);
   index::FolderMgr folders;
   std::shared_ptr<index::Folder> before;
-  folders.Upsert(before, std::make_shared<index::Folder>(Record(path)));
+  folders.Upsert(before, std::make_shared<index::Folder>(record));
   folders.Save();
 }
 
@@ -139,17 +133,6 @@ TEST(PowerCut, ListsAndStateAreOldOrNew) {
   const Steps works[] = {
       {"Folders", 3, [](int step) { AddFolder(Numbered("/docs/", step)); },
        [] { return static_cast<int>(index::FolderMgr().GetFolders().size()); }},
-      {"Status", 3,
-       [](int step) {
-         index::StatusMgr().SetShareStatus(Numbered("share", step), index::SS_NEED_REINDEX);
-       },
-       [] {
-         int seen = 0;
-         while (index::StatusMgr().GetShareStatus(Numbered("share", seen + 1)) != 0) {
-           ++seen;
-         }
-         return seen;
-       }},
       {"Registrations", 3,
        [](int step) {
          Json::Value queue;
@@ -161,16 +144,6 @@ TEST(PowerCut, ListsAndStateAreOldOrNew) {
        [] {
          const auto read = kavo::local::ReadMonitorQueues();
          return read.unreadable.empty() ? static_cast<int>(read.queues.size()) : -1;
-       }},
-      {"Shares", 3,
-       [](int step) {
-         kavo::local::Share share;
-         share.name = Numbered("share", step);
-         share.path = kRoot / "vol/" + share.name;
-         kavo::local::AddShare(kavo::local::SharesFile(), share);
-       },
-       [] {
-         return static_cast<int>(kavo::local::ReadShares(kavo::local::SharesFile()).size()) - 1;
        }},
       {"Registry", 3,
        [&](int step) {

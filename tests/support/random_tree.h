@@ -105,26 +105,12 @@ class RandomTree {
   }
 
   std::string NewPath(const std::string& root) {
-    static const std::vector<std::string> kNames = {"a",
-                                                    "b",
-                                                    "c.txt",
-                                                    "d e.txt",
-                                                    "new\nline.txt",
-                                                    "\xFF\xFE.txt",
-                                                    "-rf",
-                                                    "-x.html",
-                                                    std::string(250, 'l') + ".txt",
-                                                    "quote\".html",
-                                                    "back\\slash.txt",
-                                                    "\xC3\xA4.html",
-                                                    "100%41.txt",
-                                                    "load.part",
-                                                    "photo.jpg",
-                                                    "a.b",
-                                                    ".hidden.txt",
-                                                    "Thumbs.db",
-                                                    ".git",
-                                                    "@eaDir"};
+    static const std::string kLong = std::string(250, 'l') + ".txt";
+    static const std::vector<std::string> kNames = {
+        "a",          "b",         "c.txt",     "d e.txt",      "new\nline.txt",   "\xFF\xFE.txt",
+        "-rf",        "-x.html",   kLong,       "quote\".html", "back\\slash.txt", "\xC3\xA4.html",
+        "100%41.txt", "load.part", "photo.jpg", "a.b",          ".hidden.txt",     "Thumbs.db",
+        ".git",       "@eaDir"};
     std::vector<std::string> folders = {root};
     for (const std::string& path : List(root)) {
       struct stat info {};

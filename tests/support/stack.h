@@ -14,9 +14,13 @@
 #include <memory>
 #include <string>
 #include <thread>
+#include <vector>
 
 #include "common/json.h"
 #include "fileindex/comm.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/index_mgr/monitor.h"
+#include "fileindex/paths.h"
 #include "support/private_root.h"
 #include "support/program.h"
 #include "support/raw_client.h"
@@ -29,20 +33,16 @@ inline const std::map<std::string, std::string> kDaemonPrograms = {
     {"evnotifyd", EVNOTIFYD_PROGRAM},
 };
 
-// A share "docs" with an indexed folder "in", folders outside of both, and what keeps the index up
-// to date. Everything below the root is made anew for each of these, and must be on one file
+// A share "docs" with a folder "in", folders outside of both, and the daemons, of which none runs
+// at first. Everything below the root is made anew for each of these, and must be on one file
 // system, so that renames work. Where something does not come about, the test fails with the logs.
-class Stack {
+class Daemons {
  public:
   using Clock = std::chrono::steady_clock;
 
-  // `arguments` of each daemon, by its name. `prepare` makes what else is to be there before the
-  // first one starts.
-  explicit Stack(
-      const PrivateRoot& root, std::map<std::string, std::string> arguments = {},
-      const std::function<void()>& prepare = [] {})
+  // `arguments` of each daemon, by its name.
+  explicit Daemons(const PrivateRoot& root, std::map<std::string, std::string> arguments = {})
       : root_(root), arguments_(std::move(arguments)) {
-    arguments_.try_emplace("fileindexd", "--cycle 50");
     for (const char* const name : {"var", "vol", "tmp", "logs"}) {
       std::filesystem::remove_all(root / name);
     }
@@ -54,15 +54,9 @@ class Stack {
       root.MakeFolder(name);
     }
     SetShare("");
-    prepare();
-    for (const char* const name : {"kavoelasticd", "kavocontentextractd", "fileindexd"}) {
-      Start(name);
-    }
-    Start("evnotifyd");
-    EXPECT_EQ(Tool("folder add '" + In() + "'"), 0) << Logs();
   }
   // The watcher first, so that everybody still has whom it talks to.
-  ~Stack() {
+  ~Daemons() {
     for (const char* const name :
          {"evnotifyd", "fileindexd", "kavocontentextractd", "kavoelasticd"}) {
       if (programs_.contains(name)) {
@@ -71,8 +65,8 @@ class Stack {
       }
     }
   }
-  Stack(const Stack&) = delete;
-  Stack& operator=(const Stack&) = delete;
+  Daemons(const Daemons&) = delete;
+  Daemons& operator=(const Daemons&) = delete;
 
   // Returns when the daemon answers, or has ended. `before` stands before its command.
   void Start(const std::string& name, const std::string& before = "") {
@@ -96,10 +90,6 @@ class Stack {
     End(name, signal);
     Start(name);
   }
-  // For the next start.
-  void SetArguments(const std::string& name, const std::string& arguments) {
-    arguments_[name] = arguments;
-  }
 
   // The exit status of the tool with these arguments of a shell, or 128 and the signal that ended
   // it; its output goes to the logs. `before` stands before its command. When it takes longer than
@@ -119,8 +109,36 @@ class Stack {
   void SetShare(const std::string& more) const {
     root_.SetShares(R"({"name":"docs","path":")" + Share() + "\"" + more + "}");
   }
+  // The list of folders and the registration of the share, without the tool: those with everything,
+  // and those without documents.
+  static void SetFolders(const std::vector<std::string>& paths,
+                         const std::vector<std::string>& without_documents = {}) {
+    Json::Value list(Json::arrayValue);
+    const auto add = [&list](const std::string& path, bool document) {
+      Json::Value& folder = list.append(Json::objectValue);
+      folder["path"] = path;
+      folder["name"] = "x";
+      folder["document"] = document;
+      folder["audio"] = folder["video"] = folder["photo"] = true;
+    };
+    for (const std::string& path : paths) {
+      add(path, /*document=*/true);
+    }
+    for (const std::string& path : without_documents) {
+      add(path, /*document=*/false);
+    }
+    WriteText(vexlo::fileindex::kFileIndexFoldersCfgPath.Get(), vexlo::JsonToString(list));
+    vexlo::fileindex::FolderMgr folders;
+    vexlo::fileindex::UpsertEVNotifydCfg("docs", folders);
+  }
   std::string Share() const { return root_ / "vol/docs"; }
   std::string In() const { return root_ / "vol/docs/in"; }
+  std::string In(const std::string& name) const { return In() + "/" + name; }
+  // Makes the file's folder, too.
+  void Write(const std::string& name, const std::string& text = "text") const {
+    std::filesystem::create_directories(std::filesystem::path(In(name)).parent_path());
+    WriteText(In(name), text);
+  }
   std::string Out() const { return root_ / "vol/out"; }
   std::string QueueFolder() const { return root_ / "var/lib/kavo/fileindex/queue"; }
 
@@ -143,39 +161,6 @@ class Stack {
       std::this_thread::sleep_for(std::chrono::milliseconds(5));
     }
     return true;
-  }
-
-  // Waits until all that happened before the call is in the index: until a file that is made now is
-  // found, then one that is made after that, as the watcher holds a rename back for some
-  // milliseconds to see where it goes, and there is nothing left to do.
-  testing::AssertionResult AwaitQuiet() {
-    for (int i = 0; i < 2; ++i) {
-      const std::string token = "marker" + std::to_string(++markers_);
-      WriteText(In() + "/marker.txt", token);
-      if (!Await([&] { return IsFound(token); })) {
-        return testing::AssertionFailure() << token << " is not found\n" << Logs();
-      }
-    }
-    if (!Await([this] { return IsIdle(); })) {
-      return testing::AssertionFailure() << "no end: " << vexlo::JsonToString(Indexing()) << Logs();
-    }
-    return testing::AssertionSuccess();
-  }
-  bool IsIdle() const {
-    std::error_code error;
-    return Indexing()["state"] == "idle" && std::filesystem::is_empty(QueueFolder(), error);
-  }
-  bool IsFound(const std::string& token) const {
-    Json::Value request;
-    request["command"] = "search";
-    request["data"]["words"] = token;
-    Json::Value reply;
-    try {
-      vexlo::SendRequestImpl(reply, request);
-    } catch (const std::exception&) {
-      return false;
-    }
-    return !reply["data"].empty();
   }
 
   // The end of each daemon's log.
@@ -220,6 +205,64 @@ class Stack {
   const PrivateRoot& root_;
   std::map<std::string, std::string> arguments_;
   std::map<std::string, std::unique_ptr<Program>> programs_;
+};
+
+// All of them at work, with the folder "in" indexed.
+class Stack : public Daemons {
+ public:
+  // `prepare` makes what else is to be there before the first daemon starts.
+  explicit Stack(
+      const PrivateRoot& root, std::map<std::string, std::string> arguments = {},
+      const std::function<void()>& prepare = [] {})
+      : Daemons(root, WithCycle(std::move(arguments))) {
+    prepare();
+    for (const char* const name : {"kavoelasticd", "kavocontentextractd", "fileindexd"}) {
+      Start(name);
+    }
+    Start("evnotifyd");
+    EXPECT_EQ(Tool("folder add '" + In() + "'"), 0) << Logs();
+  }
+
+  // Waits until all that happened before the call is in the index: until a file that is made now is
+  // found, then one that is made after that, as the watcher holds a rename back for some
+  // milliseconds to see where it goes, and there is nothing left to do.
+  testing::AssertionResult AwaitQuiet() {
+    for (int i = 0; i < 2; ++i) {
+      const std::string token = "marker" + std::to_string(++markers_);
+      WriteText(In() + "/marker.txt", token);
+      if (!Await([&] { return IsFound(token); })) {
+        return testing::AssertionFailure() << token << " is not found\n" << Logs();
+      }
+    }
+    if (!Await([this] { return IsIdle(); })) {
+      return testing::AssertionFailure() << "no end: " << vexlo::JsonToString(Indexing()) << Logs();
+    }
+    return testing::AssertionSuccess();
+  }
+  bool IsIdle() const {
+    std::error_code error;
+    return Indexing()["state"] == "idle" && std::filesystem::is_empty(QueueFolder(), error);
+  }
+  bool IsFound(const std::string& token) const {
+    Json::Value request;
+    request["command"] = "search";
+    request["data"]["words"] = token;
+    Json::Value reply;
+    try {
+      vexlo::SendRequestImpl(reply, request);
+    } catch (const std::exception&) {
+      return false;
+    }
+    return !reply["data"].empty();
+  }
+
+ private:
+  static std::map<std::string, std::string> WithCycle(
+      std::map<std::string, std::string> arguments) {
+    arguments.try_emplace("fileindexd", "--cycle 50");
+    return arguments;
+  }
+
   int markers_ = 0;
 };
 

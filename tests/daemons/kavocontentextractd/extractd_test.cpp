@@ -5,10 +5,13 @@
 #include <sys/stat.h>
 #include <sys/syscall.h>
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <filesystem>
+#include <iterator>
 #include <optional>
+#include <sstream>
 #include <thread>
 
 #include "common/json.h"
@@ -120,13 +123,9 @@ class ExtractdTest : public testing::Test {
 
 // Takes a while to read, and says nothing.
 std::string SlowDocument() {
-  std::string content;
-  constexpr int kElements = 12000000;
-  content.reserve(kElements * size_t{4});
-  for (int i = 0; i < kElements; ++i) {
-    content += "<x/>";
-  }
-  return Docx(content + "<w:t>end</w:t>");
+  std::ostringstream content;
+  std::fill_n(std::ostream_iterator<const char*>(content), 12000000, "<x/>");
+  return Docx(content.str() + "<w:t>end</w:t>");
 }
 
 TEST_F(ExtractdTest, AddsTheContentToTheAttributes) {
@@ -192,19 +191,13 @@ TEST_F(ExtractdTest, SurvivesWhatIsDamaged) {
 TEST_F(ExtractdTest, StopsAtLimits) {
   Start("--deadline 60 ");
   const std::string mib(1 << 20, 'm');
-  const Json::Value cut = Parse(Write("a.docx", Docx("<w:t>" + mib + mib + "</w:t>")));
-  EXPECT_TRUE(cut["KAVOMDTextContent"] == mib);
-  EXPECT_TRUE(cut["KAVOMDTextTruncated"].asBool());
-  EXPECT_FALSE(cut.isMember("KAVOMDContentError"));
+  const Json::Value cut = Parse(Write("a.docx", Docx("<w:t>" + mib + "m</w:t>")));
+  EXPECT_TRUE(cut["KAVOMDTextContent"] == mib && cut["KAVOMDTextTruncated"].asBool());
 
-  std::string bomb;
-  bomb.reserve(size_t{130} << 20);
-  while (bomb.size() < size_t{129} << 20) {
-    bomb.append("<w:p></w:p>");
-  }
-  const Json::Value fields = Parse(Write("b.docx", Docx("<w:t>begin</w:t>" + bomb)));
-  EXPECT_EQ(fields["KAVOMDContentError"], "oversized: it unpacks to over 128 MiB");
-  EXPECT_EQ(fields["KAVOMDTextContent"], "begin\n");
+  const Json::Value bomb =
+      Parse(Write("b.docx", Docx("<w:t>begin</w:t><w:p/>" + std::string(size_t{129} << 20, ' '))));
+  EXPECT_EQ(bomb["KAVOMDContentError"], "oversized: it unpacks to over 128 MiB");
+  EXPECT_EQ(bomb["KAVOMDTextContent"], "begin\n");
   EXPECT_EQ(Stats()["deaths"], 0);
 }
 

@@ -2,7 +2,6 @@
 #ifndef DAEMONS_KAVOCONTENTEXTRACTD_SAMPLES_H_
 #define DAEMONS_KAVOCONTENTEXTRACTD_SAMPLES_H_
 
-#include <cstdio>
 #include <string>
 #include <vector>
 
@@ -30,34 +29,8 @@ inline std::string Odt(const std::string& body, const std::string& manifest = "<
                "<o:document-statistic o:page-count='3' o:word-count='99'/></o:m>"}});
 }
 
-inline std::string Pdf() {
-  const std::string text = "BT /F1 24 Tf 20 100 Td (The harbour plan) Tj ET";
-  const std::string page =
-      "<</Type/Page/Parent 2 0 R/MediaBox[0 0 300 200]/Contents 4 0 R"
-      "/Resources<</Font<</F1 5 0 R>>>>>>";
-  const std::string stream =
-      "<</Length " + std::to_string(text.size()) + ">>\nstream\n" + text + "\nendstream";
-  const std::string objects[] = {"<</Type/Catalog/Pages 2 0 R>>",
-                                 "<</Type/Pages/Kids[3 0 R]/Count 1>>",
-                                 page,
-                                 stream,
-                                 "<</Type/Font/Subtype/Type1/BaseFont/Helvetica>>",
-                                 "<</Title(Plan)/Author(Ana)/CreationDate(D:20240531120000Z)>>"};
-  std::string pdf = "%PDF-1.4\n";
-  std::string table = "xref\n0 7\n0000000000 65535 f \n";
-  int number = 0;
-  for (const std::string& object : objects) {
-    char line[32];
-    snprintf(line, sizeof(line), "%010zu 00000 n \n", pdf.size());
-    table += line;
-    pdf.append(std::to_string(++number)).append(" 0 obj\n").append(object).append("\nendobj\n");
-  }
-  const size_t start = pdf.size();
-  return pdf + table + "trailer\n<</Size 7/Root 1 0 R/Info 6 0 R>>\nstartxref\n" +
-         std::to_string(start) + "\n%%EOF\n";
-}
-
 inline std::string Data(const std::string& name) { return ReadText(TEST_DATA "/" + name); }
+inline std::string Pdf() { return Data("../fuzz/seeds/pdf/plan.pdf"); }
 
 struct Sample {
   std::string name;  // Its extension tells little: types are found in the content.

@@ -283,18 +283,5 @@ TEST_F(FrameServerTest, ReplacesOnlyASocketThatNobodyServes) {
   EXPECT_EQ(folder_.Names(), (std::set<std::string>{"file", "full"}));
 }
 
-TEST_F(FrameServerTest, ServesManyTinyRequests) {
-  Start();
-  std::vector<std::future<void>> clients(16);
-  for (std::future<void>& client : clients) {
-    client = std::async(std::launch::async, [this, &client] {
-      const std::string name = std::to_string(reinterpret_cast<uintptr_t>(&client)) + ":";
-      for (int i = 0; i < 1000; ++i) {
-        EXPECT_EQ(Ask(name + std::to_string(i)), name + std::to_string(i));
-      }
-    });
-  }
-}
-
 }  // namespace
 }  // namespace vexlo::daemon

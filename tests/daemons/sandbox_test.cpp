@@ -141,6 +141,7 @@ TEST(Sandbox, WritesOnlyWhatItMay) {
       {"reads", [&] { return Opens(folder / "share/file"); }, 0},
       {"a file that is named", [] { return Opens("/dev/null", O_RDWR); }, 0},
       {"writes", [&] { return Opens(folder / "share/file", O_WRONLY); }, EACCES},
+      {"truncates", [&] { return truncate((folder / "share/file").c_str(), 0) == 0; }, EACCES},
       {"makes", [&] { return Opens(folder / "share/new", O_RDWR | O_CREAT); }, EACCES},
       {"removes", [&] { return unlink((folder / "share/file").c_str()) == 0; }, EACCES},
       {"moves away", [&] { return renames("share/file", "state/taken"); }, EACCES},

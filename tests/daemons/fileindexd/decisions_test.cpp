@@ -29,6 +29,7 @@ TEST(Decisions, WhatACodeDoesToAnOperationAndToACycle) {
       {914, Consequence::kGoOn, Consequence::kRetry},
       {31337, Consequence::kGoOn, Consequence::kRetry},
       {913, Consequence::kRetry, Consequence::kRetry},
+      {2009, Consequence::kRetry, Consequence::kRetry},
       {2011, Consequence::kRetry, Consequence::kRetry},
       {1003, Consequence::kNoSpace, Consequence::kNoSpace},
       {800, Consequence::kUnavailable, Consequence::kUnavailable},

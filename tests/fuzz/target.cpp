@@ -69,7 +69,8 @@ void WriteFile(const std::string& path, std::string_view content) {
 
 // By the C library, as the daemons have another judge.
 bool IsUtf8(std::string_view text) {
-  const iconv_t converter = iconv_open("UTF-32LE", "UTF-8");
+  static const iconv_t converter = iconv_open("UTF-32LE", "UTF-8");
+  iconv(converter, nullptr, nullptr, nullptr, nullptr);  // Forgets the text before.
   std::string bytes(text);
   char* from = bytes.data();
   size_t left = bytes.size();
@@ -80,7 +81,6 @@ bool IsUtf8(std::string_view text) {
     size_t room = sizeof(buffer);
     done = iconv(converter, &from, &left, &to, &room);
   } while (done == static_cast<size_t>(-1) && errno == E2BIG);
-  iconv_close(converter);
   return done != static_cast<size_t>(-1);
 }
 

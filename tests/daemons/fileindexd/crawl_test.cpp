@@ -14,18 +14,14 @@
 #include "support/faults.h"
 #include "support/temp_folder.h"
 
-namespace {
-
-namespace fs = std::filesystem;
-using vexlo::fileindexd::DiskEntry;
-using vexlo::fileindexd::DiskWalk;
-using vexlo::fileindexd::GoneList;
-using vexlo::fileindexd::IndexedPath;
-using vexlo::fileindexd::WalkRules;
-
 FAULTABLE(ssize_t, getdents64, (int fd, void* buffer, size_t size), (fd, buffer, size))
 FAULTABLE(int, fstatat, (int fd, const char* path, struct stat* info, int flags),
           (fd, path, info, flags))
+
+namespace vexlo::fileindexd {
+namespace {
+
+namespace fs = std::filesystem;
 
 WalkRules Everything() {
   const auto yes = [](const std::string&) { return true; };
@@ -94,6 +90,7 @@ TEST(DiskWalk, LeavesOutWhatTheRulesRefuse) {
        {"in/deep/x", "in/@eaDir/x", "in/refused/x", "out/x", "way/in/x", "elsewhere"}) {
     fs::create_directories(folder / path);
   }
+  WriteText(folder / "in/Thumbs.db", "");
   fs::create_directory_symlink(folder / "elsewhere", folder / "in/link");
   const WalkRules rules = {
       [&](const std::string& path) {
@@ -121,7 +118,7 @@ TEST(DiskWalk, WhatIsNoFolderOrMissingIsNoFailure) {
 
 // What the two give of one tree must add up to the same, or a comparison of the two never ends.
 TEST(DiskScan, AddsUpWhatTheWalkGives) {
-  const vexlo::fileindexd::ContentByType by_type = {true, false, true, false, true};
+  const ContentByType by_type = {true, false, true, false, true};
   for (unsigned seed = 0; seed < 60; ++seed) {
     SCOPED_TRACE(seed);
     std::mt19937 random(seed);
@@ -137,14 +134,14 @@ TEST(DiskScan, AddsUpWhatTheWalkGives) {
     const WalkRules rules = {covers, [](const std::string&) { return true; },
                              [&](const std::string& path) { return path != refused; }};
     const auto wants = [&](const std::string& path) {
-      return by_type.at(static_cast<size_t>(vexlo::fileindex::GetFileTypeByFullPath(path)));
+      return by_type.at(static_cast<size_t>(fileindex::GetFileTypeByFullPath(path)));
     };
-    std::map<std::string, vexlo::daemon::FolderDigest> want;
+    std::map<std::string, daemon::FolderDigest> want;
     DiskWalk walk(folder.Path(), "", rules);
     while (const auto entry = walk.Next()) {
       const std::string key = entry->path.substr(0, entry->path.rfind('/') + 1);
       if (entry->path != folder.Path()) {
-        want[key].Add(vexlo::daemon::EntryHash(
+        want[key].Add(daemon::EntryHash(
             seed, entry->path.substr(key.size()),
             {entry->info.st_size,
              entry->info.st_mtim.tv_sec * 1'000'000'000 + entry->info.st_mtim.tv_nsec,
@@ -153,8 +150,8 @@ TEST(DiskScan, AddsUpWhatTheWalkGives) {
       }
     }
     const auto in = [&](const std::string&) { return std::optional(by_type); };
-    vexlo::fileindexd::DiskScan scan(folder.Path(), rules, {wants, in}, seed, [] {});
-    std::map<std::string, vexlo::daemon::FolderDigest> got;
+    DiskScan scan(folder.Path(), rules, {wants, in}, seed, [] {});
+    std::map<std::string, daemon::FolderDigest> got;
     std::string last;
     while (const auto each = scan.Next()) {
       EXPECT_GT(each->path, last);
@@ -184,10 +181,8 @@ TEST(DiskScan, TellsWhatCouldNotBeLookedAt) {
   for (const auto& c : cases) {
     const ScopedFault fault(c.function, EIO, c.nth);
     const auto wants = [](const std::string&) { return true; };
-    const auto in = [](const std::string&) {
-      return std::optional(vexlo::fileindexd::ContentByType{});
-    };
-    vexlo::fileindexd::DiskScan scan(folder.Path(), Everything(), {wants, in}, 0, [] {});
+    const auto in = [](const std::string&) { return std::optional(ContentByType{}); };
+    DiskScan scan(folder.Path(), Everything(), {wants, in}, 0, [] {});
     std::string got;
     while (const auto each = scan.Next()) {
       got += (got.empty() ? "" : " ") + each->path.substr(folder.Path().size()) +
@@ -220,7 +215,7 @@ TEST(Crawl, MergesAsTwoSetsDo) {
     std::vector<std::string> got;
     auto on_disk = disk.begin();
     auto indexed = index.begin();
-    vexlo::fileindexd::MergeByPath(
+    MergeByPath(
         [&] {
           return on_disk == disk.end() ? std::nullopt : std::optional(DiskEntry{*on_disk++, {}});
         },
@@ -257,16 +252,15 @@ TEST(Crawl, NothingIsTakenForGoneThatCouldNotBeLookedAt) {
     DiskWalk walk(folder.Path(), "", Everything());
     const ScopedFault fault(c.function, EIO, c.nth);
     auto it = all.begin();
-    vexlo::fileindexd::MergeByPath(
-        [&] { return walk.Next(); },
-        [&] {
-          return it == all.end() ? std::nullopt : std::optional(IndexedPath{*it++, {}});
-        },
-        [](const DiskEntry&, const IndexedPath*) {},
-        [&](const IndexedPath& indexed) {
-          (walk.IsUnknown(indexed.path) ? unknown : gone)
-              .insert(indexed.path.substr(folder.Path().size()));
-        });
+    MergeByPath([&] { return walk.Next(); },
+                [&] {
+                  return it == all.end() ? std::nullopt : std::optional(IndexedPath{*it++, {}});
+                },
+                [](const DiskEntry&, const IndexedPath*) {},
+                [&](const IndexedPath& indexed) {
+                  (walk.IsUnknown(indexed.path) ? unknown : gone)
+                      .insert(indexed.path.substr(folder.Path().size()));
+                });
     EXPECT_EQ(unknown, c.unknown) << c.function << c.nth;
     EXPECT_EQ(gone, std::set<std::string>()) << c.function << c.nth;
     EXPECT_EQ(walk.LastError(), EIO);
@@ -288,3 +282,4 @@ TEST(Crawl, WhatGoesWithAFolderIsNotedOnce) {
 }
 
 }  // namespace
+}  // namespace vexlo::fileindexd

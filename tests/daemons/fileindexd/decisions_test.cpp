@@ -11,14 +11,8 @@
 #include "daemons/fileindexd/share_state.h"
 #include "daemons/fileindexd/stamp.h"
 
+namespace vexlo::fileindexd {
 namespace {
-
-using vexlo::fileindexd::Consequence;
-using vexlo::fileindexd::MissedPaths;
-using vexlo::fileindexd::RenameFacts;
-using vexlo::fileindexd::RenameStep;
-using vexlo::fileindexd::Stamp;
-using vexlo::fileindexd::StampOf;
 
 TEST(Decisions, WhatACodeDoesToAnOperationAndToACycle) {
   const struct {
@@ -36,8 +30,8 @@ TEST(Decisions, WhatACodeDoesToAnOperationAndToACycle) {
       {2005, Consequence::kRebuild, Consequence::kRebuild},
   };
   for (const auto& c : cases) {
-    EXPECT_EQ(vexlo::fileindexd::OfOperation(c.code), c.operation) << c.code;
-    EXPECT_EQ(vexlo::fileindexd::OfCycle(c.code), c.cycle) << c.code;
+    EXPECT_EQ(OfOperation(c.code), c.operation) << c.code;
+    EXPECT_EQ(OfCycle(c.code), c.cycle) << c.code;
   }
 }
 
@@ -60,7 +54,7 @@ TEST(Decisions, OnlyTheDocumentsOfWhatHasMovedMove) {
       {"NotWanted", {false, true, 7, kNone, 7}, RenameStep::kForget},
   };
   for (const auto& c : cases) {
-    EXPECT_EQ(vexlo::fileindexd::PlanRename(c.facts), c.want) << c.name;
+    EXPECT_EQ(PlanRename(c.facts), c.want) << c.name;
   }
 }
 
@@ -91,8 +85,7 @@ TEST(Decisions, AStampTellsWhetherAFileHasChanged) {
     const Stamp indexed = StampOf(file, c.content, {now / kSecond, now % kSecond});
     struct stat changed = file;
     c.change(changed);
-    EXPECT_EQ(IsCurrent(vexlo::fileindexd::StampFrom(ToJson(indexed)),
-                        StampOf(changed, /*content=*/true, {})),
+    EXPECT_EQ(IsCurrent(StampFrom(ToJson(indexed)), StampOf(changed, /*content=*/true, {})),
               c.is_current)
         << c.name;
   }
@@ -107,8 +100,8 @@ TEST(Decisions, WhatIsNoStampIsNone) {
        {"null", R"({"size":1,"mtime":2,"ctime":3})", R"({"size":1,"mtime":2,"ctime":3,"inode":-1})",
         R"({"size":"1","mtime":2,"ctime":3,"inode":4})"}) {
     Json::Value value;
-    ASSERT_TRUE(vexlo::JsonFromString(value, text)) << text;
-    EXPECT_FALSE(vexlo::fileindexd::StampFrom(value)) << text;
+    ASSERT_TRUE(JsonFromString(value, text)) << text;
+    EXPECT_FALSE(StampFrom(value)) << text;
   }
 }
 
@@ -133,3 +126,4 @@ TEST(MissedPaths, AreKnownBelowWhatIsRenamedUntilTheyAreTooMany) {
 }
 
 }  // namespace
+}  // namespace vexlo::fileindexd

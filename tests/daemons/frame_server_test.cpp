@@ -108,12 +108,16 @@ TEST_F(FrameServerTest, AsksWhoAsks) {
   EXPECT_EQ(HearAs(kStranger, ask), refused);
   EXPECT_EQ(HearAs(kStranger, [this] { return Ask(std::string(100000, 'x')); }), refused)
       << "little is read of what will be refused";
-  EXPECT_EQ(HearAs(kGuest,
-                   [this] {
-                     const RawClient held[] = {Sending(""), Sending(""), Sending("")};
-                     return Ask("who");
-                   }),
-            "<failed>");
+  const auto ask_beside = [this](size_t others) {
+    std::vector<RawClient> held;
+    held.reserve(others);
+    while (held.size() < others) {
+      held.emplace_back(path_);
+    }
+    return Ask("who");
+  };
+  EXPECT_EQ(HearAs(kGuest, [&] { return ask_beside(2); }), "who 4711 4711+4712+4713");
+  EXPECT_EQ(HearAs(kGuest, [&] { return ask_beside(3); }), "<failed>");
   EXPECT_TRUE(Ask("who").starts_with("who 0 0")) << "one user does not shut out another";
 }
 

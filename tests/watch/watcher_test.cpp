@@ -131,6 +131,7 @@ TEST_F(WatcherTest, NamesAreBytesAndPathsHaveAnyLength) {
 TEST_F(WatcherTest, FoldersBeyondTheLimitAreLookedAt) {
   Do("mkdir a b c d");
   Start({in_}, {.max_watches = 3});
+  EXPECT_FALSE(watcher_->State().live);
   EXPECT_TRUE(watcher_->State().text.starts_with("2 folders of 5 not watched, but looked at "));
   // Whichever the two are: each change is told, at once or by the next look.
   for (const std::string deed : {"> $d/f", "echo > $d/f", "chmod 600 $d/f", "rm $d/f"}) {
@@ -174,7 +175,9 @@ TEST_F(WatcherTest, HintsShortenTheWaitForThem) {
 
 TEST_F(WatcherTest, RootThatGoesAndComesBack) {
   const std::pair<const char*, const char*> cases[] = {
-      {"rm -r r", "mkdir -p r/d"}, {"mv ../in ../out", "rm -r ../in; mv ../out/in .."}};
+      {"rm -r r", "mkdir -p r/d"},
+      {"mv r ../out", "mv ../out/r ."},
+      {"mv ../in ../out", "rm -r ../in; mv ../out/in .."}};
   for (const auto& [goes, comes] : cases) {
     SCOPED_TRACE(goes);
     Clear();
@@ -184,11 +187,14 @@ TEST_F(WatcherTest, RootThatGoesAndComesBack) {
     const std::string text = ", " + Text(Take()) + ", " + Text(Take(kRescan)) + ",";
     EXPECT_NE(text.find(", delete r/,"), std::string::npos) << text;
     EXPECT_EQ(text.find(", delete r/,"), text.rfind(", delete r/,")) << text;
+    EXPECT_FALSE(watcher_->State().live);
     EXPECT_EQ(watcher_->State().text, in_ + "/r is gone");
     Do(comes);
     Take();
     EXPECT_EQ(Text(Take(kRescan)), "create r/");
     EXPECT_TRUE(watcher_->State().live);
+    Do("mkdir r/d/n");
+    EXPECT_EQ(Text(Take()), "create r/d/n/");
   }
   // Another folder in its place is a new one.
   Do("mv r ../out; mkdir -p r/e");
@@ -207,11 +213,13 @@ TEST_F(WatcherTest, RootsComeAndGoWithoutAGapForTheOthers) {
   }
   EXPECT_FALSE(watcher_->AddRoot(in_ + "/b/c", now_)) << "is one already";
   EXPECT_FALSE(watcher_->AddRoot(in_, now_)) << "others are below it";
+  EXPECT_ANY_THROW(watcher_->AddRoot(in_ + "/b/../x", now_));
   EXPECT_EQ(watcher_->State().gone, std::vector<std::string>{in_ + "/later"});
   Do("> b/c/f; > b/bin/f; mkdir later");
   watcher_->CheckRoots(now_);
   EXPECT_EQ(Text(Take()), "create later/, create a/d/, create b/c/f, write b/c/f");
   EXPECT_TRUE(watcher_->RemoveRoot(in_ + "/a"));
+  EXPECT_FALSE(watcher_->RemoveRoot(in_ + "/a"));
   EXPECT_FALSE(watcher_->RemoveRoot(in_ + "/b")) << "the one below would go with it";
   EXPECT_TRUE(watcher_->RemoveRoot(in_ + "/b/c"));
   Do("> a/g; > b/g");

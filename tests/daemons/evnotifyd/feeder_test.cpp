@@ -130,6 +130,7 @@ TEST_F(FeederTest, AChangeReindexesWhatItTouches) {
   Do("> a/h; > c/h");
   Poll();
   EXPECT_EQ(Take(), "");
+  EXPECT_TRUE(feeder_->Stats().live);
   EXPECT_EQ(feeder_->NextDeadline(), TimePoint::max());
 }
 
@@ -142,6 +143,8 @@ TEST_F(FeederTest, LinesWaitInOrderUntilTheyCanBeWritten) {
     for (int i = 0; i < 20; ++i) {
       Poll(milliseconds(100));
     }
+    EXPECT_TRUE(fault.Fired());
+    EXPECT_FALSE(feeder_->Stats().live);
     EXPECT_TRUE(feeder_->Stats().reason.ends_with("reason=Input/output error"));
     EXPECT_LE(feeder_->NextDeadline() - now_, seconds(1));
     EXPECT_EQ(log_.Take().size(), 1U) << "one line, not one each try";
@@ -150,6 +153,7 @@ TEST_F(FeederTest, LinesWaitInOrderUntilTheyCanBeWritten) {
   Poll(seconds(1));
   EXPECT_EQ(Take(), "40 a/f, 8 a/f, 80 a/f");
   EXPECT_TRUE(feeder_->Stats().live);
+  EXPECT_EQ(feeder_->Stats().overflows, 0U);
 }
 
 TEST_F(FeederTest, WhatIsTooMuchToWaitIsTold) {
@@ -196,6 +200,7 @@ TEST_F(FeederTest, WithoutInotifyItAsksForReindexesTimeAfterTime) {
     const ScopedFault fault("inotify_init1", EMFILE, 1, /*lasting=*/true);
     Start({{"a", kAll, {}}}, options);
     EXPECT_EQ(Take(), "10000 a");
+    EXPECT_TRUE(feeder_->Stats().reason.find("reindexed every 300 s") != std::string::npos);
     Poll(seconds(299));
     EXPECT_EQ(Take(), "");
     Poll(seconds(1));

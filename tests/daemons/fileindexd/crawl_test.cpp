@@ -204,9 +204,10 @@ TEST(Crawl, MergesAsTwoSetsDo) {
         set->insert("/" + std::to_string(random() % 40));
       }
     }
-    std::vector<std::string> want;
     std::set<std::string> both = disk;
     both.insert(index.begin(), index.end());
+    std::vector<std::string> want;
+    want.reserve(both.size());
     for (const std::string& path : both) {
       want.push_back(path + (!disk.contains(path)   ? " gone"
                              : index.contains(path) ? " " + path

@@ -193,6 +193,7 @@ TEST_F(ExtractdTest, StopsAtLimits) {
   const std::string mib(1 << 20, 'm');
   const Json::Value cut = Parse(Write("a.docx", Docx("<w:t>" + mib + "m</w:t>")));
   EXPECT_TRUE(cut["KAVOMDTextContent"] == mib && cut["KAVOMDTextTruncated"].asBool());
+  EXPECT_FALSE(cut.isMember("KAVOMDContentError"));
 
   const Json::Value bomb =
       Parse(Write("b.docx", Docx("<w:t>begin</w:t><w:p/>" + std::string(size_t{129} << 20, ' '))));

@@ -11,6 +11,7 @@
 #include <filesystem>
 #include <iterator>
 #include <optional>
+#include <random>
 #include <sstream>
 #include <thread>
 
@@ -174,10 +175,9 @@ TEST_F(ExtractdTest, SurvivesWhatIsDamaged) {
       if (i < 4) {
         bytes.resize(bytes.size() * static_cast<size_t>(i + 1) / 5);
       } else {
-        srand(seed);  // NOLINT(cert-msc51-cpp): the same damage each time.
+        std::mt19937 random(seed);
         for (int j = 0; j < 20; ++j) {
-          // NOLINTNEXTLINE(concurrency-mt-unsafe)
-          bytes[static_cast<size_t>(rand()) % bytes.size()] = static_cast<char>(rand());
+          bytes[random() % bytes.size()] = static_cast<char>(random());
         }
       }
       const Json::Value fields = Parse(Write("file", bytes));

@@ -12,6 +12,7 @@
 #include <map>
 #include <random>
 
+#include "common/json.h"
 #include "support/temp_folder.h"
 
 namespace vexlo::watch {
@@ -247,10 +248,19 @@ TEST_F(WatcherTest, WithoutPollingOfRootsThereIsNoDeadlineAtRest) {
   EXPECT_EQ(watcher_->NextDeadline(), TimePoint::max());
 }
 
-TEST(QueueLineTest, IsOneLineOfJson) {
-  EXPECT_EQ(QueueLine({kMaskRename, true, "/b\n", "/a\xE9"}),
-            "{\"event\":256,\"is_dir\":true,\"path\":\"/b\\u000a\",\"path_old\":\"/a\xE9\","
-            "\"data\":null}\n");
+TEST(QueueLineTest, EveryByteOfANameComesBack) {
+  EXPECT_EQ(QueueLine({kMaskRename, true, "/b", "/a"}),
+            R"({"event":256,"is_dir":true,"path":"/b","path_old":"/a","data":null})"
+            "\n");
+  std::string bytes;
+  while (bytes.size() < 255) {
+    bytes += static_cast<char>(bytes.size() + 1);
+  }
+  const std::string line = QueueLine({kMaskCreate, false, bytes + bytes, ""});
+  EXPECT_EQ(line.find('\n'), line.size() - 1);
+  Json::Value value;
+  ASSERT_TRUE(JsonFromString(value, line));
+  EXPECT_EQ(value["path"].asString(), bytes + bytes);
 }
 
 // What a reader of the events knows: it believes them, and looks only where they tell it to.

@@ -9,6 +9,7 @@
 
 #include "daemons/kavocontentextractd/document.h"
 #include "daemons/kavocontentextractd/source.h"
+#include "fuzz/target.h"
 
 namespace fuzz {
 
@@ -26,5 +27,12 @@ using Reader = void (*)(const vexlo::extractd::Source& source, const std::string
 void CheckReader(Reader reader, const char* type, std::string_view bytes);
 
 }  // namespace fuzz
+
+// The whole of a target that gives its input to such a reader.
+#define FUZZ_READER(reader, type)                                           \
+  extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) { \
+    fuzz::CheckReader(reader, type, fuzz::TextOf(data, size));              \
+    return 0;                                                               \
+  }
 
 #endif  // FUZZ_FORMAT_H_

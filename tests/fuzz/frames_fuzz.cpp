@@ -9,6 +9,7 @@
 #include <cerrno>
 #include <chrono>
 #include <cstring>
+#include <optional>
 #include <thread>
 
 #include "daemons/common/frame_server.h"
@@ -27,43 +28,28 @@ std::string Frame(const std::string& body) {
 
 std::string Answer(const std::string& request) { return "<" + request + ">"; }
 
+std::string Socket() { return fuzz::Folder() + "/socket"; }
+
 // Serves until the program ends.
-class Server {
- public:
-  Server() : server_(Options()), thread_([this] { server_.Run(stop_); }) {}
-  ~Server() {
-    eventfd_write(stop_, 1);
-    thread_.join();
-    close(stop_);
-  }
-  Server(const Server&) = delete;
-  Server& operator=(const Server&) = delete;
-
-  static std::string Path() { return fuzz::Folder() + "/socket"; }
-
- private:
-  static vexlo::daemon::FrameServerOptions Options() {
-    vexlo::daemon::FrameServerOptions options;
-    options.socket_path = Path();
-    options.handler = Answer;
-    options.refusal = [](vexlo::daemon::Refusal refusal) {
-      return refusal == vexlo::daemon::Refusal::kTooLong ? kTooLong : "";
-    };
-    options.workers = 1;
-    options.max_request_bytes = kMostBytes;
-    options.max_total_bytes = 2 * kMostBytes;
-    return options;
-  }
-
-  int stop_ = eventfd(0, EFD_CLOEXEC);
-  vexlo::daemon::FrameServer server_;
-  std::thread thread_;
-};
+vexlo::daemon::FrameServer* Serve() {
+  vexlo::daemon::FrameServerOptions options;
+  options.socket_path = Socket();
+  options.handler = Answer;
+  options.refusal = [](vexlo::daemon::Refusal refusal) {
+    return refusal == vexlo::daemon::Refusal::kTooLong ? kTooLong : "";
+  };
+  options.workers = 1;
+  options.max_request_bytes = kMostBytes;
+  options.max_total_bytes = 2 * kMostBytes;
+  auto* const server = new vexlo::daemon::FrameServer(options);
+  std::thread([server] { server->Run(eventfd(0, EFD_CLOEXEC)); }).detach();
+  return server;
+}
 
 // All that a server sends to who sends it the bytes and no more.
 std::string Exchange(std::string_view bytes) {
   const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(5);
-  const int fd = kavo::local::ConnectWithin(Server::Path(), deadline);
+  const int fd = kavo::local::ConnectWithin(Socket(), deadline);
   fuzz::Require(fd >= 0, "the server takes no connection");
   // A refused client may be cut off.
   (void)TEMP_FAILURE_RETRY(send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL));
@@ -78,18 +64,25 @@ std::string Exchange(std::string_view bytes) {
   return received;
 }
 
-void CheckServer(std::string_view bytes) {
-  uint64_t length = 0;
-  std::string want;
+// The body of the frame that the bytes begin with, if there is a whole one within the limit.
+std::optional<std::string> BodyOf(std::string_view bytes) {
+  uint64_t length = UINT64_MAX;
   if (bytes.size() >= sizeof(length)) {
     memcpy(&length, bytes.data(), sizeof(length));
-    const std::string_view body = bytes.substr(sizeof(length));
-    if (length > kMostBytes) {
-      want = Frame(kTooLong);
-    } else if (body.size() >= length) {
-      want = Frame(Answer(std::string(body.substr(0, length))));
-    }
   }
+  if (length > kMostBytes || bytes.size() - sizeof(length) < length) {
+    return std::nullopt;
+  }
+  return std::string(bytes.substr(sizeof(length), length));
+}
+
+void CheckServer(std::string_view bytes) {
+  uint64_t length = 0;
+  memcpy(&length, bytes.data(), bytes.size() < sizeof(length) ? 0 : sizeof(length));
+  const std::optional<std::string> request = BodyOf(bytes);
+  const std::string want = length > kMostBytes ? Frame(kTooLong)
+                           : request           ? Frame(Answer(*request))
+                                               : "";
   fuzz::RequireEqual(Exchange(bytes), want, "the server answers otherwise");
   fuzz::RequireEqual(Exchange(Frame("next")), Frame(Answer("next")),
                      "the next client is not served");
@@ -101,28 +94,21 @@ void CheckClient(std::string_view bytes) {
   const bool is_sent = TEMP_FAILURE_RETRY(send(sockets[0], bytes.data(), bytes.size(),
                                                MSG_NOSIGNAL)) == static_cast<ssize_t>(bytes.size());
   close(sockets[0]);
-  uint64_t length = UINT64_MAX;
-  if (bytes.size() >= sizeof(length)) {
-    memcpy(&length, bytes.data(), sizeof(length));
-  }
   std::string body;
   int file = -1;
   const bool is_received =
       kavo::local::ReceiveFrame(sockets[1], kMostBytes, body, &file,
                                 std::chrono::steady_clock::now() + std::chrono::seconds(5));
   close(sockets[1]);
-  const bool is_whole = length <= kMostBytes && bytes.size() - sizeof(length) >= length;
-  fuzz::Require(is_sent && is_received == is_whole, "a message is whole, and is not");
-  if (is_received) {
-    fuzz::RequireEqual(body, std::string(bytes.substr(sizeof(length), length)),
-                       "a message is another one");
-  }
+  fuzz::Require(is_sent && (is_received ? std::optional(body) : std::nullopt) == BodyOf(bytes),
+                "a message is another one");
 }
 
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  static const Server server;
+  static const vexlo::daemon::FrameServer* const server = Serve();
+  fuzz::Require(server != nullptr, "nobody serves");
   const std::string_view bytes = fuzz::TextOf(data, size).substr(0, size_t{64} << 10);
   CheckServer(bytes);
   CheckClient(bytes);

@@ -1,9 +1,5 @@
 // The reader of photos.
 #include "daemons/kavocontentextractd/formats.h"
 #include "fuzz/format.h"
-#include "fuzz/target.h"
 
-extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  fuzz::CheckReader(vexlo::extractd::ReadPhoto, "image/jpeg", fuzz::TextOf(data, size));
-  return 0;
-}
+FUZZ_READER(vexlo::extractd::ReadPhoto, "image/jpeg")

@@ -1,16 +1,17 @@
 #include "fuzz/target.h"
 
+#include <iconv.h>
 #include <sys/stat.h>
 #include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <cerrno>
 #include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
 
 namespace fuzz {
 namespace {
@@ -66,36 +67,21 @@ void WriteFile(const std::string& path, std::string_view content) {
   Require(file.good(), "a file of the target's own cannot be written");
 }
 
-// As RFC 3629 has it: the leading byte alone says how many follow it, and where the second of them
-// begins and ends, so that there are no longer forms than need be, no halves of pairs, nothing over
-// U+10FFFF.
+// By the C library, as the daemons have another judge.
 bool IsUtf8(std::string_view text) {
-  struct Row {
-    unsigned first, last;  // Leading bytes.
-    unsigned from, to;     // Of the second byte.
-    size_t length;
-  };
-  constexpr Row kRows[] = {
-      {0x00, 0x7F, 0, 0, 1},       {0xC2, 0xDF, 0x80, 0xBF, 2}, {0xE0, 0xE0, 0xA0, 0xBF, 3},
-      {0xE1, 0xEC, 0x80, 0xBF, 3}, {0xED, 0xED, 0x80, 0x9F, 3}, {0xEE, 0xEF, 0x80, 0xBF, 3},
-      {0xF0, 0xF0, 0x90, 0xBF, 4}, {0xF1, 0xF3, 0x80, 0xBF, 4}, {0xF4, 0xF4, 0x80, 0x8F, 4}};
-  const auto byte_at = [text](size_t at) { return unsigned{static_cast<unsigned char>(text[at])}; };
-  for (size_t i = 0; i < text.size();) {
-    const auto* const row = std::find_if(std::begin(kRows), std::end(kRows), [&](const Row& r) {
-      return byte_at(i) >= r.first && byte_at(i) <= r.last;
-    });
-    if (row == std::end(kRows) || row->length > text.size() - i ||
-        (row->length > 1 && (byte_at(i + 1) < row->from || byte_at(i + 1) > row->to))) {
-      return false;
-    }
-    for (size_t j = 2; j < row->length; ++j) {
-      if ((byte_at(i + j) & 0xC0) != 0x80) {
-        return false;
-      }
-    }
-    i += row->length;
-  }
-  return true;
+  static const iconv_t converter = iconv_open("UTF-32LE", "UTF-8");
+  iconv(converter, nullptr, nullptr, nullptr, nullptr);  // Forgets the text before.
+  std::string bytes(text);
+  char* from = bytes.data();
+  size_t left = bytes.size();
+  size_t done = 0;
+  do {
+    char buffer[4096];
+    char* to = buffer;
+    size_t room = sizeof(buffer);
+    done = iconv(converter, &from, &left, &to, &room);
+  } while (done == static_cast<size_t>(-1) && errno == E2BIG);
+  return done != static_cast<size_t>(-1);
 }
 
 std::string_view TakeLine(std::string_view& rest) {

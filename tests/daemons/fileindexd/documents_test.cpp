@@ -44,7 +44,6 @@ TEST(Documents, AFolderMovesInPortionsOrPageByPage) {
     std::vector<std::string> requests;
     std::string told;  // Of documents that did not move, then of the whole.
   } cases[] = {
-      {"AtOnce", {kDone}, {kAll}, ""},
       {"InPortions", {kSomeFailed, kDone}, {kAll, kRest}, "/v/a/q 2007 "},
       {"PageByPage", {kUnknown, kPage, kSecondFailed}, {kAll, kList, kMoves}, "/v/a/c/y 2006 "},
       {"Fails", {kSomeFailed, kNoSpace}, {kAll, kRest}, "/v/a/q 2007 2010"},

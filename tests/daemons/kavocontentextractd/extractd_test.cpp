@@ -5,10 +5,13 @@
 #include <sys/stat.h>
 #include <sys/syscall.h>
 
+#include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <filesystem>
+#include <iterator>
 #include <optional>
+#include <random>
 #include <sstream>
 #include <thread>
 
@@ -121,13 +124,9 @@ class ExtractdTest : public testing::Test {
 
 // Takes a while to read, and says nothing.
 std::string SlowDocument() {
-  std::string content;
-  constexpr int kElements = 12000000;
-  content.reserve(kElements * size_t{4});
-  for (int i = 0; i < kElements; ++i) {
-    content += "<x/>";
-  }
-  return Docx(content + "<w:t>end</w:t>");
+  std::ostringstream content;
+  std::fill_n(std::ostream_iterator<const char*>(content), 12000000, "<x/>");
+  return Docx(content.str() + "<w:t>end</w:t>");
 }
 
 TEST_F(ExtractdTest, AddsTheContentToTheAttributes) {
@@ -176,10 +175,9 @@ TEST_F(ExtractdTest, SurvivesWhatIsDamaged) {
       if (i < 4) {
         bytes.resize(bytes.size() * static_cast<size_t>(i + 1) / 5);
       } else {
-        srand(seed);  // NOLINT(cert-msc51-cpp): the same damage each time.
+        std::mt19937 random(seed);
         for (int j = 0; j < 20; ++j) {
-          // NOLINTNEXTLINE(concurrency-mt-unsafe)
-          bytes[static_cast<size_t>(rand()) % bytes.size()] = static_cast<char>(rand());
+          bytes[random() % bytes.size()] = static_cast<char>(random());
         }
       }
       const Json::Value fields = Parse(Write("file", bytes));
@@ -193,19 +191,14 @@ TEST_F(ExtractdTest, SurvivesWhatIsDamaged) {
 TEST_F(ExtractdTest, StopsAtLimits) {
   Start("--deadline 60 ");
   const std::string mib(1 << 20, 'm');
-  const Json::Value cut = Parse(Write("a.docx", Docx("<w:t>" + mib + mib + "</w:t>")));
-  EXPECT_TRUE(cut["KAVOMDTextContent"] == mib);
-  EXPECT_TRUE(cut["KAVOMDTextTruncated"].asBool());
+  const Json::Value cut = Parse(Write("a.docx", Docx("<w:t>" + mib + "m</w:t>")));
+  EXPECT_TRUE(cut["KAVOMDTextContent"] == mib && cut["KAVOMDTextTruncated"].asBool());
   EXPECT_FALSE(cut.isMember("KAVOMDContentError"));
 
-  std::string bomb;
-  bomb.reserve(size_t{130} << 20);
-  while (bomb.size() < size_t{129} << 20) {
-    bomb.append("<w:p></w:p>");
-  }
-  const Json::Value fields = Parse(Write("b.docx", Docx("<w:t>begin</w:t>" + bomb)));
-  EXPECT_EQ(fields["KAVOMDContentError"], "oversized: it unpacks to over 128 MiB");
-  EXPECT_EQ(fields["KAVOMDTextContent"], "begin\n");
+  const Json::Value bomb =
+      Parse(Write("b.docx", Docx("<w:t>begin</w:t><w:p/>" + std::string(size_t{129} << 20, ' '))));
+  EXPECT_EQ(bomb["KAVOMDContentError"], "oversized: it unpacks to over 128 MiB");
+  EXPECT_EQ(bomb["KAVOMDTextContent"], "begin\n");
   EXPECT_EQ(Stats()["deaths"], 0);
 }
 
@@ -222,14 +215,11 @@ TEST_F(ExtractdTest, RefusesWhatIsNoRequest) {
     std::string reply;
   } rows[] = {
       {"NoJson", "{", "file", O_RDONLY, "the request is no JSON object"},
-      {"NoCommand", "{}", "file", O_RDONLY, "none of the known commands"},
       {"MistypedCommand", R"({"command":[1]})", "file", O_RDONLY, "none of the known commands"},
       {"MistypedPath", R"({"command":"extract","path":[1]})", "file", O_RDONLY, "text/plain"},
-      {"NoFile", extract, "missing", O_RDONLY, "no file that can be read"},
       {"ForWriting", extract, "file", O_WRONLY, "no file that can be read"},
       {"OnlyAPath", extract, "file", O_PATH, "no file that can be read"},
       {"Fifo", extract, "fifo", O_RDONLY | O_NONBLOCK, "no regular file"},
-      {"Folder", extract, ".", O_RDONLY, "no regular file"},
       {"TooLong", std::string(300 << 10, ' '), "file", O_RDONLY, "the request is too long"},
   };
   const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(60);
@@ -248,19 +238,14 @@ TEST_F(ExtractdTest, GivesWorkersNothingTheyDoNotNeed) {
   Start("--workers 1 ");
   Parse(Write("a.pdf", Pdf()));
   ASSERT_EQ(Workers().size(), 1);
-  const pid_t worker = Workers()[0];
-  const std::string proc = "/proc/" + std::to_string(worker);
-  std::istringstream limits(ReadText(proc + "/limits"));
-  std::string found;
-  for (std::string line; std::getline(limits, line);) {
-    std::erase(line, ' ');
-    found += line + ";";
-  }
+  const std::string proc = "/proc/" + std::to_string(Workers()[0]);
+  std::string limits = ReadText(proc + "/limits");
+  std::erase(limits, ' ');
   const std::string memory = kLimitsMemory ? "536870912536870912" : "unlimitedunlimited";
-  const std::string limits_wanted[] = {"Maxaddressspace" + memory + "bytes", "Maxfilesize00bytes",
-                                       "Maxcorefilesize00bytes"};
-  for (const std::string& limit : limits_wanted) {
-    EXPECT_NE(found.find(limit), std::string::npos) << limit << " is not in " << found;
+  for (const std::string& limit :
+       {"Maxaddressspace" + memory + "bytes", std::string("Maxfilesize00"),
+        std::string("Maxcorefilesize00")}) {
+    EXPECT_NE(limits.find("\n" + limit), std::string::npos) << limit << " is not in " << limits;
   }
   const std::string status = ReadText(proc + "/status");
   EXPECT_NE(status.find("NoNewPrivs:\t1"), std::string::npos);

@@ -144,10 +144,6 @@ TEST(Engine, SettingRemovesNullsAndTakesLists) {
   Check(engine, {{"NewNote", R"({"term":{"Note":"two"}})", "/v/b"},
                  {"OldNote", R"({"term":{"Note":"one"}})", ""},
                  {"Removed", R"({"term":{"Old":"gone"}})", ""}});
-  EXPECT_EQ(engine.Do("document_set_by_id", R"({"doc_id":"/v/b","data":{"KAVOMDPath":"/w/c"}})"),
-            "ok");
-  Check(engine, {{"Ancestor", R"({"term":{"KAVOMDSearchAncestor":"/v"}})", "/w/c"},
-                 {"Name", R"({"term":{"KAVOMDFSName":"b"}})", "/w/c"}});
 }
 
 TEST(Engine, PathsAreBytes) {

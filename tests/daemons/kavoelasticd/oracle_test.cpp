@@ -150,9 +150,9 @@ class Oracle {
   }
 
   std::string Path() {
-    const std::string folders[] = {"/a", "/b", "/a/b", "/c", "/a!"};
+    const std::string folders[] = {"/a", "/b", "/a/b", "/c", "/a!", "/a0"};
     const std::string names[] = {"/a", "/b", "/c", "/\xff"};
-    return folders[random_() % 5] + names[random_() % 4];
+    return folders[random_() % 6] + names[random_() % 4];
   }
 
   // A text of random words, short or long.

@@ -1,3 +1,4 @@
+// What the engine says and keeps when its files are damaged, or the disk and the database refuse.
 #include <gtest/gtest.h>
 #include <unistd.h>
 
@@ -7,13 +8,14 @@
 
 #include "daemons/kavoelasticd/engine_fixture.h"
 #include "support/faults.h"
+#include "support/private_mounts.h"
 #include "support/syslog_capture.h"
 
 namespace {
 
 FAULTABLE(int, fsync, (int fd), (fd))
 
-TEST(Crash, ADamagedIndexIsSetAsideUntilItIsMadeAnew) {
+TEST(EngineFailure, ADamagedIndexIsSetAsideUntilItIsMadeAnew) {
   struct Case {
     const char* name;
     std::function<void(const std::string&)> damage;
@@ -64,7 +66,7 @@ TEST(Crash, ADamagedIndexIsSetAsideUntilItIsMadeAnew) {
   }
 }
 
-TEST(Crash, ADamagedRegistryIsSetAside) {
+TEST(EngineFailure, ADamagedRegistryIsSetAside) {
   EngineFixture engine;
   const SyslogCapture log;
   for (const std::string text : {"", "{\"indexes\":", "[]", "{\"indexes\":{\"i\":{\"path\":1}}}"}) {
@@ -76,7 +78,7 @@ TEST(Crash, ADamagedRegistryIsSetAside) {
   EXPECT_EQ(ReadText(engine.Folder() / "registry.json.damaged-3"), "[]");
 }
 
-TEST(Crash, WhatTheDatabaseRefusesIsToldAtTheCommit) {
+TEST(EngineFailure, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   EngineFixture engine;
   SyslogCapture log;
   engine.Add("/v/before");
@@ -113,7 +115,38 @@ TEST(Crash, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/v"}})"), "/v/0 /v/1 /v/3 /v/6 /v/before");
 }
 
-TEST(Crash, ADocumentThatCannotMoveStaysAlone) {
+TEST(EngineFailure, AFullDiskIsToldAndWorkGoesOnWhenThereIsRoom) {
+  EngineFixture engine;
+  const SyslogCapture log;
+  const auto disk = ScopedMount::Tmpfs(engine.Folder() / "disk", "size=4m");
+  SKIP_IF_REFUSED(disk);
+  ASSERT_EQ(engine.Move(disk / "index"), "ok");
+  const auto add = [&engine](int i) {
+    const std::string text = "kept " + std::string(20000, static_cast<char>('a' + i % 26));
+    return engine.Add("/v/" + std::to_string(i), R"({"KAVOMDTextContent":")" + text + "\"}");
+  };
+  EXPECT_EQ(add(0), "ok");
+  EXPECT_EQ(engine.Do("commit"), "ok");
+  // Something else takes the rest of the disk, and more is written than is left.
+  std::ofstream filler(disk / "filler", std::ios::binary);
+  while (filler << std::string(4096, 'x') << std::flush) {
+  }
+  std::string answer = "ok";
+  for (int i = 1; i < 1000 && answer == "ok"; ++i) {
+    answer = i % 10 == 9 ? engine.Do("commit") : add(i);
+  }
+  EXPECT_EQ(answer, "2010");
+  engine.Do("commit");  // May say that work was lost, but once only.
+  filler.close();
+  EXPECT_EQ(unlink((disk / "filler").c_str()), 0);
+  EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/0");
+  EXPECT_EQ(add(2000), "ok");
+  EXPECT_EQ(engine.Do("commit"), "ok");
+  engine.Restart();
+  EXPECT_EQ(engine.Search(R"({"words":"kept","sort":"path"})"), "/v/0 /v/2000");
+}
+
+TEST(EngineFailure, ADocumentThatCannotMoveStaysAlone) {
   EngineFixture engine;
   const SyslogCapture log;
   // What says where it was is written anew.
@@ -140,7 +173,7 @@ TEST(Crash, ADocumentThatCannotMoveStaysAlone) {
   EXPECT_EQ(engine.Search(R"({"words":"kept","sort":"path"})"), "/v/a/bad /w/1 /w/x");
 }
 
-TEST(Crash, AChangeOfTheRegistryThatCannotBeWrittenChangesNothing) {
+TEST(EngineFailure, AChangeOfTheRegistryThatCannotBeWrittenChangesNothing) {
   EngineFixture engine;
   const SyslogCapture log;
   engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");

@@ -1,22 +1,16 @@
 // The notify daemon as a service manager runs it, on real folders.
 #include <gtest/gtest.h>
-#include <sys/stat.h>
 
 #include <chrono>
 #include <fstream>
-#include <functional>
 #include <map>
 #include <optional>
-#include <thread>
-#include <vector>
 
 #include "common/json.h"
 #include "common/lock.h"
 #include "kavo/monitor_queue.h"
 #include "support/private_mounts.h"
-#include "support/private_root.h"
-#include "support/program.h"
-#include "support/raw_client.h"
+#include "support/stack.h"
 
 namespace {
 
@@ -107,20 +101,9 @@ class EvnotifydTest : public testing::Test {
     return static_cast<size_t>(std::count(text.begin(), text.end(), '\n'));
   }
 
-  // Waits until it holds, for as long as a busy machine may take.
-  static bool Await(const std::function<bool()>& holds) {
-    const auto deadline = std::chrono::steady_clock::now() + 20s;
-    while (!holds()) {
-      if (std::chrono::steady_clock::now() > deadline) {
-        return false;
-      }
-      std::this_thread::sleep_for(2ms);
-    }
-    return true;
-  }
   // Waits until the queue, without its first lines, is this.
   void AwaitLines(const std::string& want, const std::string& queue = "q", size_t skip = 0) const {
-    EXPECT_TRUE(Await([&] { return Lines(queue, skip) == want; }))
+    EXPECT_TRUE(Stack::Await([&] { return Lines(queue, skip) == want; }))
         << "the queue holds " << Lines(queue, skip) << "\nand shall hold   " << want;
   }
 
@@ -137,7 +120,7 @@ class EvnotifydTest : public testing::Test {
     return {};
   }
   void AwaitState(const std::string& state, const std::string& reason) const {
-    EXPECT_TRUE(Await([&] {
+    EXPECT_TRUE(Stack::Await([&] {
       const Json::Value stats = Stats();
       return stats["state"] == state &&
              stats["reason"].asString().find(reason) != std::string::npos;
@@ -171,7 +154,7 @@ TEST_F(EvnotifydTest, DeedsAndTheirLines) {
   }
   const std::string all = Lines();
   ASSERT_TRUE(MonitorQueue::Delete(Queue(), "app", MONITOR_QUEUE_TYPE_APPLICATION));
-  EXPECT_TRUE(Await([&] { return Stats().isNull(); }));
+  EXPECT_TRUE(Stack::Await([&] { return Stats().isNull(); }));
   Do("share", "> late");
   EXPECT_EQ(Lines(), all) << "nobody wants to know any more";
 }
@@ -196,7 +179,7 @@ TEST_F(EvnotifydTest, ARegistrationThatGrowsLeavesTheRestAlone) {
   AwaitLines("create share/f, write share/f", "q", 3);
   WriteText(file, good);
   Register({{"share", kMask}});
-  EXPECT_TRUE(Await([&] { return Stats()["roots"].size() == 1; }));
+  EXPECT_TRUE(Stack::Await([&] { return Stats()["roots"].size() == 1; }));
   Do("share", "> g; > ../other/g");
   AwaitLines("create share/g, write share/g", "q", 5);
   EXPECT_EQ(Stats()["lines"], 7);
@@ -212,7 +195,7 @@ TEST_F(EvnotifydTest, WhatHappensWhileItDoesNotRunIsMadeUpFor) {
   Do("share", "mkdir d; > d/f");
   std::ofstream(Queue(), std::ios::app) << R"({"event":8,"is_dir":fa)";
   Start();
-  EXPECT_TRUE(Await([&] { return ReadText(Queue()).ends_with("\n"); }));
+  EXPECT_TRUE(Stack::Await([&] { return ReadText(Queue()).ends_with("\n"); }));
   EXPECT_NE(ReadText(Queue()).find("\"is_dir\":fa\n{\"event\":65536,"), std::string::npos);
   Do("share", "> d/g");
   AwaitLines("create share/d/g, write share/d/g", "q", 5);
@@ -260,9 +243,9 @@ TEST_F(EvnotifydTest, WhatIsMountedInAShareIsReadAnew) {
   }
   // Both the folder that is gone and the mounts that are left may tell of it, the latter at any
   // time.
-  EXPECT_TRUE(Await([&] { return Lines("q", count + 3).starts_with("reindex share/d/"); }));
+  EXPECT_TRUE(Stack::Await([&] { return Lines("q", count + 3).starts_with("reindex share/d/"); }));
   Do("share", "> d/e/g");
-  EXPECT_TRUE(Await([&] {
+  EXPECT_TRUE(Stack::Await([&] {
     std::string text = Lines();
     const std::string also = ", reindex share/d/e/";
     for (size_t at = 0; (at = text.find(also, at)) != std::string::npos;) {
@@ -270,27 +253,6 @@ TEST_F(EvnotifydTest, WhatIsMountedInAShareIsReadAnew) {
     }
     return text.ends_with(", create share/d/e/g, write share/d/e/g");
   })) << Lines();
-}
-
-TEST_F(EvnotifydTest, AQueueThatCannotBeWrittenWaitsAlone) {
-  kRoot.MakeFolder("other");
-  Register({{"share", kMask}});
-  Register({{"other", kMask}}, "other");
-  Start();
-  AwaitLines("reindex share/");
-  AwaitLines("reindex other/", "other");
-  {
-    const vexlo::LockFile lock(Queue(), /*exclusive=*/true);
-    Do("share", "> f");
-    AwaitState("degraded", "another process holds its lock");
-    Do("other", "> f");
-    AwaitLines("create other/f, write other/f", "other", 1);
-    EXPECT_EQ(Lines(), "reindex share/");
-    // As the index daemon takes what there is.
-    std::filesystem::rename(Queue(), Queue() + ".tmp");
-  }
-  AwaitLines("create share/f, write share/f");
-  AwaitState("live", "");
 }
 
 TEST_F(EvnotifydTest, ItEndsSoonAndWithEverythingAppended) {

@@ -66,18 +66,6 @@ TEST(EngineFailure, ADamagedIndexIsSetAsideUntilItIsMadeAnew) {
   }
 }
 
-TEST(EngineFailure, ADamagedRegistryIsSetAside) {
-  EngineFixture engine;
-  const SyslogCapture log;
-  for (const std::string text : {"", "{\"indexes\":", "[]", "{\"indexes\":{\"i\":{\"path\":1}}}"}) {
-    WriteText(engine.Folder() / "registry.json", text);
-    engine.Restart();
-    EXPECT_EQ(engine.Do("commit"), "2002") << text;
-    EXPECT_EQ(engine.Create("i", engine.Folder() / "i"), "ok") << text;
-  }
-  EXPECT_EQ(ReadText(engine.Folder() / "registry.json.damaged-3"), "[]");
-}
-
 TEST(EngineFailure, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   EngineFixture engine;
   SyslogCapture log;
@@ -115,35 +103,24 @@ TEST(EngineFailure, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/v"}})"), "/v/0 /v/1 /v/3 /v/6 /v/before");
 }
 
-TEST(EngineFailure, AFullDiskIsToldAndWorkGoesOnWhenThereIsRoom) {
+TEST(EngineFailure, AFullDiskIsToldAndTakesNothingThatIsCommitted) {
   EngineFixture engine;
   const SyslogCapture log;
   const auto disk = ScopedMount::Tmpfs(engine.Folder() / "disk", "size=4m");
   SKIP_IF_REFUSED(disk);
   ASSERT_EQ(engine.Move(disk / "index"), "ok");
-  const auto add = [&engine](int i) {
-    const std::string text = "kept " + std::string(20000, static_cast<char>('a' + i % 26));
-    return engine.Add("/v/" + std::to_string(i), R"({"KAVOMDTextContent":")" + text + "\"}");
-  };
-  EXPECT_EQ(add(0), "ok");
+  engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");
   EXPECT_EQ(engine.Do("commit"), "ok");
-  // Something else takes the rest of the disk, and more is written than is left.
   std::ofstream filler(disk / "filler", std::ios::binary);
   while (filler << std::string(4096, 'x') << std::flush) {
   }
   std::string answer = "ok";
-  for (int i = 1; i < 1000 && answer == "ok"; ++i) {
-    answer = i % 10 == 9 ? engine.Do("commit") : add(i);
+  for (int i = 0; i < 1000 && answer == "ok"; ++i) {
+    answer = i % 10 == 9 ? engine.Do("commit") : engine.Add("/v/" + std::to_string(i));
   }
   EXPECT_EQ(answer, "2010");
   engine.Do("commit");  // May say that work was lost, but once only.
-  filler.close();
-  EXPECT_EQ(unlink((disk / "filler").c_str()), 0);
-  EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/0");
-  EXPECT_EQ(add(2000), "ok");
-  EXPECT_EQ(engine.Do("commit"), "ok");
-  engine.Restart();
-  EXPECT_EQ(engine.Search(R"({"words":"kept","sort":"path"})"), "/v/0 /v/2000");
+  EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
 }
 
 TEST(EngineFailure, ADocumentThatCannotMoveStaysAlone) {

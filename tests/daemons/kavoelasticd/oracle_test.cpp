@@ -15,9 +15,11 @@
 
 namespace {
 
+using std::string_literals::operator""s;
+
 class Oracle {
  public:
-  explicit Oracle(unsigned seed) : random_(seed) {}
+  explicit Oracle(unsigned seed) : random_(seed), has_odd_names_(seed % 2 == 1) {}
 
   void Step() {
     const std::string path = Path();
@@ -151,8 +153,8 @@ class Oracle {
 
   std::string Path() {
     const std::string folders[] = {"/a", "/b", "/a/b", "/c", "/a!", "/a0"};
-    const std::string names[] = {"/a", "/b", "/c", "/\xff"};
-    return folders[random_() % 6] + names[random_() % 4];
+    const std::string names[] = {"/a", "/b", "/c", "/\xff", "/\u00e9", "/e\u0301", "/\n\"\\\0"s};
+    return folders[random_() % 6] + names[random_() % 4 + (has_odd_names_ ? 3 : 0)];
   }
 
   // A text of random words, short or long.
@@ -303,6 +305,7 @@ class Oracle {
   }
 
   std::mt19937 random_;
+  const bool has_odd_names_;
   EngineFixture engine_;
   std::map<std::string, Json::Value> documents_;
 };

@@ -59,16 +59,21 @@ int64_t PathRuleVersion() {
   return syscall(SYS_landlock_create_ruleset, nullptr, 0, LANDLOCK_CREATE_RULESET_VERSION);
 }
 
-void Allow(int rules, const std::string& path, uint64_t rights) {
+// False when what is there is not allowed: whoever went on would be kept from his own files.
+bool Allow(int rules, const std::string& path, uint64_t rights) {
   const UniqueFd folder(open(path.c_str(), O_PATH | O_CLOEXEC));
-  struct landlock_path_beneath_attr rule {};
-  struct stat info {};
-  const bool is_folder = fstat(folder.Get(), &info) == 0 && S_ISDIR(info.st_mode);
-  rule.allowed_access = is_folder ? rights : rights & kFileRights;
-  rule.parent_fd = folder.Get();
-  if (folder.Get() >= 0) {
-    syscall(SYS_landlock_add_rule, rules, LANDLOCK_RULE_PATH_BENEATH, &rule, 0);
+  if (folder.Get() < 0) {
+    return errno == ENOENT || errno == ENOTDIR;
   }
+  struct stat info {};
+  if (fstat(folder.Get(), &info) != 0) {
+    return false;
+  }
+  struct landlock_path_beneath_attr rule {};
+  rule.allowed_access = S_ISDIR(info.st_mode) ? rights : rights & kFileRights;
+  rule.parent_fd = folder.Get();
+  return rule.allowed_access == 0 ||
+         syscall(SYS_landlock_add_rule, rules, LANDLOCK_RULE_PATH_BENEATH, &rule, 0) == 0;
 }
 
 // Forbids what is in `set` but for `rights` below the paths.
@@ -79,10 +84,10 @@ PathRule Enforce(const RuleSet& set, const std::vector<std::string>& paths, uint
   if (rules.Get() < 0) {
     return PathRule::kFailed;
   }
-  for (const std::string& path : paths) {
-    Allow(rules.Get(), path, rights);
-  }
-  return prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
+  const bool are_allowed = std::all_of(paths.begin(), paths.end(), [&](const std::string& path) {
+    return Allow(rules.Get(), path, rights);
+  });
+  return are_allowed && prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
                  syscall(SYS_landlock_restrict_self, rules.Get(), 0) == 0
              ? PathRule::kInForce
              : PathRule::kFailed;

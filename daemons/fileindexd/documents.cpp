@@ -106,9 +106,17 @@ bool ParseOnce(const std::string& path, bool content, Json::Value* fields) {
   }
 }
 
+// `reason` is one of kavo::local::content_reason.
+bool LacksContent(const Json::Value& fields, const char* reason) {
+  const Json::Value& error = fields[kavo::local::kContentErrorField];
+  return error.isString() && error.asString().starts_with(reason);
+}
+
 // What the system refused once it may grant at the next try.
 bool Parse(const std::string& path, bool content, Json::Value* fields) {
-  return ParseOnce(path, content, fields) || ParseOnce(path, content, fields);
+  return (ParseOnce(path, content, fields) &&
+          !LacksContent(*fields, kavo::local::content_reason::kUnreadable)) ||
+         ParseOnce(path, content, fields);
 }
 
 void AddCopies(Json::Value* fields) {
@@ -261,7 +269,7 @@ Json::Value MakePut(const std::string& id, const std::string& path, bool content
   Json::Value fields;
   bool is_parsed = stamp && Parse(path, content, &fields);
   if (stamp && !is_parsed && content) {
-    // Better its name and dates than nothing; the next comparison sees what the document lacks.
+    // Better its name and dates than nothing.
     is_parsed = Parse(path, /*content=*/false, &fields);
     stamp->content = false;
   }
@@ -270,6 +278,9 @@ Json::Value MakePut(const std::string& id, const std::string& path, bool content
     return MakeItem(kDelete, id, path);
   }
   VEXLO_CHECK(!is_parsed, ERR_PARSE_FILE, "Parse failed, path=" + path);
+  if (LacksContent(fields, kavo::local::content_reason::kUnreadable)) {
+    stamp->content = false;  // A change of its rights, and the next comparison, have it read again.
+  }
   AddCopies(&fields);
   fields[kStampField] = ToJson(*stamp);
   Json::Value item = MakeItem("document_upsert_by_id", id, path);
@@ -280,9 +291,7 @@ Json::Value MakePut(const std::string& id, const std::string& path, bool content
 bool IsDelete(const Json::Value& item) { return item["command"] == kDelete; }
 
 bool IsUnread(const Json::Value& item) {
-  const Json::Value& error = item["data"]["data"][kavo::local::kContentErrorField];
-  return error.isString() &&
-         error.asString().starts_with(kavo::local::content_reason::kUnavailable);
+  return LacksContent(item["data"]["data"], kavo::local::content_reason::kUnavailable);
 }
 
 std::vector<std::string> ListUnread(const std::string& id, const std::string& after,

@@ -260,7 +260,9 @@ void AddContent(const std::string& path, Json::Value& fields) {
   const ScopedFd file(OpenQuietly(path));
   struct stat info {};
   if (file.Get() < 0 || fstat(file.Get(), &info) != 0) {
-    SetError(fields, reason::kUnreadable, std::generic_category().message(errno));
+    const bool passes = errno == EMFILE || errno == ENFILE || errno == ENOMEM;
+    SetError(fields, passes ? reason::kUnavailable : reason::kUnreadable,
+             std::generic_category().message(errno));
     return;
   }
   if (!S_ISREG(info.st_mode) || info.st_size == 0 ||

@@ -135,7 +135,8 @@ TEST(Stack, LosesNothingToFaults) {
     // Not the first: for a full disk the index daemon waits a minute.
     const FaultKind& kind = kFaultKinds[1 + tree.Below(std::size(kFaultKinds) - 1)];
     const std::string& name = names[tree.Below(static_cast<unsigned>(names.size()))];
-    const unsigned at = 1 + tree.Below(kind.error == ENOMEM ? 30000 : 300);
+    // Rather an early one, as few calls of some kinds are made.
+    const unsigned at = 1 + tree.Below(1 + tree.Below(kind.error == ENOMEM ? 30000 : 300));
     SCOPED_TRACE(name + ", " + kind.name + ", call " + std::to_string(at));
     EXPECT_EQ(stack.End(name, SIGTERM), 0);
     stack.Start(name, "env LD_PRELOAD=" FAIL_NTH_MODULE " FAIL_CALLS=" + std::string(kind.calls) +
@@ -157,7 +158,7 @@ TEST(Stack, LosesNothingToFaults) {
     reached += std::filesystem::remove(report) ? 1 : 0;
   });
   printf("%u of %u faults were reached\n", reached, done);
-  EXPECT_GE(2 * reached, done);
+  EXPECT_GE(3 * reached, done);
 }
 
 // --- Kills

@@ -129,6 +129,8 @@ TEST_F(WebTest, AnswersNobodyButItsOwner) {
       {"Rebound", "GET /", "Host: evil.example\r\n", 421},
       {"ReboundData", "GET /api/status", key + "Host: evil.example\r\n", 421},
       {"HostBeginsRight", "GET /", "Host: 127.0.0.1.evil.example\r\n", 421},
+      {"HostEndsRight", "GET /", "Host: evil.example:127.0.0.1\r\n", 421},
+      {"NetworkHost", "GET /", "Host: 192.168.1.1\r\n", 421},
       {"TwoHosts", "GET /", web_.Host() + "Host: evil.example\r\n", 421},
       {"Data", "GET /api/status", key, 200},
       {"DataWithoutToken", "GET /api/status", "", 401},
@@ -141,7 +143,8 @@ TEST_F(WebTest, AnswersNobodyButItsOwner) {
       {"OtherOrigin", "POST /api/resume", key + "Origin: http://evil.example\r\n", 403},
       {"OtherPort", "POST /api/resume", key + "Origin: http://127.0.0.1:1\r\n", 403},
       {"NullOrigin", "GET /api/status", key + "Origin: null\r\n", 403},
-      {"OtherSite", "GET /api/status", key + "Sec-Fetch-Site: cross-site\r\n", 403},
+      {"OwnSite", "GET /api/status", key + "Sec-Fetch-Site: same-origin\r\n", 200},
+      {"SameSite", "POST /api/resume", key + "Sec-Fetch-Site: same-site\r\n", 403},
       {"Preflight", "OPTIONS /api/pause", "Origin: http://evil.example\r\n", 403},
       {"GetToChange", "GET /api/pause", key, 405},
       {"Body", "POST /api/pause", key + "Content-Length: 1\r\n", 413},
@@ -273,6 +276,7 @@ TEST_F(WebTest, ListensOnThisMachineOnly) {
   const std::string taken = "127.0.0.1:" + std::to_string(web_.Port());
   const std::tuple<std::string, int, std::string> cases[] = {
       {"0.0.0.0:0", 2, "can be reached from other machines"},
+      {"[::]:0", 2, "ssh -L"},
       {"[::ffff:127.0.0.1]:0", 2, "can be reached"},
       {"example.com:80", 2, "is no address"},
       {"127.0.0.1:65536", 2, "is no address"},

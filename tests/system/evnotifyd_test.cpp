@@ -185,22 +185,6 @@ TEST_F(EvnotifydTest, ARegistrationThatGrowsLeavesTheRestAlone) {
   EXPECT_EQ(Stats()["lines"], 7);
 }
 
-TEST_F(EvnotifydTest, WhatHappensWhileItDoesNotRunIsMadeUpFor) {
-  Register({{"share", kMask}});
-  Start();
-  AwaitLines("reindex share/");
-  Do("share", "> f");
-  AwaitLines("reindex share/, create share/f, write share/f");
-  EXPECT_EQ(End(SIGKILL), 128 + SIGKILL);
-  Do("share", "mkdir d; > d/f");
-  std::ofstream(Queue(), std::ios::app) << R"({"event":8,"is_dir":fa)";
-  Start();
-  EXPECT_TRUE(Stack::Await([&] { return ReadText(Queue()).ends_with("\n"); }));
-  EXPECT_NE(ReadText(Queue()).find("\"is_dir\":fa\n{\"event\":65536,"), std::string::npos);
-  Do("share", "> d/g");
-  AwaitLines("create share/d/g, write share/d/g", "q", 5);
-}
-
 TEST_F(EvnotifydTest, TheWayToAFolderMayLeadOverLinks) {
   kRoot.MakeFolder("disk/volume/photo");
   kRoot.MakeFolder("disk2/photo");

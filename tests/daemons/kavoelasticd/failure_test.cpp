@@ -28,6 +28,10 @@ TEST(EngineFailure, ADamagedIndexIsSetAsideUntilItIsMadeAnew) {
   };
   const Case cases[] = {
       {"Empty", [](const std::string& f) { std::ofstream(f, std::ios::trunc); }},
+      {"APage",
+       [](const std::string& f) {
+         std::fstream(f, std::ios::in | std::ios::out).seekp(8192 * 3) << std::string(8192, 'Z');
+       }},
       {"Gone", [](const std::string& f) { unlink(f.c_str()); }},
       {"AFolder", [](const std::string& f) { unlink(f.c_str()), mkdir(f.c_str(), 0755); }},
       {"AnotherDatabase", sql("DROP TABLE records")},

@@ -60,7 +60,7 @@ class Oracle {
       EXPECT_EQ(engine_.Query(R"({"term":{"Note":")" + word + "\"}}", kAll), Having("Note", word));
       EXPECT_EQ(Found(R"("words":")" + word + "\""), Having("KAVOMDTextContent", word, "Note"));
     }
-    for (const std::string letter : {"a", "b", "c"}) {
+    for (const std::string letter : {"a", "b", "c", "\xff"}) {
       EXPECT_EQ(Found(R"("name":")" + letter + "\""),
                 Having("KAVOMDSearchFileName", letter, "", "/" + letter));
       const std::string folder = "/" + letter;

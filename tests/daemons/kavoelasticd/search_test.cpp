@@ -20,16 +20,18 @@ TEST(Search, FindsWordsNamesAndWhatTheFiltersLeave) {
   engine.Add("/v/a/fox.JPG", R"({"KAVOMDTitle":"Winter in Zu\u0308rich","KAVOMDFSSize":200,
                  "KAVOMDFSContentChangeDate":3000,"KAVOMDAuthors":"Ada Lovelace"})");
   engine.Add("/v/ab/notes.md", R"({"KAVOMDTextContent":"dog brown quick fox","KAVOMDFSSize":300,
-                 "KAVOMDFSContentChangeDate":2000,"Quiet":"whisper","Hidden":"secretly"})");
+                 "KAVOMDFSContentChangeDate":2000,"Quiet":"whisper","Quiet text":"murmur","Hidden":"secretly"})");
   engine.Add("/v/b/\u6771\u4eac\u90fd\u306e\u5730\u56f3.pdf",
              "{\"KAVOMDTextContent\":\"\u65e5\u672c\u8a9e\u306e\u6587\u7ae0\"}");
   const SearchCase cases[] = {
       {"Stem", R"({"words":"fox","sort":"path"})", "/v/a/fox.JPG /v/a/report.txt /v/ab/notes.md"},
       {"NameCountsMost", R"({"words":"fox","size":1})", "/v/a/fox.JPG"},
       {"WordsOfDifferentFields", R"({"words":"fox winter"})", "/v/a/fox.JPG"},
+      {"Phrase", R"({"words":"\"quick brown\""})", "/v/a/report.txt"},
       {"BeginningBeyondTheStem", R"({"words":"lovelac*"})", "/v/a/fox.JPG"},
       {"NumberInCatchAll", R"({"words":"300"})", "/v/ab/notes.md"},
       {"OutsideCatchAll", R"({"words":"whisper"})", ""},
+      {"TextOutsideCatchAll", R"({"words":"murmur"})", ""},
       {"NotStoredButFound", R"({"words":"secretly"})", "/v/ab/notes.md"},
       {"PathIsNotSearched", R"({"words":"ab"})", ""},
       {"Operators", R"({"words":"fox) OR (NEAR"})", ""},

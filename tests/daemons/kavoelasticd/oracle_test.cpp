@@ -15,8 +15,6 @@
 
 namespace {
 
-using std::string_literals::operator""s;
-
 class Oracle {
  public:
   explicit Oracle(unsigned seed) : random_(seed), has_odd_names_(seed % 2 == 1) {}
@@ -153,7 +151,7 @@ class Oracle {
 
   std::string Path() {
     const std::string folders[] = {"/a", "/b", "/a/b", "/c", "/a!", "/a0"};
-    const std::string names[] = {"/a", "/b", "/c", "/\xff", "/\u00e9", "/e\u0301", "/\n\"\\\0"s};
+    const std::string names[] = {"/a", "/b", "/c", "/\xff", "/\u00e9", "/e\u0301", "/\n\"\\"};
     return folders[random_() % 6] + names[random_() % 4 + (has_odd_names_ ? 3 : 0)];
   }
 

@@ -125,20 +125,16 @@ Answer ReadShares(const std::string& file) {
   }
 }
 
-std::set<std::string> Fold(const std::string& queue, bool use_tmp) {
+Answer ReadQueue(const std::string& file) {
   std::set<std::string> operations;
-  index::QueueMgr(queue).ProcessOP(
+  index::QueueMgr(file).ProcessOP(
       [&](const std::shared_ptr<index::OP>& op) {
         std::ostringstream out;
         out << op;
         operations.insert(out.str());
       },
-      use_tmp);
+      /*use_tmp=*/false);
   return operations;
-}
-Answer ReadQueue(const std::string& file) { return Fold(file, /*use_tmp=*/false); }
-Answer ReadSnapshot(const std::string& file) {
-  return Fold(file.substr(0, file.size() - 4), /*use_tmp=*/true);
 }
 
 struct Kind {
@@ -187,7 +183,6 @@ std::vector<Kind> Kinds() {
        "\n{\"name\": \"music\", \"path\": \"/volume1/music\"}]}\n",
        ReadShares, 2},
       {"queue", kRoot / "live", lines, ReadQueue, 3, 2, true},
-      {"snapshot", kRoot / "queue.tmp", lines, ReadSnapshot, 3, 2, true},
   };
 }
 

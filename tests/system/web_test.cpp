@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <ctime>
-#include <set>
 #include <vector>
 
 #include "support/stack.h"
@@ -18,36 +17,17 @@ const PrivateRoot kRoot;
 constexpr int kFiles = 45;
 
 // A connection to a port of this machine.
-class Client {
- public:
-  explicit Client(uint16_t port) : fd_(socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
-    const timeval patience = {60, 0};
-    setsockopt(fd_, SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof(patience));
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_port = htons(port);
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    EXPECT_EQ(connect(fd_, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
-  }
-  ~Client() { close(fd_); }
-  Client(const Client&) = delete;
-  Client& operator=(const Client&) = delete;
-
-  void Send(const std::string& text) const { send(fd_, text.data(), text.size(), MSG_NOSIGNAL); }
-  // All until the server closes.
-  std::string Receive() const {
-    std::string text;
-    char buffer[4096];
-    ssize_t count = 0;
-    while ((count = recv(fd_, buffer, sizeof(buffer), 0)) > 0) {
-      text.append(buffer, static_cast<size_t>(count));
-    }
-    return text;
-  }
-
- private:
-  const int fd_;
-};
+RawClient Connect(uint16_t port) {
+  const int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  const timeval patience = {60, 0};
+  setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof(patience));
+  sockaddr_in address{};
+  address.sin_family = AF_INET;
+  address.sin_port = htons(port);
+  address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+  EXPECT_EQ(connect(fd, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
+  return RawClient(fd);
+}
 
 struct Reply {
   int status;
@@ -87,7 +67,7 @@ class Web {
 
   // Without a line for "Host" among the headers, the right one is sent.
   Reply Ask(const std::string& line, const std::string& headers) const {
-    const Client client(port_);
+    const RawClient client = Connect(port_);
     client.Send(line + " HTTP/1.1\r\n" +
                 (headers.find("Host:") == std::string::npos ? Host() : "") + headers + "\r\n");
     const std::string text = client.Receive();
@@ -127,81 +107,52 @@ class WebTest : public testing::Test {
   }
   static void TearDownTestSuite() { delete std::exchange(stack, nullptr); }
 
-  static std::set<std::string> PathsOf(const Json::Value& reply) {
-    std::set<std::string> paths;
-    for (const Json::Value& hit : reply["data"]) {
-      paths.insert(hit["path"].asString());
-    }
-    return paths;
-  }
-
   static Stack* stack;
   Web web_;
 };
 Stack* WebTest::stack = nullptr;
 
-struct RequestCase {
-  const char* name;
-  const char* line;
-  std::string headers;  // "KEY" and "HOST" stand for the right ones.
-  int status;
-};
-
-std::string Replaced(std::string text, const std::string& word, const std::string& by) {
-  const size_t at = text.find(word);
-  return at == std::string::npos ? text : text.replace(at, word.size(), by);
-}
-
 TEST_F(WebTest, AnswersNobodyButItsOwner) {
   const std::string own = "127.0.0.1:" + std::to_string(web_.Port());
-  const std::string longer = "X-Fileindex-Token: " + web_.Token() + "0\r\n";
-  const std::string status = "GET /api/status";
-  const RequestCase cases[] = {
+  const std::string key = web_.Key();
+  const std::string with_token = "GET /api/status?token=" + web_.Token();
+  const struct {
+    const char* name;
+    std::string line;
+    std::string headers;
+    int status;
+  } cases[] = {
       {"Page", "GET /", "", 200},
-      {"PageHead", "HEAD /page.js", "", 200},
-      {"PageByAnotherPort", "GET /", "Host: localhost:1\r\n", 200},
       {"PageByIpv6", "GET /", "Host: [::1]:80\r\n", 200},
-      {"PagePost", "POST /", "Content-Length: 0\r\n", 405},
-      {"NoPage", "GET /page", "", 404},
       {"WayUp", "GET /../../etc/passwd", "", 404},
       {"NoHost", "GET /", "Host:\r\n", 421},
       {"Rebound", "GET /", "Host: evil.example\r\n", 421},
-      {"ReboundData", "GET /api/status", "KEYHost: evil.example\r\n", 421},
+      {"ReboundData", "GET /api/status", key + "Host: evil.example\r\n", 421},
       {"HostBeginsRight", "GET /", "Host: 127.0.0.1.evil.example\r\n", 421},
       {"HostEndsRight", "GET /", "Host: evil.example:127.0.0.1\r\n", 421},
       {"NetworkHost", "GET /", "Host: 192.168.1.1\r\n", 421},
-      {"TwoHosts", "GET /", "HOSTHost: evil.example\r\n", 421},
-      {"Data", "GET /api/status", "KEY", 200},
+      {"TwoHosts", "GET /", web_.Host() + "Host: evil.example\r\n", 421},
+      {"Data", "GET /api/status", key, 200},
       {"DataWithoutToken", "GET /api/status", "", 401},
-      {"TokenInAddress", "GET /api/status?token=TOKEN", "", 401},
-      {"TokenInCookie", "GET /api/status", "Cookie: X-Fileindex-Token=TOKEN\r\n", 401},
+      {"TokenInAddress", with_token, "", 401},
       {"WrongToken", "GET /api/status", "X-Fileindex-Token: 00\r\n", 401},
       {"EmptyToken", "GET /api/status", "X-Fileindex-Token:\r\n", 401},
-      {"LongerToken", "GET /api/status", longer, 401},
-      {"TwoTokens", "GET /api/status", "KEYKEY", 401},
+      {"LongerToken", "GET /api/status", "X-Fileindex-Token: " + web_.Token() + "0\r\n", 401},
       {"ChangeWithoutToken", "POST /api/pause", "Content-Length: 0\r\n", 401},
-      {"UnknownWithoutToken", "GET /api/none", "", 401},
-      {"OwnOrigin", "GET /api/status", "KEYOrigin: http://" + own + "\r\n", 200},
-      {"OtherOrigin", "POST /api/resume", "KEYOrigin: http://evil.example\r\n", 403},
-      {"OtherPort", "POST /api/resume", "KEYOrigin: http://127.0.0.1:1\r\n", 403},
-      {"NullOrigin", "GET /api/status", "KEYOrigin: null\r\n", 403},
-      {"OwnSite", "GET /api/status", "KEYSec-Fetch-Site: same-origin\r\n", 200},
-      {"OtherSite", "GET /api/status", "KEYSec-Fetch-Site: cross-site\r\n", 403},
-      {"SameSite", "POST /api/resume", "KEYSec-Fetch-Site: same-site\r\n", 403},
+      {"OwnOrigin", "GET /api/status", key + "Origin: http://" + own + "\r\n", 200},
+      {"OtherOrigin", "POST /api/resume", key + "Origin: http://evil.example\r\n", 403},
+      {"OtherPort", "POST /api/resume", key + "Origin: http://127.0.0.1:1\r\n", 403},
+      {"NullOrigin", "GET /api/status", key + "Origin: null\r\n", 403},
+      {"OwnSite", "GET /api/status", key + "Sec-Fetch-Site: same-origin\r\n", 200},
+      {"SameSite", "POST /api/resume", key + "Sec-Fetch-Site: same-site\r\n", 403},
       {"Preflight", "OPTIONS /api/pause", "Origin: http://evil.example\r\n", 403},
-      {"Unknown", "GET /api/none", "KEY", 404},
-      {"PostToRead", "POST /api/search?words=a", "KEYContent-Length: 0\r\n", 405},
-      {"GetToChange", "GET /api/pause", "KEY", 405},
-      {"Body", "POST /api/pause", "KEYContent-Length: 1\r\n", 413},
-      {"ChunkedBody", "POST /api/pause", "KEYTransfer-Encoding: chunked\r\n", 413},
-      {"HugeBody", "POST /api/pause", "KEYContent-Length: 99999999999\r\n", 413},
+      {"GetToChange", "GET /api/pause", key, 405},
+      {"Body", "POST /api/pause", key + "Content-Length: 1\r\n", 413},
+      {"ChunkedBody", "POST /api/pause", key + "Transfer-Encoding: chunked\r\n", 413},
   };
-  for (const RequestCase& test : cases) {
+  for (const auto& test : cases) {
     SCOPED_TRACE(test.name);
-    std::string headers = Replaced(test.headers, "HOST", web_.Host());
-    headers = Replaced(Replaced(headers, "KEY", web_.Key()), "KEY", web_.Key());
-    const Reply reply = web_.Ask(Replaced(test.line, "TOKEN", web_.Token()),
-                                 Replaced(headers, "=TOKEN", "=" + web_.Token()));
+    const Reply reply = web_.Ask(test.line, test.headers);
     EXPECT_EQ(reply.status, test.status) << reply.head;
     for (const char* const wanted :
          {"frame-ancestors 'none'", "default-src 'none'", "script-src 'self';", "nosniff",
@@ -218,23 +169,13 @@ TEST_F(WebTest, AnswersNobodyButItsOwner) {
 TEST_F(WebTest, SaysWhatIsWrongWithArguments) {
   const std::pair<const char*, const char*> cases[] = {
       {"GET /api/search", "wants words"},
-      {"GET /api/search?words=", "wants words"},
       {"GET /api/search?word=a", "no argument 'word'"},
-      {"GET /api/search?words=a&words=b", "more than once"},
       {"GET /api/search?words=a%00b", "NUL"},
-      {"GET /api/search?words=a&limit=0", "'0', is no number from 1 to 100"},
       {"GET /api/search?words=a&limit=101", "'101', is no number"},
-      {"GET /api/search?words=a&from=-1", "'-1', is no number from 0"},
-      {"GET /api/search?words=a&from=1e9", "'1e9', is no number"},
       {"GET /api/search?below=letters", "its full path is wanted"},
-      {"GET /api/search?type=text", "'text' is no type"},
       {"GET /api/search?larger=big", "'big' is no size"},
       {"GET /api/search?newer=%C3", "'\xC3' is no date"},
-      {"GET /api/search?words=a&sort=up", "'up' is no order"},
-      {"GET /api/folders?limit=1001", "'1001', is no number"},
-      {"GET /api/status?all", "no argument 'all'"},
       {"POST /api/pause?hours=0", "'0' is no number of hours"},
-      {"POST /api/resume?hours=1", "no argument 'hours'"},
   };
   for (const auto& [line, message] : cases) {
     const Reply reply = web_.Ask(line, web_.Key());
@@ -251,40 +192,24 @@ TEST_F(WebTest, RefusesRequestsThatAreTooLong) {
   EXPECT_EQ(web_.Ask("GET /", "").status, 200);
 }
 
-TEST_F(WebTest, TurnsPages) {
-  std::set<std::string> paths;
-  for (int from = 0; from < kFiles; from += 20) {
-    const Json::Value reply =
-        web_.Get("/api/search?words=harbour&sort=name&limit=20&from=" + std::to_string(from));
-    EXPECT_EQ(reply["total"].asInt(), kFiles);
-    EXPECT_EQ(reply["data"].size(), static_cast<size_t>(std::min(20, kFiles - from)));
-    EXPECT_EQ(reply["data"][0]["name"].asString(), "letter" + std::to_string(100 + from) + ".txt");
-    EXPECT_EQ(reply["data"][0]["snippet"].asString(), "the \x02harbour\x03");
-    paths.merge(PathsOf(reply));
-  }
-  EXPECT_EQ(paths.size(), kFiles);
-  EXPECT_TRUE(web_.Get("/api/search?words=harbour&from=45")["data"].empty());
+TEST_F(WebTest, ShowsAPageOfWhatIsFound) {
+  const Json::Value reply = web_.Get("/api/search?words=harbour&sort=name&limit=20&from=40");
+  EXPECT_EQ(reply["total"].asInt(), kFiles);
+  EXPECT_EQ(reply["data"].size(), 5U);
+  EXPECT_EQ(reply["data"][0]["name"].asString(), "letter140.txt");
+  EXPECT_EQ(reply["data"][0]["snippet"].asString(), "the \x02harbour\x03");
 }
 
 TEST_F(WebTest, KeepsNamesAsBytes) {
   const std::string folder = stack->In() + "/caf\xE9 & co";
-  const std::set<std::string> wanted = {folder + "/na\xEFve.txt"};
-  EXPECT_EQ(PathsOf(web_.Get("/api/search?words=lighthouse")).size(), 2);
-  EXPECT_EQ(
-      PathsOf(web_.Get("/api/search?words=lighthouse&below=" + stack->In() + "/caf%e9%20%26+co")),
-      wanted);
-  EXPECT_EQ(PathsOf(web_.Get("/api/search?type=document&smaller=1k&below=" + stack->In() +
-                             "/caf%E9+%26+co")),
-            wanted);
-  EXPECT_TRUE(PathsOf(web_.Get("/api/search?words=lighthouse&larger=1k")).empty());
+  const std::string below = "&below=" + stack->In() + "/caf%e9%20%26+co";
+  const Json::Value found = web_.Get("/api/search?type=document&smaller=1k" + below)["data"];
+  ASSERT_EQ(found.size(), 1U);
+  EXPECT_EQ(found[0]["path"].asString(), folder + "/na\xEFve.txt");
+  EXPECT_TRUE(web_.Get("/api/search?words=lighthouse&larger=1k")["data"].empty());
 }
 
 TEST_F(WebTest, PausesAndResumes) {
-  const Json::Value folders = web_.Get("/api/folders");
-  EXPECT_EQ(folders["total"].asInt(), 1);
-  EXPECT_EQ(folders["folder"][0]["full_path"].asString(), stack->In());
-  EXPECT_EQ(folders["folder"][0]["additional"]["status"]["text"].asString(), "finished");
-
   const time_t before = time(nullptr);
   const Reply paused = web_.Ask("POST /api/pause?hours=2", web_.Key());
   EXPECT_EQ(paused.status, 200) << paused.head;
@@ -299,17 +224,15 @@ TEST_F(WebTest, PausesAndResumes) {
   const Reply resumed = web_.Ask("POST /api/resume", web_.Key() + "Content-Length: 0\r\n");
   EXPECT_EQ(resumed.body["resume_time"].asInt(), -1);
   EXPECT_TRUE(Stack::Await([&] { return stack->IsFound("ferry"); })) << stack->Logs();
-  EXPECT_EQ(web_.Ask("POST /api/pause", web_.Key()).body["resume_time"].asInt(), 0);
-  EXPECT_EQ(web_.Ask("POST /api/resume", web_.Key()).body["resume_time"].asInt(), -1);
 }
 
 TEST_F(WebTest, IsThereForOthersWhileClientsStall) {
   const auto begin = Stack::Clock::now();
-  std::vector<std::unique_ptr<Client>> stalled;
+  std::vector<RawClient> stalled;
   stalled.reserve(200);
   for (int i = 0; i < 200; ++i) {
-    stalled.push_back(std::make_unique<Client>(web_.Port()));
-    stalled.back()->Send(i % 2 == 0 ? "" : "GET /api/status HTTP/1.1\r\nX-Slow: ");
+    stalled.push_back(Connect(web_.Port()));
+    stalled.back().Send(i % 2 == 0 ? "" : "GET /api/status HTTP/1.1\r\nX-Slow: ");
   }
   EXPECT_EQ(web_.Get("/api/search?words=harbour")["total"].asInt(), kFiles);
   EXPECT_LT(Stack::Clock::now() - begin, std::chrono::seconds(10));
@@ -317,13 +240,14 @@ TEST_F(WebTest, IsThereForOthersWhileClientsStall) {
 }
 
 TEST_F(WebTest, AnswersWhatItCanWhileTheEngineHangs) {
+  const std::string search =
+      "GET /api/search?words=harbour HTTP/1.1\r\n" + web_.Host() + web_.Key() + "\r\n";
   stack->Signal("kavoelasticd", SIGSTOP);
-  std::vector<std::unique_ptr<Client>> searches;
+  std::vector<RawClient> searches;
   searches.reserve(10);
   for (int i = 0; i < 10; ++i) {  // As many as two threads and the queue for them take.
-    searches.push_back(std::make_unique<Client>(web_.Port()));
-    searches.back()->Send("GET /api/search?words=harbour HTTP/1.1\r\n" + web_.Host() + web_.Key() +
-                          "\r\n");
+    searches.push_back(Connect(web_.Port()));
+    searches.back().Send(search);
   }
   EXPECT_TRUE(Stack::Await(
       [&] { return web_.Ask("GET /api/search?words=harbour", web_.Key()).status == 503; }));
@@ -333,14 +257,14 @@ TEST_F(WebTest, AnswersWhatItCanWhileTheEngineHangs) {
         << daemon["name"].asString();
   }
   stack->Signal("kavoelasticd", SIGCONT);
-  const auto found = std::count_if(searches.begin(), searches.end(), [](const auto& search) {
-    return search->Receive().find("\"total\":45") != std::string::npos;
+  const auto found = std::count_if(searches.begin(), searches.end(), [](const RawClient& client) {
+    return client.Receive().find("\"total\":45") != std::string::npos;
   });
   EXPECT_GE(found, 8) << "searches that have waited";
 
   stack->Signal("kavoelasticd", SIGSTOP);
-  const Client search(web_.Port());
-  search.Send("GET /api/search?words=harbour HTTP/1.1\r\n" + web_.Host() + web_.Key() + "\r\n");
+  const RawClient last = Connect(web_.Port());
+  last.Send(search);
   web_.Get("/api/folders");
   const auto begin = Stack::Clock::now();
   EXPECT_EQ(web_.End(SIGINT), 0);
@@ -353,11 +277,8 @@ TEST_F(WebTest, ListensOnThisMachineOnly) {
   const std::tuple<std::string, int, std::string> cases[] = {
       {"0.0.0.0:0", 2, "can be reached from other machines"},
       {"[::]:0", 2, "ssh -L"},
-      {"192.168.1.1:80", 2, "can be reached from other machines"},
       {"[::ffff:127.0.0.1]:0", 2, "can be reached"},
       {"example.com:80", 2, "is no address"},
-      {"127.0.0.1", 2, "is no address"},
-      {"127.0.0.1:", 2, "is no address"},
       {"127.0.0.1:65536", 2, "is no address"},
       {taken, 3, "another program listens on " + taken},
   };

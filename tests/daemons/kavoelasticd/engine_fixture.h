@@ -12,6 +12,7 @@
 
 #include "common/json.h"
 #include "daemons/kavoelasticd/engine.h"
+#include "daemons/kavoelasticd/sqlite.h"
 #include "support/temp_folder.h"
 
 inline Json::Value Parsed(const std::string& text) {
@@ -89,9 +90,9 @@ inline std::string Paths(const Json::Value& list, const char* field) {
 
 class EngineFixture {
  public:
-  explicit EngineFixture(const std::string& mappings = kMappings) {
+  EngineFixture() {
     Restart();
-    EXPECT_EQ(Create("i", folder_ / "i", mappings), "ok");
+    EXPECT_EQ(Create("i", folder_ / "i"), "ok");
   }
 
   void Restart() {
@@ -157,6 +158,14 @@ class EngineFixture {
     const Json::Value reply = Send("search", Parsed(data));
     EXPECT_TRUE(reply["success"].asBool()) << reply;
     return Paths(reply["data"], "path");
+  }
+
+  // Runs this on the database of the index while the engine does not have it.
+  void ChangeDatabase(const std::string& sql) {
+    using vexlo::elasticd::Connection;
+    EXPECT_EQ(Do("index_pause"), "ok");
+    Connection(folder_ / "i/index.db", Connection::Use::kWrite).Run(sql);
+    EXPECT_EQ(Do("index_resume"), "ok");
   }
 
   TempFolder& Folder() { return folder_; }

@@ -2,24 +2,25 @@
 #include "daemons/kavoelasticd/judge.h"
 
 #include <acl/libacl.h>
-#include <fcntl.h>
-#include <grp.h>
 #include <sys/acl.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <filesystem>
 #include <random>
 #include <set>
 
-#include "engine_fixture.h"
+#include "daemons/kavoelasticd/engine_fixture.h"
+#include "support/as_user.h"
 
 namespace vexlo::elasticd {
 namespace {
 
+// Users have a group of their own number, and are in the two behind it.
 constexpr uid_t kFirstUser = 4700;
-constexpr gid_t kFirstGroup = 4800;
+constexpr unsigned kUsers = 4;
+
+daemon::Peer User(uid_t uid) { return {uid, uid, {uid + 1, uid + 2}}; }
 
 class JudgeTest : public testing::Test {
  protected:
@@ -56,31 +57,21 @@ class JudgeTest : public testing::Test {
 };
 
 // The paths that a process of the user can open for reading.
-std::set<std::string> Readable(const daemon::Peer& peer, const std::vector<std::string>& paths) {
-  int ends[2];
-  EXPECT_EQ(pipe2(ends, O_CLOEXEC), 0);
-  const pid_t child = fork();
-  if (child == 0) {
-    bool is_other = setgroups(peer.groups.size(), peer.groups.data()) == 0 &&
-                    setresgid(peer.gid, peer.gid, peer.gid) == 0 &&
-                    setresuid(peer.uid, peer.uid, peer.uid) == 0;
+std::set<std::string> Readable(uid_t uid, const std::vector<std::string>& paths) {
+  const std::string heard = HearAs(uid, [&] {
+    std::string answers;
     for (const std::string& path : paths) {
-      const char answer = is_other && access(path.c_str(), R_OK) == 0 ? 1 : 0;
-      is_other = write(ends[1], &answer, 1) == 1 && is_other;
+      answers += access(path.c_str(), R_OK) == 0 ? '1' : '0';
     }
-    _exit(0);
-  }
-  close(ends[1]);
+    return answers;
+  });
+  EXPECT_EQ(heard.size(), paths.size());
   std::set<std::string> readable;
-  for (const std::string& path : paths) {
-    char answer = 0;
-    EXPECT_EQ(read(ends[0], &answer, 1), 1);
-    if (answer == 1) {
-      readable.insert(path);
+  for (size_t i = 0; i < heard.size(); ++i) {
+    if (heard[i] == '1') {
+      readable.insert(paths[i]);
     }
   }
-  close(ends[0]);
-  waitpid(child, nullptr, 0);
   return readable;
 }
 
@@ -91,7 +82,9 @@ unsigned Pick(Random& random, unsigned count) { return static_cast<unsigned>(ran
 // An owner, a mode, and now and then an access control list.
 void SetRights(Random& random, const std::string& path) {
   const bool is_folder = std::filesystem::is_directory(path);
-  ASSERT_EQ(chown(path.c_str(), kFirstUser + Pick(random, 3), kFirstGroup + Pick(random, 3)), 0);
+  ASSERT_EQ(
+      chown(path.c_str(), kFirstUser + Pick(random, kUsers), kFirstUser + Pick(random, kUsers + 2)),
+      0);
   const mode_t modes[] = {0777, 0755, 0750, 0700, 0711, 0070, 0007, 0705, 0440, 0404};
   const mode_t mode = modes[Pick(random, is_folder ? 8 : 10)];
   ASSERT_EQ(chmod(path.c_str(), mode), 0);
@@ -99,9 +92,9 @@ void SetRights(Random& random, const std::string& path) {
     const char* const rights[] = {"---", "r--", "r-x", "--x", "rwx"};
     const std::string text =
         "u::rwx,g::" + std::string(rights[Pick(random, 5)]) + ",o::" + rights[Pick(random, 5)] +
-        ",u:" + std::to_string(kFirstUser + Pick(random, 3)) + ":" + rights[Pick(random, 5)] +
-        ",g:" + std::to_string(kFirstGroup + Pick(random, 3)) + ":" + rights[Pick(random, 5)] +
-        ",m::" + rights[Pick(random, 5)];
+        ",u:" + std::to_string(kFirstUser + Pick(random, kUsers)) + ":" + rights[Pick(random, 5)] +
+        ",g:" + std::to_string(kFirstUser + Pick(random, kUsers + 2)) + ":" +
+        rights[Pick(random, 5)] + ",m::" + rights[Pick(random, 5)];
     acl_t list = acl_from_text(text.c_str());
     ASSERT_NE(list, nullptr) << text;
     // File systems without lists have modes alone.
@@ -132,14 +125,9 @@ TEST_F(JudgeTest, FindsWhatTheUserCanRead) {
       SetRights(random, path);
       Index(path);
     }
-    for (unsigned i = 0; i < 4; ++i) {
-      daemon::Peer peer{kFirstUser + i, kFirstGroup + Pick(random, 4), {}};
-      for (gid_t group = kFirstGroup; group < kFirstGroup + 3; ++group) {
-        if (Pick(random, 2) == 0) {
-          peer.groups.push_back(group);
-        }
-      }
-      const std::set<std::string> wanted = Readable(peer, paths);
+    for (uid_t uid = kFirstUser; uid <= kFirstUser + kUsers; ++uid) {
+      const daemon::Peer peer = User(uid);
+      const std::set<std::string> wanted = Readable(uid, paths);
       const std::string below = R"("below":")" + top + "\"";
       for (const std::string& data :
            {R"({"words":"common","size":1000,)" + below + "}", R"({"size":1000,)" + below + "}"}) {
@@ -164,7 +152,7 @@ TEST_F(JudgeTest, FindsWhatTheUserCanRead) {
 }
 
 TEST_F(JudgeTest, TellsNothingOfAFileThatStoodThereBefore) {
-  const daemon::Peer peer{kFirstUser, kFirstGroup, {}};
+  const daemon::Peer peer = User(kFirstUser);
   const std::string path = tree_ / "note";
   WriteText(path, "");
   Index(path);
@@ -182,13 +170,12 @@ TEST_F(JudgeTest, TellsNothingOfAFileThatStoodThereBefore) {
 }
 
 TEST_F(JudgeTest, AnswersSearchesAloneAndNotEndlessOnes) {
-  const daemon::Peer peer{kFirstUser, kFirstGroup, {}};
+  const daemon::Peer peer = User(kFirstUser);
   const std::string path = tree_ / "file";
   WriteText(path, "");
   Index(path);
   const char* const refused[] = {
       R"({"command":"index_delete","data":{"id":"i"}})",
-      R"({"command":"document_get_by_query","data":{"id":"i","query":{"qsl":{"prefix":{"KAVOMDPath":"/"}}}}})",
       R"({"compound":[{"command":"search","data":{}}],"command":"search"})",
       R"({"command":"search","data":{"from":9999,"size":2}})",
   };

@@ -2,8 +2,8 @@
 // afterwards, it must answer as the map does. A text index that forgets something else than what it
 // learnt shows here.
 #include <gtest/gtest.h>
-#include <sqlite3.h>
 
+#include <functional>
 #include <map>
 #include <random>
 #include <string>
@@ -17,7 +17,7 @@ namespace {
 
 class Oracle {
  public:
-  explicit Oracle(unsigned seed) : random_(seed) {}
+  explicit Oracle(unsigned seed) : random_(seed), has_odd_names_(seed % 2 == 1) {}
 
   void Step() {
     const std::string path = Path();
@@ -56,18 +56,19 @@ class Oracle {
       EXPECT_EQ(engine_.Query(R"({"term":{"KAVOMDTextContent":")" + word + "\"}}", kAll),
                 Having("KAVOMDTextContent", word));
       EXPECT_EQ(engine_.Query(R"({"term":{"Note":")" + word + "\"}}", kAll), Having("Note", word));
-      EXPECT_EQ(engine_.Query(R"({"term":{"KAVOMDIdentifier":")" + word + "\"}}", kAll),
-                Having("KAVOMDIdentifier", word));
-      EXPECT_EQ(engine_.Search(R"({"sort":"path","size":100,"words":")" + word + "\"}"),
-                Having("KAVOMDTextContent", word, "Note"));
+      EXPECT_EQ(Found(R"("words":")" + word + "\""), Having("KAVOMDTextContent", word, "Note"));
     }
-    for (const std::string letter : {"a", "b", "c"}) {
-      EXPECT_EQ(engine_.Search(R"({"sort":"path","size":100,"name":")" + letter + "\"}"),
+    for (const std::string letter : {"a", "b", "c", "\xff"}) {
+      EXPECT_EQ(Found(R"("name":")" + letter + "\""),
                 Having("KAVOMDSearchFileName", letter, "", "/" + letter));
-      EXPECT_EQ(engine_.Query(R"({"term":{"KAVOMDParent":"/)" + letter + "\"}}", kAll),
-                Having("KAVOMDParent", "/" + letter));
+      const std::string folder = "/" + letter;
+      for (const std::string field : {"KAVOMDParent", "KAVOMDIdentifier"}) {
+        EXPECT_EQ(engine_.Query(R"({"term":{")" + field + R"(":")" + folder + "\"}}", kAll),
+                  Having(field, folder));
+      }
+      EXPECT_EQ(engine_.Query(R"({"term":{"KAVOMDSearchAncestor":")" + folder + "\"}}", kAll),
+                HavingAncestor(folder));
     }
-    std::string all;
     const Json::Value found = engine_.Documents(R"({"prefix":{"KAVOMDPath":"/"}})", kAll);
     ASSERT_EQ(found.size(), documents_.size());
     Json::ArrayIndex i = 0;
@@ -79,6 +80,20 @@ class Oracle {
 
  private:
   static constexpr char kAll[] = R"({"size":100})";
+
+  // The paths that a search finds, as Having() gives them.
+  std::string Found(const std::string& data) {
+    const std::string sort = random_() % 2 == 0 ? R"("sort":"path",)" : "";
+    EXPECT_EQ(engine_.Do("commit"), "ok");
+    const Json::Value reply =
+        engine_.Send("search", Parsed("{" + sort + R"("size":100,)" + data + "}"));
+    std::map<std::string, Json::Value> hits;
+    for (const Json::Value& hit : reply["data"]) {
+      hits[hit["path"].asString()] = hit;
+    }
+    EXPECT_EQ(reply["total"].asUInt(), hits.size());
+    return PathsIf(hits, [](const Json::Value& /*hit*/) { return true; });
+  }
 
   // The digests of the folders, and what stands directly in each, are those of the map.
   void CompareFolders() {
@@ -112,18 +127,8 @@ class Oracle {
 
   // What an engine that knew of no digests has left.
   void ForgetFolders() {
-    EXPECT_EQ(engine_.Do("index_pause"), "ok");
-    sqlite3* db = nullptr;
-    ASSERT_EQ(sqlite3_open((engine_.Folder() / "i/index.db").c_str(), &db), SQLITE_OK);
-    const std::string version = vexlo::elasticd::FormatBeforeFolderSums();
-    EXPECT_EQ(sqlite3_exec(
-                  db,
-                  ("DROP TABLE folders; UPDATE meta SET v = '" + version + "' WHERE k = 'version'")
-                      .c_str(),
-                  nullptr, nullptr, nullptr),
-              SQLITE_OK);
-    sqlite3_close(db);
-    EXPECT_EQ(engine_.Do("index_resume"), "ok");
+    engine_.ChangeDatabase("DROP TABLE folders; UPDATE meta SET v = '" +
+                           vexlo::elasticd::FormatBeforeFolderSums() + "' WHERE k = 'version'");
   }
 
   // Of a file as the index daemon tells it, or what may be taken for it and is none.
@@ -145,9 +150,9 @@ class Oracle {
   }
 
   std::string Path() {
-    const std::string folders[] = {"/a", "/b", "/a/b", "/c"};
-    const std::string names[] = {"/a", "/b", "/c"};
-    return folders[random_() % 4] + names[random_() % 3];
+    const std::string folders[] = {"/a", "/b", "/a/b", "/c", "/a!", "/a0"};
+    const std::string names[] = {"/a", "/b", "/c", "/\xff", "/\u00e9", "/e\u0301", "/\n\"\\"};
+    return folders[random_() % 6] + names[random_() % 4 + (has_odd_names_ ? 3 : 0)];
   }
 
   // A text of random words, short or long.
@@ -163,7 +168,8 @@ class Oracle {
       case 0:
         return R"({"KAVOMDTextContent":")" + text + R"(","Note":")" + word + "\"}";
       case 1:
-        return R"({"Note":")" + text + R"(","KAVOMDIdentifier":")" + word + "\"}";
+        return R"({"Note":")" + text + R"(","KAVOMDIdentifier":")" +
+               (random_() % 2 == 0 ? word : "/a") + "\"}";
       case 2:
         return R"({"KAVOMDTextContent":")" + text + R"(","Quiet text":")" + word + "\"}";
       default:
@@ -208,13 +214,26 @@ class Oracle {
   }
 
   void MoveFolder(const std::string& from, const std::string& to) {
-    if (from == to) {
+    if ((from + "/").starts_with(to + "/") || (to + "/").starts_with(from + "/")) {
       return;
     }
-    Json::Value data = Parsed(R"({"folder_field":["KAVOMDParent"]})");
-    data["from"] = from;
-    data["to"] = to;
-    EXPECT_EQ(Answer(engine_.Send("document_move_below", data)), "ok");
+    std::vector<std::string> fields = {"KAVOMDParent", "KAVOMDSearchAncestor"};
+    const char* const more[] = {"KAVOMDDisplayName", "Unheard of", "KAVOMDPath"};
+    if (random_() % 2 == 0) {
+      fields.emplace_back(more[random_() % 3]);
+    }
+    Json::Value move;
+    move["from"] = from;
+    move["to"] = to;
+    move["size"] = 1 + random_() % 3;
+    for (const std::string& name : fields) {
+      move["folder_field"].append(name);
+    }
+    do {
+      const Json::Value answer = engine_.Send("document_move_below", move)["data"];
+      EXPECT_EQ(answer["failed"], Json::Value(Json::arrayValue));
+      move["after"] = answer["after"];
+    } while (move["after"].isString());
     std::vector<std::string> below;
     for (const auto& [path, document] : documents_) {
       if (path.starts_with(from + "/")) {
@@ -223,23 +242,29 @@ class Oracle {
     }
     for (const std::string& path : below) {
       const std::string moved = to + path.substr(from.size());
-      data = Json::Value();
+      Json::Value data;
+      for (const std::string& name : fields) {
+        data[name] = moved.substr(0, moved.rfind('/'));
+      }
       data["KAVOMDPath"] = moved;
-      data["KAVOMDParent"] = moved.substr(0, moved.rfind('/'));
       Merge(path, data);
     }
   }
 
   void Other(const std::string& path) {
     if (random_() % 4 == 0) {
-      const std::string folders[] = {"/a", "/b", "/c"};
-      MoveFolder(folders[random_() % 3], folders[random_() % 3]);
+      const std::string folders[] = {"/a", "/b", "/c", "/a/b"};
+      MoveFolder(folders[random_() % 4], folders[random_() % 4]);
     }
     if (random_() % 4 == 0) {
       engine_.Restart();
     }
     if (random_() % 8 == 0) {
       ForgetFolders();
+    }
+    if (random_() % 4 == 0) {
+      while (engine_.Engine().CommitIdle(std::chrono::seconds(0))) {
+      }
     }
     const std::string below = path.substr(0, path.rfind('/')) + "/";
     if (random_() % 4 == 0) {
@@ -252,14 +277,25 @@ class Oracle {
   }
 
   // The paths of the documents with the word in one of the fields, if they end so.
-  std::string Having(const char* field, const std::string& word, const char* other = "",
+  std::string Having(const std::string& field, const std::string& word, const char* other = "",
                      const std::string& ending = "") const {
-    std::string paths;
-    for (const auto& [path, document] : documents_) {
+    return PathsIf(documents_, [&](const Json::Value& document) {
       const std::string texts = " " + document[field].asString() + " " + document[other].asString();
       // A long tail of the text makes its last word another one.
-      const bool has = (texts + " ").find(" " + word + " ") != std::string::npos;
-      if (has && path.ends_with(ending)) {
+      return (texts + " ").find(" " + word + " ") != std::string::npos &&
+             document["KAVOMDPath"].asString().ends_with(ending);
+    });
+  }
+  std::string HavingAncestor(const std::string& folder) const {
+    return PathsIf(documents_, [&](const Json::Value& document) {
+      return (document["KAVOMDSearchAncestor"].asString() + "/").starts_with(folder + "/");
+    });
+  }
+  static std::string PathsIf(const std::map<std::string, Json::Value>& documents,
+                             const std::function<bool(const Json::Value&)>& is_one) {
+    std::string paths;
+    for (const auto& [path, document] : documents) {
+      if (is_one(document)) {
         paths += (paths.empty() ? "" : " ") + path;
       }
     }
@@ -267,6 +303,7 @@ class Oracle {
   }
 
   std::mt19937 random_;
+  const bool has_odd_names_;
   EngineFixture engine_;
   std::map<std::string, Json::Value> documents_;
 };

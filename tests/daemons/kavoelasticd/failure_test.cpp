@@ -1,8 +1,5 @@
-#include <fcntl.h>
+// What the engine says and keeps when its files are damaged, or the disk and the database refuse.
 #include <gtest/gtest.h>
-#include <signal.h>
-#include <sqlite3.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <fstream>
@@ -11,116 +8,30 @@
 
 #include "daemons/kavoelasticd/engine_fixture.h"
 #include "support/faults.h"
+#include "support/private_mounts.h"
 #include "support/syslog_capture.h"
 
 namespace {
 
-FAULTABLE(int, rename, (const char* from, const char* to), (from, to))
 FAULTABLE(int, fsync, (int fd), (fd))
 
-// A process of its own that runs `work` and never cleans up. Its status.
-int InChild(const std::function<void()>& work) {
-  const pid_t child = fork();
-  if (child == 0) {
-    work();
-    _exit(0);
-  }
-  int status = -1;
-  waitpid(child, &status, 0);
-  return status;
-}
-
-TEST(Crash, WhatWasCommittedIsThere) {
-  for (const int killed_after : {1, 4, 15, 40, 90}) {
-    SCOPED_TRACE(killed_after);
-    EngineFixture engine;
-    engine.Add("/v/seed");
-    engine.Restart();
-    int pipes[2];
-    ASSERT_EQ(pipe2(pipes, O_CLOEXEC), 0);
-    const pid_t child = fork();
-    if (child == 0) {
-      engine.Restart();
-      for (int i = 0;; ++i) {
-        const std::string path = "/v/" + std::to_string(i);
-        engine.Add(path, R"({"KAVOMDTextContent":"word)" + std::to_string(i) + "\"}");
-        if (i > 0) {
-          engine.Send(
-              RenameRequest("/v/" + std::to_string(i - 1), "/moved/" + std::to_string(i - 1)));
-        }
-        if (engine.Do("commit") != "ok" || write(pipes[1], "c", 1) != 1) {
-          _exit(1);
-        }
-      }
-    }
-    close(pipes[1]);
-    for (int i = 0; i < killed_after; ++i) {
-      char byte = 0;
-      ASSERT_EQ(read(pipes[0], &byte, 1), 1);
-    }
-    kill(child, SIGKILL);
-    waitpid(child, nullptr, 0);
-    close(pipes[0]);
-    engine.Restart();
-    // At least as many rounds as were told of; the last path says how many.
-    const Json::Value left = engine.Documents(R"({"prefix":{"KAVOMDPath":"/v/"}})");
-    ASSERT_EQ(left.size(), 2U);
-    const int last = std::stoi(left[0]["KAVOMDFSName"].asString());
-    EXPECT_GE(last, killed_after - 1);
-    EXPECT_EQ(engine.Documents(R"({"prefix":{"KAVOMDPath":"/moved/"}})", R"({"size":1000})").size(),
-              static_cast<unsigned>(last));
-    for (int i = 0; i <= last; ++i) {
-      EXPECT_EQ(engine.Search(R"({"words":"word)" + std::to_string(i) + "\"}"),
-                (i < last ? "/moved/" : "/v/") + std::to_string(i));
-    }
-  }
-}
-
-TEST(Crash, AMoveCutShortIsSettledAtTheNextStart) {
-  for (const int nth : {1, 2, 3, 4}) {
-    SCOPED_TRACE(nth);
-    EngineFixture engine;
-    engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");
-    engine.Restart();
-    const int status = InChild([&] {
-      engine.Restart();
-      // Die at the nth rename: of the registry, the database, or the registry again.
-      const ScopedFault fault("rename", EIO, nth, /*lasting=*/true);
-      _exit(engine.Move(engine.Folder() / "new") == "ok" ? 0 : 1);
-    });
-    ASSERT_TRUE(WIFEXITED(status));
-    EXPECT_EQ(WEXITSTATUS(status), nth <= 3 ? 1 : 0);
-    engine.Restart();
-    EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
-  }
-}
-
-TEST(Crash, ADamagedIndexIsSetAsideUntilItIsMadeAnew) {
+TEST(EngineFailure, ADamagedIndexIsSetAsideUntilItIsMadeAnew) {
   struct Case {
     const char* name;
     std::function<void(const std::string&)> damage;
   };
-  const auto overwrite = [](off_t at, size_t count) {
-    return [at, count](const std::string& file) {
-      const int fd = open(file.c_str(), O_WRONLY | O_CLOEXEC);
-      EXPECT_EQ(pwrite(fd, std::string(count, '\x5a').data(), count, at),
-                static_cast<ssize_t>(count));
-      close(fd);
-    };
-  };
   const auto sql = [](const char* text) {
     return [text](const std::string& file) {
-      sqlite3* db = nullptr;
-      EXPECT_EQ(sqlite3_open(file.c_str(), &db), SQLITE_OK);
-      EXPECT_EQ(sqlite3_exec(db, text, nullptr, nullptr, nullptr), SQLITE_OK);
-      sqlite3_close(db);
+      using vexlo::elasticd::Connection;
+      Connection(file, Connection::Use::kWrite).Run(text);
     };
   };
   const Case cases[] = {
-      {"Header", overwrite(0, 100)},
-      {"APage", overwrite(8192 * 3, 8192)},
       {"Empty", [](const std::string& f) { std::ofstream(f, std::ios::trunc); }},
-      {"CutShort", [](const std::string& f) { EXPECT_EQ(truncate(f.c_str(), 8192 * 9), 0); }},
+      {"APage",
+       [](const std::string& f) {
+         std::fstream(f, std::ios::in | std::ios::out).seekp(8192 * 3) << std::string(8192, 'Z');
+       }},
       {"Gone", [](const std::string& f) { unlink(f.c_str()); }},
       {"AFolder", [](const std::string& f) { unlink(f.c_str()), mkdir(f.c_str(), 0755); }},
       {"AnotherDatabase", sql("DROP TABLE records")},
@@ -159,34 +70,14 @@ TEST(Crash, ADamagedIndexIsSetAsideUntilItIsMadeAnew) {
   }
 }
 
-TEST(Crash, ADamagedRegistryIsSetAside) {
-  EngineFixture engine;
-  const SyslogCapture log;
-  for (const std::string text : {"", "{\"indexes\":", "[]", "{\"indexes\":{\"i\":{\"path\":1}}}"}) {
-    WriteText(engine.Folder() / "registry.json", text);
-    engine.Restart();
-    EXPECT_EQ(engine.Do("commit"), "2002") << text;
-    EXPECT_EQ(engine.Create("i", engine.Folder() / "i"), "ok") << text;
-  }
-  EXPECT_EQ(ReadText(engine.Folder() / "registry.json.damaged-3"), "[]");
-}
-
-TEST(Crash, WhatTheDatabaseRefusesIsToldAtTheCommit) {
+TEST(EngineFailure, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   EngineFixture engine;
   SyslogCapture log;
   engine.Add("/v/before");
-  engine.Do("index_pause");
   // Stands for whatever one statement may be refused for.
-  sqlite3* db = nullptr;
-  ASSERT_EQ(sqlite3_open((engine.Folder() / "i/index.db").c_str(), &db), SQLITE_OK);
-  ASSERT_EQ(
-      sqlite3_exec(db,
-                   "CREATE TRIGGER refuse BEFORE INSERT ON records WHEN instr(new.record, 'bad')"
-                   " BEGIN SELECT RAISE(ABORT, 'refused'); END",
-                   nullptr, nullptr, nullptr),
-      SQLITE_OK);
-  sqlite3_close(db);
-  engine.Do("index_resume");
+  engine.ChangeDatabase(
+      "CREATE TRIGGER refuse BEFORE INSERT ON records WHEN instr(new.record, 'bad')"
+      " BEGIN SELECT RAISE(ABORT, 'refused'); END");
   const auto document = [](const std::string& path, const std::string& text) {
     return WriteRequest("document_upsert_by_id", path,
                         MakeDocument(path, R"({"KAVOMDTextContent":")" + text + "\"}"));
@@ -216,7 +107,27 @@ TEST(Crash, WhatTheDatabaseRefusesIsToldAtTheCommit) {
   EXPECT_EQ(engine.Query(R"({"prefix":{"KAVOMDPath":"/v"}})"), "/v/0 /v/1 /v/3 /v/6 /v/before");
 }
 
-TEST(Crash, ADocumentWhoseMoveTheDatabaseRefusesStaysAlone) {
+TEST(EngineFailure, AFullDiskIsToldAndTakesNothingThatIsCommitted) {
+  EngineFixture engine;
+  const SyslogCapture log;
+  const auto disk = ScopedMount::Tmpfs(engine.Folder() / "disk", "size=4m");
+  SKIP_IF_REFUSED(disk);
+  ASSERT_EQ(engine.Move(disk / "index"), "ok");
+  engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");
+  EXPECT_EQ(engine.Do("commit"), "ok");
+  std::ofstream filler(disk / "filler", std::ios::binary);
+  while (filler << std::string(4096, 'x') << std::flush) {
+  }
+  std::string answer = "ok";
+  for (int i = 0; i < 1000 && answer == "ok"; ++i) {
+    answer = i % 10 == 9 ? engine.Do("commit") : engine.Add("/v/" + std::to_string(i));
+  }
+  EXPECT_EQ(answer, "2010");
+  engine.Do("commit");  // May say that work was lost, but once only.
+  EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
+}
+
+TEST(EngineFailure, ADocumentThatCannotMoveStaysAlone) {
   EngineFixture engine;
   const SyslogCapture log;
   // What says where it was is written anew.
@@ -224,18 +135,17 @@ TEST(Crash, ADocumentWhoseMoveTheDatabaseRefusesStaysAlone) {
     engine.Add(path,
                R"({"KAVOMDTitle":"kept","Note":"/v/a","Quiet":")" + std::string(path) + "\"}");
   }
-  engine.Do("index_pause");
-  sqlite3* db = nullptr;
-  ASSERT_EQ(sqlite3_open((engine.Folder() / "i/index.db").c_str(), &db), SQLITE_OK);
-  ASSERT_EQ(
-      sqlite3_exec(db,
-                   "CREATE TRIGGER refuse BEFORE UPDATE ON records WHEN instr(new.record, 'bad')"
-                   " BEGIN SELECT RAISE(ABORT, 'refused'); END",
-                   nullptr, nullptr, nullptr),
-      SQLITE_OK);
-  sqlite3_close(db);
-  engine.Do("index_resume");
-  const Json::Value answer = engine.Send(
+  engine.ChangeDatabase(
+      "CREATE TRIGGER refuse BEFORE UPDATE ON records WHEN instr(new.record, 'bad')"
+      " BEGIN SELECT RAISE(ABORT, 'refused'); END");
+  // A folder is no number.
+  Json::Value answer =
+      engine.Send("document_move_below",
+                  Parsed(R"({"from":"/v/a","to":"/w","size":2,"folder_field":["KAVOMDFSSize"]})"));
+  EXPECT_EQ(answer["data"]["after"], "/v/a/bad");
+  ASSERT_EQ(answer["data"]["failed"].size(), 2U) << answer;
+  EXPECT_EQ(Answer(answer["data"]["failed"][0]), "2007");
+  answer = engine.Send(
       "document_move_below",
       Parsed(
           R"({"from":"/v/a","to":"/w","folder_field":["KAVOMDParent","KAVOMDSearchAncestor"]})"));
@@ -244,7 +154,7 @@ TEST(Crash, ADocumentWhoseMoveTheDatabaseRefusesStaysAlone) {
   EXPECT_EQ(engine.Search(R"({"words":"kept","sort":"path"})"), "/v/a/bad /w/1 /w/x");
 }
 
-TEST(Crash, AChangeOfTheRegistryThatCannotBeWrittenChangesNothing) {
+TEST(EngineFailure, AChangeOfTheRegistryThatCannotBeWrittenChangesNothing) {
   EngineFixture engine;
   const SyslogCapture log;
   engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");

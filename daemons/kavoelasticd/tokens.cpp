@@ -137,6 +137,14 @@ std::string_view Span(const std::vector<std::string_view>& characters, size_t fr
   return {begin, static_cast<size_t>(last.data() + last.size() - begin)};
 }
 
+// Of which grams are made. FTS5 ends what it gathers of a word at a NUL, and the index contradicts
+// itself then.
+std::string FoldWithoutNul(std::string_view text) {
+  std::string folded = Fold(text);
+  std::replace(folded.begin(), folded.end(), '\0', ' ');
+  return folded;
+}
+
 }  // namespace
 
 void WordCutter::StemmerDelete::operator()(sb_stemmer* stemmer) const {
@@ -289,7 +297,7 @@ bool IsSingleIdeograph(std::string_view text) {
 }
 
 void Grams(std::string_view text, const std::function<bool(std::string_view)>& sink) {
-  const std::string folded = Fold(text);
+  const std::string folded = FoldWithoutNul(text);
   const std::vector<std::string_view> characters = Characters(folded);
   for (size_t i = 0; i < characters.size(); ++i) {
     for (const size_t count : {2, 3}) {
@@ -304,7 +312,7 @@ void Grams(std::string_view text, const std::function<bool(std::string_view)>& s
 }
 
 std::vector<std::string> QueryGrams(std::string_view part, bool* begins) {
-  const std::string folded = Fold(part);
+  const std::string folded = FoldWithoutNul(part);
   const std::vector<std::string_view> characters = Characters(folded);
   *begins = characters.size() == 1;
   if (characters.size() <= 3) {

@@ -151,7 +151,8 @@ class Oracle {
 
   std::string Path() {
     const std::string folders[] = {"/a", "/b", "/a/b", "/c", "/a!", "/a0"};
-    const std::string names[] = {"/a", "/b", "/c", "/\xff", "/\u00e9", "/e\u0301", "/\n\"\\"};
+    const std::string names[] = {
+        "/a", "/b", "/c", "/\xff", "/\u00e9", "/e\u0301", {"/\n\"\\\0s", 6}};
     return folders[random_() % 6] + names[random_() % 4 + (has_odd_names_ ? 3 : 0)];
   }
 

@@ -78,8 +78,13 @@ bool ReadArguments(const std::vector<std::string>& arguments, ServiceOptions* op
 }
 
 Service::Service(ServiceOptions options) : options_(options), thread_([this] { Run(); }) {
-  folders_watch_.emplace(fileindex::kFileIndexFoldersLockPath.Get(),
-                         [this] { Post([this] { Settle(); }); });
+  folders_watch_.emplace(fileindex::kFileIndexFoldersLockPath.Get(), [this] {
+    Post([this] {
+      if (!settle_again_) {  // Which waits for a while, as settling itself takes the lock.
+        Settle();
+      }
+    });
+  });
 }
 
 Service::~Service() {

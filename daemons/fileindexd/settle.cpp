@@ -14,6 +14,7 @@
 #include "common/lock.h"
 #include "common/sdk/share.h"
 #include "daemons/common/log.h"
+#include "daemons/fileindexd/documents.h"
 #include "fileindex/elastic_control/share_index.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr/monitor.h"
@@ -98,6 +99,8 @@ void Watch(const std::string& share, FolderMgr& folders) {
 
 // The registration last, by which the rest is found again.
 void Forget(const std::string& share, const std::string& queue) {
+  // At once: the library would wait for it, and commands for the lock.
+  VEXLO_CHECK(EngineRun().empty(), ERR_ELASTIC_REQUEST, "the engine does not run");
   try {
     fileindex::elastic::ShareIndexDelete(share);
   } catch (const Error& error) {
@@ -135,6 +138,8 @@ void SettleFolders() {
     daemon::Log(daemon::Level::kNotice, VEXLO_SOURCE, __LINE__,
                 share + ": what its index left is removed, as a change of folders was cut short");
   }
+  VEXLO_CHECK(!FindUnsettled(folders).IsNothing(), ERR_SYSTEM,
+              "the registrations are others than they were made");
 }
 
 }  // namespace vexlo::fileindexd

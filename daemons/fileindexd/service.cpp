@@ -185,6 +185,7 @@ void Service::Run() {
     } catch (const std::exception& error) {
       daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
                   std::string("a command failed, reason=") + error.what());
+      SettleLater();  // All that commands are about follows from the list.
     }
     lock.Lock();
   }
@@ -196,12 +197,17 @@ void Service::Settle() {
     SettleFolders();
     settle_again_.reset();
     settle_wait_ = std::chrono::seconds(0);
-  } catch (const Error& error) {
-    settle_wait_ = NextWait(settle_wait_);
-    settle_again_ = std::chrono::steady_clock::now() + settle_wait_;
+  } catch (const std::exception& error) {
+    SettleLater();
     daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
                 std::string("the folders are not known or not settled, reason=") + error.what());
   }
+}
+
+void Service::SettleLater() {
+  folders_stamp_.clear();
+  settle_wait_ = NextWait(settle_wait_);
+  settle_again_ = std::chrono::steady_clock::now() + settle_wait_;
 }
 
 void Service::StartWorkers() {

@@ -55,6 +55,7 @@ class Service {
   void Run();
   // Completes what was left of a change of the folders, and gives each indexed share its worker.
   void Settle();
+  void SettleLater();
   void StartWorkers();
   void Create(const std::string& share);
   // With `unless_indexed` a share that has folders keeps its worker, which looks at everything

@@ -261,35 +261,7 @@ bool KeepToState() {
   return ForbidWriting(folders) != PathRule::kFailed;
 }
 
-// Ends the process when what is done meanwhile takes too long: libseccomp goes round in circles for
-// ever when it has no memory.
-class ShortWork {
- public:
-  ShortWork() {
-    struct sigaction action {};
-    action.sa_handler = End;
-    sigaction(SIGALRM, &action, nullptr);
-    alarm(kMostSeconds);
-  }
-  ~ShortWork() {
-    alarm(0);
-    signal(SIGALRM, SIG_DFL);
-  }
-  ShortWork(const ShortWork&) = delete;
-  ShortWork& operator=(const ShortWork&) = delete;
-
- private:
-  static constexpr unsigned kMostSeconds = 10;
-
-  static void End(int /*signal*/) {
-    constexpr char kText[] = "failed: rights cannot be given up in time\n";
-    (void)!write(STDERR_FILENO, kText, sizeof(kText) - 1);
-    _exit(kFailed);
-  }
-};
-
 void GiveUpRights(const DaemonOptions& options) {
-  const ShortWork limit;
   std::vector<int> capabilities = options.capabilities;
   if (geteuid() == 0 && !OwnsStateFolders()) {
     syslog(LOG_NOTICE,

@@ -14,7 +14,9 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <csignal>
 #include <cstdint>
+#include <cstdlib>
 #include <iterator>
 #include <memory>
 
@@ -229,6 +231,33 @@ bool Load(const Filter& filter, const Rules& rules) {
   return error == 0;
 }
 
+// Ends the process when what is done meanwhile takes too long: libseccomp goes round in circles for
+// ever when it has no memory.
+class ShortWork {
+ public:
+  ShortWork() {
+    struct sigaction action {};
+    action.sa_handler = End;
+    sigaction(SIGALRM, &action, nullptr);
+    alarm(kMostSeconds);
+  }
+  ~ShortWork() {
+    alarm(0);
+    signal(SIGALRM, SIG_DFL);
+  }
+  ShortWork(const ShortWork&) = delete;
+  ShortWork& operator=(const ShortWork&) = delete;
+
+ private:
+  static constexpr unsigned kMostSeconds = 10;
+
+  static void End(int /*signal*/) {
+    constexpr char kText[] = "failed: rights cannot be given up in time\n";
+    (void)!write(STDERR_FILENO, kText, sizeof(kText) - 1);
+    _exit(EXIT_FAILURE);
+  }
+};
+
 void AddMemory(Rules& rules) {
   for (const int call : {SCMP_SYS(mmap), SCMP_SYS(mmap2), SCMP_SYS(mprotect)}) {
     rules.Add(SCMP_ACT_ALLOW, call, {MaskedIs(2, PROT_EXEC, 0)});
@@ -321,6 +350,7 @@ bool ForbidAdministration() {
   for (const int call : kAdministration) {
     rules.Add(SCMP_ACT_ERRNO(EPERM), call);
   }
+  const ShortWork limit;
   return Load(filter, rules);
 }
 

@@ -38,7 +38,8 @@ bool KeepCapabilities(const std::vector<int>& kept);
 
 // Refuses (EPERM) the system calls that administer a machine whoever makes them: mounts, modules,
 // other kernels, clocks, quotas, tracing, namespaces, keys. No service of this kind has a use for
-// them, and CAP_SYS_ADMIN, where one must keep it, comes to less. False with errno.
+// them, and CAP_SYS_ADMIN, where one must keep it, comes to less. False with errno. Ends the
+// process (status 1) when that takes ten seconds.
 bool ForbidAdministration();
 
 // Whether the kernel lets the process be confined by path.

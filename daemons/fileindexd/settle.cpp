@@ -7,6 +7,8 @@
 #include <mutex>
 #include <set>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "common/check.h"
 #include "common/error.h"
@@ -23,6 +25,7 @@
 #include "fileindex/status_mgr.h"
 #include "fileindex/util/custom_event.h"
 #include "kavo/local/monitor_queues.h"
+#include "kavo/local/shares.h"
 
 namespace vexlo::fileindexd {
 namespace {
@@ -38,6 +41,19 @@ struct Unsettled {
 
   bool IsNothing() const { return unwatched.empty() && unlisted.empty(); }
 };
+
+// Not by SDKShare::Enum(), each call of which leaves its list behind.
+std::vector<std::string> ShareNames() {
+  std::vector<std::string> names;
+  try {
+    for (kavo::local::Share& share : kavo::local::ReadShares(kavo::local::SharesFile())) {
+      names.push_back(std::move(share.name));
+    }
+  } catch (const kavo::local::SharesError& error) {
+    throw Error(ERR_SHARE_ENUM, error.what());
+  }
+  return names;
+}
 
 // The full paths of the folders that are registered for the shares, by queues.
 std::map<std::string, std::set<std::string>> ReadRegistered() {
@@ -76,7 +92,7 @@ Unsettled FindUnsettled(const FolderMgr& folders) {
   const auto registered = ReadRegistered();
   const bool has_list = IsFileExist(fileindex::kFileIndexFoldersCfgPath.Get());
   Unsettled found;
-  for (const std::string& share : sdk::SDKShare::Enum()) {
+  for (const std::string& share : ShareNames()) {
     const std::string queue = sdk::SDKShare(share).GetQueuePath();
     const auto watched = registered.find(queue);
     if (folders.IsShareIndexed(share)) {

@@ -408,7 +408,10 @@ void Cycle::Reconcile(const std::string& root, const Json::Value& types, const c
   };
   deeds.is_gone = IsGone;
   deeds.remove = [this](std::vector<GoneList::Gone> gone) { Remove(gone); };
-  deeds.commit = [this] { Commit(); };
+  deeds.commit = [this] {
+    has_sent_ = true;  // What was found to be there may be what a killed run had not committed.
+    Commit();
+  };
   deeds.save = [this](const CrawlPoint& reached) {
     state_.crawl = reached;
     NoteGone();  // What goes on from there does not meet them again.

@@ -7,8 +7,10 @@
 #include "common/error.h"
 #include "common/sdk/share.h"
 #include "daemons/fileindexd/cycle.h"
+#include "daemons/fileindexd/documents.h"
 #include "daemons/kavoelasticd/engine_fixture.h"
 #include "faults/every_fault.h"
+#include "fileindex/comm.h"
 #include "fileindex/elastic_control/share_index.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/queue_mgr.h"
@@ -283,13 +285,17 @@ TEST(WorkFaults, ACycleAndItsCrawlAreDoneOrDoneAgain) {
 
 class Daemons : public testing::Environment {
  public:
+  void StartEngine() {
+    engine_ = std::make_unique<Program>("export FILEINDEX_ROOT=" + kRoot.Path(),
+                                        KAVOELASTICD_PROGRAM " 2>&1");
+    ASSERT_TRUE(engine_->Await("ready")) << engine_->text;
+  }
+  void KillEngine() { engine_->End(SIGKILL); }
   void SetUp() override {
     kRoot.MakeFolder("tmp");
     kRoot.MakeFolder("vol/keep");
     kRoot.MakeFolder("var/run");
-    engine_ = std::make_unique<Program>("export FILEINDEX_ROOT=" + kRoot.Path(),
-                                        KAVOELASTICD_PROGRAM " 2>&1");
-    ASSERT_TRUE(engine_->Await("ready")) << engine_->text;
+    StartEngine();
     indexer_ = std::make_unique<FakeEngine>(kRoot / "var/run/fileindexd.sock");
   }
   void TearDown() override {
@@ -301,6 +307,35 @@ class Daemons : public testing::Environment {
   std::unique_ptr<Program> engine_;
   std::unique_ptr<FakeEngine> indexer_;
 };
-const auto* const kDaemons = testing::AddGlobalTestEnvironment(new Daemons);
+auto* const kDaemons = static_cast<Daemons*>(testing::AddGlobalTestEnvironment(new Daemons));
+
+// A run that was killed had sent it, and a later one finds nothing that is missing.
+TEST(WorkFaults, AComparisonCommitsWhatItFound) {
+  Clear();
+  fs::remove_all(kIn);
+  WriteText(kRoot.MakeFolder("vol/docs/in") + "/a.txt", "q000000000000001");
+  ASSERT_EQ(Tool({"folder", "add", kIn}), 0);
+  usleep(100'000);  // Nothing is so young that it is read again.
+  vexlo::fileindexd::Stats stats;
+  vexlo::fileindexd::ShareState state;
+  const auto compare = [&] {
+    vexlo::fileindexd::Cycle cycle("docs", kDocs, "test", state, stats, [] { return false; });
+    cycle.ReconcileShare();
+    cycle.Finish();
+  };
+  compare();
+  WriteText(kIn + "/b.txt", "q000000000000002");
+  usleep(100'000);
+  for (const std::string& path : {kIn, kIn + "/b.txt"}) {
+    Json::Value reply;
+    vexlo::SendRequestImpl(reply,
+                           vexlo::fileindexd::MakePut("fileindex_docs", path, /*content=*/true));
+  }
+  compare();
+  kDaemons->KillEngine();
+  kDaemons->StartEngine();
+  const Listing index = ListIndex("docs", {"q000000000000001", "q000000000000002"});
+  EXPECT_EQ(Differences(ListDisk(kIn), index), "");
+}
 
 }  // namespace

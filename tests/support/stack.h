@@ -148,7 +148,10 @@ class Daemons {
   }
   // The index daemon's word on the share, and the notify daemon's on its queue; null without any.
   Json::Value Indexing() const { return Command(R"({"type":"stats","data":null})")["shares"][0]; }
-  Json::Value Watching() const { return Reply("evnotifyd", R"({"command":"stats"})")["queues"][0]; }
+  Json::Value Watching() const { return WatchedQueues()[0]; }
+  Json::Value WatchedQueues() const {
+    return Reply("evnotifyd", R"({"command":"stats"})")["queues"];
+  }
 
   // Waits until it holds, for as long as a busy machine may take.
   static bool Await(const std::function<bool()>& holds,

@@ -8,6 +8,7 @@
 #include <gtest/gtest.h>
 #include <sys/mman.h>
 
+#include <algorithm>
 #include <charconv>
 #include <cstdlib>
 #include <cstring>
@@ -338,14 +339,17 @@ class Torture {
     // A command that was cut short is made good first. Of a share without folders the watcher may
     // have appended a last line behind the removal of its queue.
     EXPECT_TRUE(Stack::Await([&] { return AreFoldersSettled(); })) << stack_.Logs();
-    usleep(300'000);
     if (!vexlo::fileindex::FolderMgr().HasFolder("/other")) {
       std::filesystem::remove(vexlo::sdk::SDKShare("other").GetQueuePath());
     }
     EXPECT_TRUE(stack_.AwaitQuiet()) << tree_.Text();
     std::string differences;
     const auto is_same = [&] {
-      differences = FindDifferences();
+      try {
+        differences = FindDifferences();
+      } catch (const vexlo::Error& error) {  // The index may be still to be made.
+        differences = error.what();
+      }
       return differences.empty();
     };
     EXPECT_TRUE(Stack::Await(is_same, std::chrono::seconds(90)))
@@ -367,7 +371,7 @@ class Torture {
     }
   }
 
-  // Whether those are watched that are listed, and no others.
+  // Whether those are registered that are listed, and no others, and the watcher knows.
   bool AreFoldersSettled() {
     const vexlo::fileindex::FolderMgr folders;
     std::set<std::string> listed;
@@ -382,7 +386,11 @@ class Torture {
         }
       }
     }
-    return listed == watched;
+    const std::string other = vexlo::sdk::SDKShare("other").GetQueuePath();
+    const Json::Value queues = stack_.WatchedQueues();
+    const bool feeds_other = std::any_of(queues.begin(), queues.end(),
+                                         [&](const Json::Value& q) { return q["queue"] == other; });
+    return listed == watched && !queues.empty() && feeds_other == folders.HasFolder("/other");
   }
 
   // False when it had to be killed by the clock.

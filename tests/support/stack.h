@@ -229,7 +229,8 @@ class Stack : public Daemons {
   // Waits until all that happened before the call is in the index: until a file that is made now is
   // found, then one that is made after that, as the watcher holds a rename back for some
   // milliseconds to see where it goes, and there is nothing left to do.
-  testing::AssertionResult AwaitQuiet() {
+  // `before_look` is called before each look at what is left.
+  testing::AssertionResult AwaitQuiet(const std::function<void()>& before_look = [] {}) {
     for (int i = 0; i < 2; ++i) {
       const std::string token = "marker" + std::to_string(++markers_);
       WriteText(In() + "/marker.txt", token);
@@ -237,7 +238,11 @@ class Stack : public Daemons {
         return testing::AssertionFailure() << token << " is not found\n" << Logs();
       }
     }
-    if (!Await([this] { return IsIdle(); })) {
+    const auto is_idle = [&] {
+      before_look();
+      return IsIdle();
+    };
+    if (!Await(is_idle)) {
       return testing::AssertionFailure() << "no end: " << vexlo::JsonToString(Indexing()) << Logs();
     }
     return testing::AssertionSuccess();

@@ -337,12 +337,16 @@ class Torture {
     while (!KillTool(kFolderMoments[tree_.Below(std::size(kFolderMoments))])) {
     }
     // A command that was cut short is made good first. Of a share without folders the watcher may
-    // have appended a last line behind the removal of its queue.
+    // append a last line behind the removal of its queue.
     EXPECT_TRUE(Stack::Await([&] { return AreFoldersSettled(); })) << stack_.Logs();
-    if (!vexlo::fileindex::FolderMgr().HasFolder("/other")) {
-      std::filesystem::remove(vexlo::sdk::SDKShare("other").GetQueuePath());
-    }
-    EXPECT_TRUE(stack_.AwaitQuiet()) << tree_.Text();
+    const auto remove_last_line = [] {
+      if (!vexlo::fileindex::FolderMgr().HasFolder("/other")) {
+        const std::string queue = vexlo::sdk::SDKShare("other").GetQueuePath();
+        std::filesystem::remove(queue);
+        std::filesystem::remove(queue + ".tmp");
+      }
+    };
+    EXPECT_TRUE(stack_.AwaitQuiet(remove_last_line)) << tree_.Text();
     std::string differences;
     const auto is_same = [&] {
       try {

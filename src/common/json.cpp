@@ -90,10 +90,13 @@ class BlockBuffer : public std::streambuf {
   size_t size_ = 0;
 };
 
+// A value that another program's reader made keeps its comments, which no text of one line may
+// have.
 Json::StreamWriter* NewWriter(const char* indentation) {
   Json::StreamWriterBuilder builder;
   builder["indentation"] = indentation;
   builder["emitUTF8"] = true;  // Every other form replaces bytes that are not UTF-8.
+  builder["commentStyle"] = *indentation == '\0' ? "None" : "All";
   return builder.newStreamWriter();
 }
 

@@ -1,6 +1,9 @@
 #include "fileindex/util/custom_event.h"
 
 #include <gtest/gtest.h>
+#include <json/reader.h>
+
+#include <sstream>
 
 #include "common/error.h"
 #include "common/json.h"
@@ -31,6 +34,8 @@ TEST(AddCustomEvent, AppendsOneLineOrNothing) {
   kRoot.SetShares(Share("s", "") + "," + Share("off", R"(, "encrypted": true)"));
   const std::string reindex = R"({"event":65536,"path":")" + kRoot / "v/s/a" + "\"}\n";
   const std::string whole = R"({"event":8,"path":"/x"})";
+  Json::Value data;  // As read by a program that keeps comments.
+  std::istringstream("/* two\n lines */ [\"x\" // one\n]") >> data;
   struct Row {
     const char *name, *share, *below;
     int event;
@@ -62,7 +67,7 @@ TEST(AddCustomEvent, AppendsOneLineOrNothing) {
     const SyslogCapture quiet;
     try {
       const ScopedFault fault(row.fails ? "write" : "", ENOSPC);
-      AddCustomEvent(row.event, path, "/old", vexlo::Vec2JsonArr<std::string>({"x"}));
+      AddCustomEvent(row.event, path, "/old", data);
       EXPECT_EQ(row.code, 0);
     } catch (const vexlo::Error& error) {
       EXPECT_EQ(error.GetErrorCode(), row.code);

@@ -137,6 +137,8 @@ std::string RefusalSentence(Refusal refusal, const std::string& server) {
       return "the request is too long";
     case Refusal::kNotAdmitted:
       return "only root and the user of " + server + " may ask this";
+    case Refusal::kStopping:
+      return server + " is ending";
     case Refusal::kHandlerFailed:
       break;
   }
@@ -717,6 +719,12 @@ bool FrameServer::FinishStop() {
   if (open_ > 0) {
     Log(Level::kWarning, VEXLO_SOURCE, __LINE__,
         "stopped with " + std::to_string(open_) + " connections not served to the end");
+  }
+  const std::string refusal = options_.refusal ? options_.refusal(Refusal::kStopping) : "";
+  for (const std::unique_ptr<Connection>& job : jobs_) {
+    if (!refusal.empty()) {
+      SendFrame(job->fd.Get(), refusal, job->sent);  // Which a fresh socket takes whole.
+    }
   }
   jobs_.clear();
   ending_ = true;

@@ -27,6 +27,7 @@ enum class Refusal {
   kTooLong,        // Over max_request_bytes; nothing of it was kept.
   kHandlerFailed,  // The handler threw. Logged.
   kNotAdmitted,    // The client's user may not ask anything.
+  kStopping,       // The server ends before it came to the request.
 };
 
 // What is said of it to people, about "the engine" or another `server`.

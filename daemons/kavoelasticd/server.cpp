@@ -34,6 +34,9 @@ std::string ErrorText(int code, const std::string& message) {
 std::string SearchSocketPath() { return kavo::local::Root() + "/var/run/kavoelasticd.search.sock"; }
 
 std::string RefusalText(daemon::Refusal refusal) {
+  if (refusal == daemon::Refusal::kStopping) {
+    return "";  // Callers ask the next run where they find the connection closed.
+  }
   return ErrorText(refusal == daemon::Refusal::kHandlerFailed ? ERR_INTERNAL : ERR_BAD_PARAMETER,
                    RefusalSentence(refusal, "the engine"));
 }

@@ -5,9 +5,13 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <fstream>
+#include <iterator>
 #include <random>
+#include <sstream>
 
 #include "common/check.h"
 #include "common/error.h"
@@ -33,6 +37,38 @@ bool IsInSharedFolder(const std::string& path) {
          (info.st_mode & S_IWOTH) != 0;
 }
 
+bool IsProcessOfRoot(const std::string& process) {
+  std::ifstream status("/proc/" + process + "/status");
+  for (std::string line; std::getline(status, line);) {
+    if (line.starts_with("Uid:")) {
+      // Real, effective, saved and of file accesses: a handler may act for a user at the moment.
+      std::istringstream ids(line.substr(strlen("Uid:")));
+      return std::find(std::istream_iterator<uid_t>(ids), {}, 0U) != std::istream_iterator<uid_t>();
+    }
+  }
+  return false;
+}
+
+// Whether a process of root's has an flock on the file, as far as the kernel's list tells.
+bool IsHeldByRoot(const std::string& path) {
+  struct stat info {};
+  if (lstat(path.c_str(), &info) != 0) {
+    return false;
+  }
+  // The device there is not always that of stat(); one file too many does no harm.
+  const std::string inode = ":" + std::to_string(info.st_ino);
+  std::ifstream locks("/proc/locks");
+  for (std::string line; std::getline(locks, line);) {
+    std::istringstream fields(line);
+    std::string number, kind, manner, access, process, file;
+    fields >> number >> kind >> manner >> access >> process >> file;
+    if (kind == "FLOCK" && file.ends_with(inode) && IsProcessOfRoot(process)) {
+      return true;
+    }
+  }
+  return false;
+}
+
 // Lets root, who is not to be kept from its work, remove what another user has put in a shared
 // folder under the lock's name: a link (a second name of some file is one), or a file of that
 // user's. True when the path is free by it.
@@ -50,12 +86,26 @@ bool RemovePlanted(const std::string& path) {
 }
 
 // Opening without O_CREAT first: with fs.protected_regular set, the kernel refuses even root an
-// O_CREAT on another user's file in a sticky directory such as /tmp.
+// O_CREAT on another user's file in a sticky directory such as /tmp. Leaves errno when it succeeds.
 int OpenWithoutLinks(const char* path) {
   // O_NONBLOCK keeps a FIFO planted at the path from holding us up; it means nothing to a file.
   constexpr int kFlags = O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK;
-  const int fd = open(path, kFlags);
-  return fd < 0 && errno == ENOENT ? open(path, kFlags | O_CREAT, 0644) : fd;
+  const int before = errno;
+  int fd = open(path, kFlags);
+  if (fd < 0 && errno == ENOENT) {
+    fd = open(path, kFlags | O_CREAT, 0644);
+    if (fd < 0 && errno == EACCES) {  // Somebody else has made it meanwhile.
+      fd = open(path, kFlags);
+    }
+  }
+  struct stat info {};
+  if (fd >= 0 && fstat(fd, &info) == 0 && S_ISDIR(info.st_mode)) {
+    close(fd);
+    fd = -1;
+    errno = EISDIR;
+  }
+  errno = fd < 0 ? errno : before;
+  return fd;
 }
 
 // A second name in a shared folder leads to a file that has nothing to do with the lock, and which
@@ -113,7 +163,8 @@ LockMutex::~LockMutex() {
 }
 
 LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(path) {
-  for (int attempt = 0; attempt < kMaxAttempts || (attempt == kMaxAttempts && RemovePlanted(path_));
+  const auto may_go_on = [this] { return !IsHeldByRoot(path_) && RemovePlanted(path_); };
+  for (int attempt = 0; attempt < kMaxAttempts || (attempt == kMaxAttempts && may_go_on());
        ++attempt) {
     fd_ = OpenLockFile(path_);
     VEXLO_CHECK_AT((LogSite{VEXLO_SOURCE, __LINE__, __func__,

@@ -2,12 +2,15 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <signal.h>
 #include <sys/file.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 
 #include <algorithm>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <vector>
 
 #include "common/error.h"
@@ -88,6 +91,10 @@ TEST(Lock, WhatCannotBeOpenedOrLockedFailsAtOnce) {
   EXPECT_EQ(Failure(kFolder / "no/lock", true),
             "open failed, path=" + (kFolder / "no/lock") + ", reason=No such file or directory");
   EXPECT_NE(Failure(kFolder / "link", true), "");
+  EXPECT_NE(Failure(kFolder.Path(), true), "");
+  errno = 0;
+  EXPECT_EQ(Failure(kFolder / "made", true), "");
+  EXPECT_EQ(errno, 0) << "or log lines would tell of it";
   EXPECT_EQ(Failure(kFolder / "fifo", true), "") << "or waited for a writer";
   const ScopedFault fault("flock", ENOLCK);
   EXPECT_EQ(Failure(kPath, true), "No locks available");
@@ -114,21 +121,31 @@ TEST(Lock, NobodyKeepsRootFromALockInASharedFolder) {
     std::function<bool()> plants;
     std::string for_all;  // Why anybody else fails; "" when they do not.
     uid_t owner;
-    bool holds;  // For ever.
-    bool fails;  // Even root.
+    std::optional<uid_t> holder;  // A process of the user's, for ever.
+    bool fails;                   // Even root.
   } rows[] = {
-      {"a link", links, "Too many levels of symbolic links", kSomebody, false, false},
-      {"a name of another file", names, "Too many links", 0, false, false},
-      {"a pipe", pipes, "", kSomebody, false, false},
-      {"their file, held", writes, "Exceed max retry", kSomebody, true, false},
-      {"our file, held", writes, "Exceed max retry", 0, true, true},
+      {"a link", links, "Too many levels of symbolic links", kSomebody, {}, false},
+      {"a name of another file", names, "Too many links", 0, {}, false},
+      {"a pipe", pipes, "", kSomebody, {}, false},
+      {"their file, held", writes, "Exceed max retry", kSomebody, kSomebody, false},
+      {"their file, held by root", writes, "Exceed max retry", kSomebody, 0, true},
+      {"our file, held", writes, "Exceed max retry", 0, kSomebody, true},
   };
   for (const auto& row : rows) {
     SCOPED_TRACE(row.name);
     WriteText(victim, "precious");
     ASSERT_TRUE(row.plants() && lchown(lock.c_str(), row.owner, row.owner) == 0);
-    const int held = open(lock.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK);
-    ASSERT_TRUE(!row.holds || flock(held, LOCK_EX) == 0);
+    int ready[2];
+    ASSERT_EQ(pipe(ready), 0);
+    const pid_t holder = row.holder ? fork() : -1;
+    if (holder == 0) {
+      const bool holds = setresuid(*row.holder, *row.holder, *row.holder) == 0 &&
+                         flock(open(lock.c_str(), O_RDONLY), LOCK_EX) == 0;
+      (void)!write(ready[1], holds ? "y" : "n", 1);
+      pause();
+    }
+    char holds = 'y';
+    ASSERT_TRUE(!row.holder || (read(ready[0], &holds, 1) == 1 && holds == 'y'));
     ASSERT_EQ(seteuid(kSomebody + 1), 0);
     const std::string reason = Failure(lock, /*exclusive=*/true);
     ASSERT_EQ(seteuid(0), 0);
@@ -137,7 +154,12 @@ TEST(Lock, NobodyKeepsRootFromALockInASharedFolder) {
         << reason;
     EXPECT_EQ(!Failure(lock, /*exclusive=*/true).empty(), row.fails);
     EXPECT_EQ(ReadText(victim), "precious");
-    close(held);
+    if (row.holder) {
+      kill(holder, SIGKILL);
+      waitpid(holder, nullptr, 0);
+    }
+    close(ready[0]);
+    close(ready[1]);
     unlink(lock.c_str());
   }
 }

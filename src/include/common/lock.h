@@ -58,7 +58,8 @@ class VEXLO_THREAD_ATTRIBUTE(scoped_lockable) VEXLO_EXPORT LockMutex {
 //
 // In a folder where everybody may make files, such as /tmp, others may get at the path first. A
 // link there is never followed. Root removes one, and removes a file of another user's when it
-// cannot be locked in the time below; for anybody else it is an error. Whoever may read a file may
+// cannot be locked in the time below and no process of root's holds it; for anybody else it is an
+// error. Whoever may read a file may
 // hold its lock, so one that root made can be held by others for ever, and each attempt is an error
 // then.
 //

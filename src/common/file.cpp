@@ -80,15 +80,16 @@ std::string FolderOf(const std::string& path) {
 
 bool SyncFolder(const std::string& folder) {
   const ScopedFd fd(open(folder.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  return fd.IsOpen() && fsync(fd.Get()) == 0;
+  // A file system that has no such thing for folders is as safe as it can be.
+  return fd.IsOpen() && (fsync(fd.Get()) == 0 || errno == EINVAL);
 }
 
 // Gives the new file mode 0644 and, best effort, the owner of the file that it replaces.
 bool DressLike(int fd, const std::string& path) {
   struct stat old {};
-  if (lstat(path.c_str(), &old) == 0 && S_ISREG(old.st_mode) &&
-      fchown(fd, old.st_uid, old.st_gid) != 0 && errno != EPERM) {
-    return false;
+  if (lstat(path.c_str(), &old) == 0 && S_ISREG(old.st_mode)) {
+    // Not permitted, or in a user namespace or on a network file system not possible.
+    (void)!fchown(fd, old.st_uid, old.st_gid);
   }
   return fchmod(fd, 0644) == 0;
 }
@@ -130,8 +131,9 @@ bool IsFileExist(const std::string& path) {
 
 bool MayFileExist(const std::string& path) {
   struct stat info {};
-  return lstat(path.c_str(), &info) == 0 ? S_ISREG(info.st_mode)
-                                         : errno != ENOENT && errno != ENOTDIR;
+  return lstat(path.c_str(), &info) == 0
+             ? S_ISREG(info.st_mode)
+             : errno != ENOENT && errno != ENOTDIR && errno != ENAMETOOLONG;
 }
 
 bool IsDirExist(const std::string& path, bool follow_link) {

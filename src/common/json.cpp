@@ -96,7 +96,7 @@ Json::StreamWriter* NewWriter(const char* indentation) {
   Json::StreamWriterBuilder builder;
   builder["indentation"] = indentation;
   builder["emitUTF8"] = true;  // Every other form replaces bytes that are not UTF-8.
-  builder["commentStyle"] = *indentation == '\0' ? "None" : "All";
+  builder["commentStyle"] = "None";
   return builder.newStreamWriter();
 }
 
@@ -174,7 +174,17 @@ void AppendJsonText(std::string& out, std::string_view text) {
 
 std::string JsonToStyledString(const Json::Value& value) {
   const std::unique_ptr<Json::StreamWriter> writer(NewWriter("   "));
-  return Write(value, *writer) + "\n";
+  const std::string text = Write(value, *writer);
+  std::string styled;
+  styled.reserve(text.size() + 1);
+  // What takes several lines begins behind its name, and not on the next line. No string of the
+  // text has a line break in it.
+  size_t from = 0;
+  for (size_t at = 0; (at = text.find(" : \n", from)) != std::string::npos;) {
+    styled.append(text, from, at + 3 - from);
+    from = text.find_first_not_of(' ', at + 4);
+  }
+  return styled.append(text, from) + "\n";
 }
 
 bool JsonToFile(const Json::Value& value, const std::string& path) {
@@ -273,7 +283,7 @@ void JsonApplyChanges(Json::Value& target, const Json::Value& changes) {
   for (auto change = changes.begin(); change != changes.end(); ++change) {
     const std::string name = change.name();
     if (change->isNull()) {
-      target.removeMember(name);
+      target.removeMember(name.data(), name.data() + name.size(), nullptr);  // A NUL is part of it.
     } else if (change->isObject()) {
       Json::Value& member = target[name];
       if (!member.isObject()) {

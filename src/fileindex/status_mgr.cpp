@@ -85,7 +85,7 @@ void StatusMgr::UnsetShareStatus(const std::string& share, int bits) {
 void StatusMgr::ClearShareStatus(const std::string& share) {
   const LockFile lock(kFileIndexStatusLockPath.Get(), /*exclusive=*/true);
   if (GetShares().isMember(share)) {
-    data_["share"].removeMember(share);
+    data_["share"].removeMember(share.data(), share.data() + share.size(), nullptr);
   }
   Save();
 }

@@ -79,6 +79,7 @@ TEST(Json, ChangesAreMerged) {
       {R"({"a":1,"b":{"d":2}})", R"({"a":null,"b":{"c":1}})", R"({"b":{"c":1,"d":2}})"},
       {R"({"a":1})", R"({"a":{"x":{"y":null}}})", R"({"a":{"x":{}}})"},
       {"null", R"({"a":1})", R"({"a":1})"},
+      {R"({"k":1,"k\u0000x":2})", R"({"k\u0000x":null})", R"({"k":1})"},
       {R"({"a":1})", "[1]", ""},
       {"[1]", "{}", ""},
   };
@@ -92,6 +93,12 @@ TEST(Json, ChangesAreMerged) {
       EXPECT_EQ(value, Parse(target));
     }
   }
+}
+
+TEST(Json, StyledTextHasEachValueBehindItsName) {
+  EXPECT_EQ(JsonToStyledString(Parse(R"({"a":[1,"x"],"b":{"c":[{"d":" : "}],"e":{}}})")),
+            "{\n   \"a\" : [ 1, \"x\" ],\n   \"b\" : {\n      \"c\" : [\n         {\n"
+            "            \"d\" : \" : \"\n         }\n      ],\n      \"e\" : {}\n   }\n}\n");
 }
 
 }  // namespace vexlo

@@ -29,8 +29,8 @@ VEXLO_EXPORT bool JsonFromFile(Json::Value& value, const std::string& path);
 // One line without its newline: for queue lines and requests.
 VEXLO_EXPORT std::string JsonToString(const Json::Value& value);
 
-// Appends `text` as JSON writes it, in quotes: what JsonToString() gives for a string value, for
-// those who write many lines of a fixed form.
+// Appends `text` as JSON, in quotes, for those who write many lines of a fixed form. It reads the
+// same as what JsonToString() gives for a string value, with control characters by their numbers.
 VEXLO_EXPORT void AppendJsonText(std::string& out, std::string_view text);
 
 // Indented, with a newline at the end: for reasons, log lines and files.

@@ -142,6 +142,10 @@ int KLIBShareIsReadOnlyGet(const struct KAVO_SHARE* share, int* is_read_only) {
   return Ask(share, is_read_only, [](const Share& found, bool& is_true) {
     struct statvfs info {};
     if (!found.read_only && statvfs(found.path.c_str(), &info) != 0) {
+      if (found.encrypted && errno == ENOENT) {
+        is_true = false;  // The folder of a locked share need not be there.
+        return 0;
+      }
       return kavo::local::SetLastError(KAVO_ERR_SYSTEM);
     }
     is_true = found.read_only || (info.f_flag & ST_RDONLY) != 0;

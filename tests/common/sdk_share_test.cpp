@@ -122,6 +122,11 @@ TEST_F(Share, AFailedQuestionIsThrownAndMayBeAskedAgain) {
   }
 }
 
+TEST_F(Share, ANameIsTakenWhole) {
+  const SyslogCapture quiet;
+  EXPECT_THROW(SDKShare(std::string("plain\0x", 7)), Error);
+}
+
 TEST_F(Share, WhatIsCachedStaysWhenTheShareIsGone) {
   EXPECT_EQ(SDKShare::Enum().size(), 6U);
   const SDKShare share("plain");

@@ -144,6 +144,7 @@ TEST_F(Shares, SettingsAreThoseOfThePresentFile) {
     EXPECT_EQ(settings(photo.get()), "00100") << "the flag needs no file system";
     EXPECT_EQ(settings(Get("homes").get()), "00-10");
     EXPECT_EQ(KLIBCErrGet(), KAVO_ERR_SYSTEM);
+    EXPECT_EQ(settings(Get("mounted").get()), "10001") << "its folder may be away while locked";
   }
   EXPECT_EQ(Get("Photo"), nullptr);
   EXPECT_EQ(KLIBCErrGet(), KAVO_ERR_NOT_FOUND);

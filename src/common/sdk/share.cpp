@@ -27,6 +27,8 @@ constexpr int kListBytes = 1024;
 
 SDKShare::SDKShare(const std::string& share_name) : name_(share_name) {
   const LockMutex lock(SDKMutex());
+  // Of which the platform would see the part before the NUL, which is another share.
+  VEXLO_CHECK(share_name.find('\0') != std::string::npos, ERR_SHARE_NOT_FOUND, share_name);
   VEXLO_CHECK(0 > KAVOShareGet(share_name.c_str(), &share_info_) || !share_info_,
               ERR_SHARE_NOT_FOUND, share_name);
 }

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <iterator>
 #include <utility>
 
 #include "common/check.h"
@@ -226,8 +227,13 @@ std::shared_ptr<Folder> FolderMgr::At(size_t place) const {
 
 template <typename Matches>
 void FolderMgr::Erase(Matches matches) {
+  std::vector<std::shared_ptr<Folder>> rest;
+  rest.reserve(folders_.size());
+  // A folder whose share cannot be told throws, and the list stays as it was.
+  std::copy_if(folders_.begin(), folders_.end(), std::back_inserter(rest),
+               [&](const auto& folder) { return !matches(*folder); });
   index_ = nullptr;
-  std::erase_if(folders_, [&](const auto& folder) { return matches(*folder); });
+  folders_ = std::move(rest);
 }
 
 }  // namespace vexlo::fileindex

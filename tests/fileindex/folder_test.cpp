@@ -123,6 +123,13 @@ TEST(FolderMgr, TellsWhatAChangeMeansForAPath) {
   }
 }
 
+TEST(FolderMgr, StaysWholeWhenAShareCannotBeTold) {
+  SetShares();
+  FolderMgr manager = Loaded({Data("/p/a", "d"), Data("/m", "d"), Data("bad", "d")});
+  EXPECT_EQ(Caught([&] { manager.DeleteByShare("p"); }).substr(0, 3), "120");
+  EXPECT_EQ(Paths(manager.GetFolders()), "/p/a /m bad ");
+}
+
 TEST(FolderMgr, AnswersByTheDeepestFolderThatCovers) {
   SetShares();
   const std::string volume = kRoot / "v1";

@@ -93,6 +93,19 @@ TEST_F(Tree, RenameIntoItselfEnds) {
   EXPECT_EQ(result.delivered, std::vector<std::string>{"[07] "});
 }
 
+TEST_F(Tree, AReindexCancelsWhatWasPutBelowByHand) {
+  Put({});
+  OPTree tree(queue);
+  const auto child = tree.GetNodeByPath("/a/b");
+  for (const int kind : {OP_NONE, OP_DELETE, OP_UPSERT, OP_ATTR, OP_UPDATE_DIRECTORY, OP_RENAME,
+                         OP_REINDEX, OP_QUEUE_CRASHED}) {
+    child->ops = {std::make_shared<OP>(child, static_cast<FileIndexOP>(kind))};
+    const auto parent = tree.GetNodeByPath("/a");
+    tree.HandleReindex(parent, std::make_shared<OP>(parent, OP_NONE));
+    EXPECT_EQ(child->ops[0]->op, kind == OP_RENAME ? OP_RENAME : OP_NONE) << kind;
+  }
+}
+
 TEST_F(Tree, BadPathsLeaveTheirNodesAndWalksGoBelowFirst) {
   Put({});
   OPTree tree(queue);

@@ -21,7 +21,8 @@ namespace {
 
 constexpr uint64_t kLinesBetweenProgress = 4096;
 constexpr int kDebugLevel = 7;
-// Of paths that overlapping renames of one tree may make: enough for any that come to an end.
+// Of paths that overlapping renames of one tree may make. The kernel knows no such renames; a queue
+// with more is damaged, and some would go on for ever.
 constexpr uint64_t kMostOverlappingBytes = uint64_t{4} * 1024 * 1024;
 
 // A kind that no rule looks at or changes.
@@ -120,7 +121,7 @@ OPTree::~OPTree() {
 
 void OPTree::BuildTree() {
   literal_ = !ops.empty() || !root->children.empty();
-  folders_ = literal_ ? nullptr : std::make_shared<FolderCache>();
+  folders_ = std::make_shared<FolderCache>();
   ReadQueue();
   if (must_start_over_) {
     must_start_over_ = false;
@@ -130,7 +131,7 @@ void OPTree::BuildTree() {
     crashed = false;
     ops.clear();
     root = std::make_shared<OPNode>(nullptr, "");
-    folders_ = nullptr;
+    folders_ = std::make_shared<FolderCache>();
     literal_ = true;
     ReadQueue();
   }
@@ -424,9 +425,11 @@ void OPTree::Handle(Handler handler, OPNode& node, const std::shared_ptr<OP>& op
     // It may be pending already, and a rename may have moved it.
     SetMarks(*holder, MarksOf(op->op));
   }
+  Unsettle(node);
   ApplyRules(handler, node, op->data, op.get());
   if (handler == Handler::kReindex) {
-    CancelBelow(node);  // Also what is about to be added, where a rename took it there.
+    // Also what is about to be added, where a rename took it there.
+    folders_ == nullptr ? CancelAllBelow(node) : CancelBelow(node);
   }
   if (op->op != OP_NONE) {
     Add(op);
@@ -435,9 +438,10 @@ void OPTree::Handle(Handler handler, OPNode& node, const std::shared_ptr<OP>& op
 
 // Handle() for an operation that nobody else holds.
 void OPTree::HandleNew(Handler handler, OPNode& node, const Json::Value& data) {
+  Unsettle(node);
   const bool survives = ApplyRules(handler, node, data, /*added=*/nullptr);
   if (handler == Handler::kReindex) {
-    CancelBelow(node);
+    folders_ == nullptr ? CancelAllBelow(node) : CancelBelow(node);
   }
   if (survives) {
     const std::shared_ptr<OP> op = NewOP(node, kKindOf[static_cast<size_t>(handler)]);
@@ -488,6 +492,32 @@ bool OPTree::ApplyRules(Handler handler, OPNode& node, const Json::Value& data, 
   return survives;
 }
 
+void OPTree::CancelPending(OPNode& node) {
+  for (size_t i = node.settled_ops_; i < node.ops.size(); ++i) {
+    if (node.ops[i]->op != OP_RENAME) {
+      node.ops[i]->op = OP_NONE;
+    }
+  }
+}
+
+// Marks and the settled operations do not tell of what callers change by hand, which they may do
+// while no file is read.
+void OPTree::Unsettle(OPNode& node) const {
+  if (folders_ == nullptr) {
+    node.settled_ops_ = 0;
+  }
+}
+
+void OPTree::CancelAllBelow(OPNode& node) {
+  TraverseNodeDescendant(
+      node.shared_from_this(),
+      [this](const std::shared_ptr<OPNode>& child) {
+        Unsettle(*child);
+        CancelPending(*child);
+      },
+      /*skip_self=*/true);
+}
+
 void OPTree::CancelBelow(OPNode& node) {
   if (node.children.empty()) {
     return;
@@ -497,11 +527,7 @@ void OPTree::CancelBelow(OPNode& node) {
     OPNode& parent = *marked.back();
     marked.pop_back();
     TakeMarkedChildren(parent, kCancellable, [&marked](OPNode& child) {
-      for (size_t i = child.settled_ops_; i < child.ops.size(); ++i) {
-        if (child.ops[i]->op != OP_RENAME) {
-          child.ops[i]->op = OP_NONE;
-        }
-      }
+      CancelPending(child);
       marked.push_back(&child);
     });
   }
@@ -517,6 +543,8 @@ void OPTree::Rename(OPNode& node, std::string_view new_path, const std::shared_p
     return;
   }
   op->op = OP_RENAME;
+  Unsettle(node);
+  Unsettle(source);
   // What was pending for the old occupant of the new path is void.
   for (size_t i = node.settled_ops_; i < node.ops.size(); ++i) {
     OP& pending = *node.ops[i];

@@ -45,8 +45,8 @@ class VEXLO_EXPORT OPTree {
 
   // Reads `queue_path` line by line and inserts each event. A line that cannot be inserted (906 not
   // JSON or longer than kMaxQueueLineBytes, 120 a member missing or mistyped, 9999 a path that is
-  // not absolute and normalised) is logged and skipped. Throws Error 502 when the file cannot be
-  // opened or read.
+  // not absolute or has an empty part) is logged and skipped. Throws Error 502 when the file cannot
+  // be opened or read.
   void BuildTree();
 
   // Folds one event into the pending operations. Throws Error 9999 as GetNodeByPath() does, or 120
@@ -65,8 +65,8 @@ class VEXLO_EXPORT OPTree {
   void HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
   void HandleUpdateDirectory(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
 
-  // The node of an absolute, normalised path ("" is the root), made with its parents when missing.
-  // Throws Error 9999 for any other path; the nodes that were made on the way stay.
+  // The node of an absolute path without empty parts ("" is the root), made with its parents when
+  // missing. Throws Error 9999 for any other path; the nodes that were made on the way stay.
   std::shared_ptr<OPNode> GetNodeByPath(const std::string& path);
 
   // Calls `fn` on every node below `node` and then, unless `skip_self`, on `node`: each node after
@@ -95,7 +95,7 @@ class VEXLO_EXPORT OPTree {
   // What may still happen to the operations on and below a node. A node that carries a mark is
   // known to its parent, which carries it too, up to the root: so a walk meets marked nodes alone,
   // and a reindex of a folder with nothing pending below costs nothing. A mark may be out of date
-  // (the operation was cancelled meanwhile), never missing.
+  // (the operation was cancelled meanwhile), never missing, but for what callers add by hand.
   enum Mark : uint8_t {
     kCancellable = 1,  // A reindex above would cancel something here.
     kMovable = 2,      // A rename above would move something from here.
@@ -124,6 +124,9 @@ class VEXLO_EXPORT OPTree {
   // which `added` points to if it exists already. `data` may be its own.
   static bool ApplyRules(Handler handler, OPNode& node, const Json::Value& data, OP* added);
   static void CancelBelow(OPNode& node);
+  static void CancelPending(OPNode& node);
+  void CancelAllBelow(OPNode& node);
+  void Unsettle(OPNode& node) const;
 
   void Rename(OPNode& node, std::string_view new_path, const std::shared_ptr<OP>& op,
               bool may_trade);
@@ -152,7 +155,9 @@ class VEXLO_EXPORT OPTree {
   uint64_t overlapping_bytes_ = 0;  // Of paths made for such renames.
 
   std::function<void(const Progress&)> on_progress_;
-  std::shared_ptr<FolderCache> folders_;  // While BuildTree() runs, unless it walks every node.
+  // There while BuildTree() runs, when nobody changes operations by hand; empty while it walks
+  // every node.
+  std::shared_ptr<FolderCache> folders_;
 
   // What was read before BuildTree() started over, so that nothing is logged twice.
   uint64_t reported_lines_ = 0;

@@ -17,6 +17,7 @@
 #include "common/string.h"
 #include "daemons/common/no_memory.h"
 #include "daemons/common/unique_fd.h"
+#include "daemons/fileindexd/file_version.h"
 #include "fileindex/comm.h"
 #include "fileindex/elastic_control/schema.h"
 #include "fileindex/paths.h"
@@ -341,12 +342,7 @@ bool IsGone(const std::string& path) {
 
 std::string EngineRun() {
   // Each run makes its socket anew.
-  struct stat info {};
-  if (lstat(fileindex::kElasticdSocketPath.Get().c_str(), &info) != 0) {
-    return "";
-  }
-  return std::to_string(info.st_ino) + "-" + std::to_string(info.st_ctim.tv_sec) + "." +
-         std::to_string(info.st_ctim.tv_nsec);
+  return FileVersion(fileindex::kElasticdSocketPath.Get());
 }
 
 std::vector<FailedItem> SendList(Json::Value requests) {

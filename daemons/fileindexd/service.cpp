@@ -1,7 +1,6 @@
 #include "daemons/fileindexd/service.h"
 
 #include <linux/capability.h>
-#include <sys/stat.h>
 
 #include <cerrno>
 #include <charconv>
@@ -14,6 +13,7 @@
 #include "daemons/common/frame_server.h"
 #include "daemons/common/log.h"
 #include "daemons/fileindexd/consequence.h"
+#include "daemons/fileindexd/file_version.h"
 #include "daemons/fileindexd/settle.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/paths.h"
@@ -53,11 +53,10 @@ std::string ShareOf(const Json::Value& data) {
 // Another text after each change of the list of folders, which is replaced.
 std::string StampOfFolders() {
   const std::string path = fileindex::kFileIndexFoldersCfgPath.Get();
-  struct stat info {};
-  VEXLO_CHECK(lstat(path.c_str(), &info) != 0 && errno != ENOENT && errno != ENOTDIR, ERR_LOAD,
+  const std::string version = FileVersion(path);
+  VEXLO_CHECK(version.empty() && errno != ENOENT && errno != ENOTDIR, ERR_LOAD,
               "lstat failed, path=" + path);
-  return std::to_string(info.st_ino) + " " + std::to_string(info.st_ctim.tv_sec) + "." +
-         std::to_string(info.st_ctim.tv_nsec);
+  return version.empty() ? "none" : version;
 }
 
 }  // namespace

@@ -15,7 +15,9 @@
 #include "daemons/fileindexd/consequence.h"
 #include "daemons/fileindexd/cycle.h"
 #include "daemons/fileindexd/documents.h"
+#include "daemons/fileindexd/file_version.h"
 #include "fileindex/elastic_control/share_index.h"
+#include "fileindex/paths.h"
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "fileindex/util/notification.h"
@@ -181,6 +183,7 @@ Worker::Outcome Worker::RunCycle() {
   }
   watch_.Forget();
   stats_.SetState(WorkerState::kProcessing);
+  const std::string status_version = FileVersion(fileindex::kFileIndexStatusCfgPath.Get());
   const bool fills = MakeIndexIfAsked();
   fileindex::QueueMgr queue(queue_path);
   // Until the cycle's end tells.
@@ -212,12 +215,17 @@ Worker::Outcome Worker::RunCycle() {
   has_unread_ = cycle().TakeHasUnread() || !all_is_read;
   unread_since_ =
       has_unread_ ? unread_since_.value_or(Clock::now()) : std::optional<Clock::time_point>();
+  bool is_marked = false;
   if (fills) {
-    // Not for nothing: what is saved by somebody between the reading and the saving is lost.
-    if (StatusMgr status; (status.GetShareStatus(share_) & kBothBits) != 0) {
+    StatusMgr status;
+    is_marked = (status.GetShareStatus(share_) & kBothBits) != 0;
+    // Who has saved the status meanwhile may have marked the share for something that was behind
+    // the comparison already: there is one more, which is short.
+    if (is_marked && FileVersion(fileindex::kFileIndexStatusCfgPath.Get()) == status_version) {
       status.UnsetShareStatus(share_, kBothBits);
+      is_marked = false;
     }
-    state_.rebuilt = false;
+    state_.rebuilt = is_marked && state_.rebuilt;
     SaveShareState(ShareStateFile(share_), state_);
   }
   settings_are_settled_ = settings_are_settled_ && was_left;
@@ -225,7 +233,7 @@ Worker::Outcome Worker::RunCycle() {
   wait_ = std::chrono::seconds(0);
   space_is_told_ = false;
   // Behind a snapshot that was there before, lines may wait of which nobody will tell any more.
-  return was_left ? Outcome::kAgain : Outcome::kDone;
+  return was_left || is_marked ? Outcome::kAgain : Outcome::kDone;
 }
 
 // Whether everything is to be compared, in an index that may be new.

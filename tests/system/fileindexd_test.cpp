@@ -277,6 +277,19 @@ TEST_F(Fileindexd, TakesCareOfTheStatusBitsAndEndsAPause) {
   Cycle({});
   ExpectIndexed();
   EXPECT_EQ(StatusMgr().GetShareStatus("docs"), 0U);
+  // Marked again for what the comparison is past.
+  Write("a.jpg", "waits for who reads it");
+  Signal("kavocontentextractd", SIGSTOP);
+  StatusMgr().SetShareStatus("docs", 1);
+  Append({});
+  ASSERT_TRUE(AwaitState("crawling"));
+  usleep(300'000);  // It looks at the folder, and then waits for the file to be read.
+  Write("z", "untold");
+  StatusMgr().SetShareStatus("docs", 1);
+  Signal("kavocontentextractd", SIGCONT);
+  EXPECT_TRUE(Await([this] { return StatusMgr().GetShareStatus("docs") == 0; }));
+  ASSERT_TRUE(AwaitAllDone());
+  ExpectIndexed();
   // Something of which a new index knows nothing.
   Json::Value ghost;
   ghost["id"] = "fileindex_docs";

@@ -59,7 +59,9 @@ bool AuditScope::MayEnter(const std::string& path) const {
   const bool leads = folders_.IsFullPathIndexed(path) ||
                      std::any_of(folder_paths_.begin(), folder_paths_.end(),
                                  [&](const auto& folder) { return IsSameOrBelow(folder, path); });
-  return leads && IsInShare(path) && fileindex::CanFullPathBeIndexed(path);
+  // What only leads to indexed folders need not be let in itself.
+  return leads && IsInShare(path) &&
+         (!folders_.IsFullPathIndexed(path) || fileindex::CanFullPathBeIndexed(path));
 }
 
 bool AuditScope::LeadsTo(const std::string& path) const {

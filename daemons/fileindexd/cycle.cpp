@@ -396,10 +396,14 @@ void Cycle::Reconcile(const std::string& root, const Json::Value& types, const c
   if (state_.crawl && state_.crawl->root == root && state_.crawl->cause == point.cause) {
     point = *state_.crawl;
   }
-  const WalkRules rules = {
-      [this](const std::string& path) { return scope_.Covers(path); },
-      [this](const std::string& path) { return scope_.LeadsToFolder(path); },
-      [this](const std::string& path) { return scope_.IsInShare(path) && scope_.Allows(path); }};
+  const WalkRules rules = {[this](const std::string& path) { return scope_.Covers(path); },
+                           [this](const std::string& path) { return scope_.LeadsToFolder(path); },
+                           // What only leads to indexed folders need not be let in itself, such as
+                           // a share's directory on which a volume is mounted.
+                           [this](const std::string& path) {
+                             return scope_.IsInShare(path) &&
+                                    (!scope_.Covers(path) || scope_.Allows(path));
+                           }};
   CrawlDeeds deeds;
   bool is_first_time = true;  // What cannot be read is tried once more, and then passed over.
   deeds.check = [this] { Check(); };
@@ -503,7 +507,7 @@ void Cycle::Check() {
 }
 
 bool Cycle::IsWanted(const std::string& path) const {
-  return scope_.Covers(path) && scope_.Allows(path);
+  return scope_.Covers(path) && scope_.Allows(path) && scope_.IsReached(path);
 }
 
 void Cycle::Submit(const std::string& path) {

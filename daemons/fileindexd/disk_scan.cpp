@@ -211,7 +211,8 @@ void DiskScan::Meet(const FolderPtr& folder, std::string_view name, unsigned typ
   }
   if (type == DT_DIR) {
     MeetFolder(folder, folder->path + "/" + name_, level, batch);
-  } else if (folder->contents) {
+  } else if (folder->contents &&
+             (!HasRefusableName(name_) || rules_.allows(folder->path + "/" + name_))) {
     batch->Add(kFile, name);
   }
 }

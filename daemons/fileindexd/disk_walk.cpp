@@ -37,6 +37,10 @@ bool KeepLeast(std::vector<std::string>* keys, size_t count) {
 
 bool MeansGone(int error) { return error == ENOENT || error == ENOTDIR || error == ELOOP; }
 
+bool HasRefusableName(const std::string& name) {
+  return name.find("#recycle") != std::string::npos || name.find("#snapshot") != std::string::npos;
+}
+
 DiskWalk::DiskWalk(const std::string& root, std::string after, WalkRules rules, size_t portion)
     : after_(std::move(after)), rules_(std::move(rules)), portion_(portion), buffer_(kBufferBytes) {
   // A frame above the root, of which only the root is seen.
@@ -103,7 +107,7 @@ std::optional<DiskEntry> DiskWalk::Look(Frame& frame, const std::string& name) {
     if (!MayEnter(frame, name, entry.path)) {
       return std::nullopt;
     }
-  } else if ((frame.is_above_root || entry.info.st_dev != frame.device) &&
+  } else if ((frame.is_above_root || entry.info.st_dev != frame.device || HasRefusableName(name)) &&
              !rules_.allows(entry.path)) {
     return std::nullopt;
   }

@@ -27,13 +27,18 @@ struct WalkRules {
   using Question = std::function<bool(const std::string& path)>;
   Question covers;  // Whether it belongs to the index at all, with everything below it.
   Question leads;   // Whether something below it is covered.
-  // Whether the policy lets it in. Asked for the root, for folders, and for what is mounted.
+  // Whether the policy lets it in. Asked for the root, for folders, for what is mounted, and for
+  // files that HasRefusableName() is true of.
   Question allows;
   bool enters = true;  // Whether folders below the root are gone into.
 };
 
 // Whether the errno says that nothing is there, or no folder: an answer, and no failure.
 bool MeansGone(int error);
+
+// Whether the policy may refuse a file by its name in a folder that it lets in: one like those of
+// recycle bins and snapshots.
+bool HasRefusableName(const std::string& name);
 
 // The order is that of full paths as bytes: "a", "a.txt", "a/b". A folder's own path so stands
 // apart from what is in it, where names come between that have a byte below "/".

@@ -1,7 +1,11 @@
 #include "daemons/fileindexd/scope.h"
 
+#include <fcntl.h>
+#include <sys/stat.h>
+
 #include <algorithm>
 #include <cerrno>
+#include <cstdint>
 #include <utility>
 
 #include "common/check.h"
@@ -20,6 +24,18 @@ namespace {
 // Whether the errno tells of the machine's state, and nothing of the path.
 bool IsOfMachine(int error) {
   return error == EIO || error == EMFILE || error == ENFILE || error == ENOMEM || error == EINTR;
+}
+
+// Of what the path stands on, which is one for all that nothing else is mounted on; none where the
+// kernel does not tell.
+std::optional<uint64_t> MountOf(const std::string& path) {
+  struct statx info {};
+  if (statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW | AT_NO_AUTOMOUNT | AT_STATX_DONT_SYNC,
+            STATX_MNT_ID, &info) != 0 ||
+      (info.stx_mask & STATX_MNT_ID) == 0) {
+    return std::nullopt;
+  }
+  return info.stx_mnt_id;
 }
 
 }  // namespace
@@ -104,6 +120,20 @@ bool Scope::Allows(const std::string& path) const {
   VEXLO_CHECK(KAVOGetFSType(path.c_str(), /*flags=*/0) < 0 && IsOfMachine(errno), ERR_SYSTEM,
               "the file system cannot be told, path=" + path);
   return fileindex::CanFullPathBeIndexed(path);
+}
+
+bool Scope::IsReached(const std::string& path) const {
+  const auto config = folders_.GetMostSuitableCfg(path);
+  const std::string from = config == nullptr ? path : config->GetFullPath();
+  if (const auto mount = MountOf(from); mount && mount == MountOf(path)) {
+    return true;
+  }
+  for (size_t end = from.size(); end < path.size(); end = path.find('/', end + 1)) {
+    if (!Allows(path.substr(0, end))) {
+      return false;
+    }
+  }
+  return true;
 }
 
 void Scope::CheckShare() const {

@@ -41,6 +41,11 @@ class Scope {
   // says nothing about the path.
   bool Allows(const std::string& path) const;
 
+  // Whether the policy lets in the folders from the indexed one down to the covered path, too, so
+  // that a crawl comes to it. Below a mount point, which is refused, the policy sees nothing wrong.
+  // Throws as Allows().
+  bool IsReached(const std::string& path) const;
+
   // Throws Error 800 when the share is gone, locked, read-only, or its directory is not there.
   void CheckShare() const;
 

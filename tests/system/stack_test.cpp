@@ -5,6 +5,7 @@
 
 #include <fstream>
 
+#include "fileindex/status_mgr.h"
 #include "support/index_listing.h"
 #include "support/private_mounts.h"
 #include "support/stack.h"
@@ -192,6 +193,32 @@ TEST(Stack, TakesUpAVolumeThatIsUnmountedAndMountedAgain) {
     fs::rename(volume + "/in/00", volume + "/in/0");
   }
   EXPECT_TRUE(AwaitSame(stack, tokens));  // The folder below the mount.
+}
+
+TEST(Stack, TakesAMountedShareAndNothingThatIsMountedInIt) {
+  Stack stack(kRoot);
+  const std::string volume = kRoot / "vol/mounted";
+  std::set<std::string> tokens = MakeFiles(volume + "/in");
+  fs::create_directory(volume + "/in/inner");
+  MakeFile(kRoot / "vol/other/a/b.txt", 500);
+  const ScopedMount mount = ScopedMount::Bind(volume, stack.Share());
+  SKIP_IF_REFUSED(mount);
+  ASSERT_TRUE(AwaitSame(stack, tokens));
+  vexlo::fileindex::StatusMgr().SetShareStatus("docs", 3);
+  EXPECT_EQ(stack.Tool("folder reindex /docs/in"), 0);
+  ASSERT_TRUE(stack.AwaitQuiet());
+  EXPECT_TRUE(AwaitSame(stack, tokens)) << "the index is made anew";
+  EXPECT_EQ(stack.Tool("audit"), 0);
+  const ScopedMount inner = ScopedMount::Bind(kRoot / "vol/other", stack.In("inner"));
+  MakeFile(stack.In("inner/a/c.txt"), 501);
+  tokens = {MakeFile(stack.In("seen.txt"), 502)};
+  EXPECT_TRUE(
+      Stack::Await([&] { return ListIndex("docs", tokens).tokens.size() == tokens.size(); }));
+  ASSERT_TRUE(stack.AwaitQuiet());
+  for (const auto& [path, facts] : ListIndex("docs", {}).paths) {
+    EXPECT_FALSE(path.starts_with(stack.In("inner/"))) << path;
+  }
+  EXPECT_EQ(stack.Tool("audit"), 0);
 }
 
 TEST(Stack, ReadsLaterWhatNobodyCouldRead) {

@@ -50,10 +50,11 @@ std::vector<std::string> Listed(const std::string& root) {
 
 // Names that sort before and behind "/", and are each other's beginnings.
 void MakeRandomTree(const std::string& root, std::mt19937& random) {
-  const std::string names[] = {"a", "a!", "a.txt", "a0", "b", "b-", "b\xE9", "\xFF", " "};
+  const std::string names[] = {"a",  "a!",    "a.txt", "a0", "b",
+                               "b-", "b\xE9", "\xFF",  " ",  "#recycle"};
   std::vector<std::string> folders = {root};
   for (int i = 0; i < 40; ++i) {
-    const std::string path = folders[random() % folders.size()] + "/" + names[random() % 9];
+    const std::string path = folders[random() % folders.size()] + "/" + names[random() % 10];
     if (fs::exists(path)) {
       continue;
     }
@@ -90,18 +91,22 @@ TEST(DiskWalk, LeavesOutWhatTheRulesRefuse) {
        {"in/deep/x", "in/@eaDir/x", "in/refused/x", "out/x", "way/in/x", "elsewhere"}) {
     fs::create_directories(folder / path);
   }
-  WriteText(folder / "in/Thumbs.db", "");
+  for (const char* const file : {"in/Thumbs.db", "in/#recycle", "in/a#snapshot"}) {
+    WriteText(folder / file, "");
+  }
   fs::create_directory_symlink(folder / "elsewhere", folder / "in/link");
   const WalkRules rules = {
       [&](const std::string& path) {
         return path.starts_with(folder / "in") || path.starts_with(folder / "way/in");
       },
       [&](const std::string& path) { return path == folder.Path() || path == folder / "way"; },
-      [&](const std::string& path) { return path != folder / "in/refused"; }};
+      [&](const std::string& path) {
+        return path != folder / "in/refused" && path != folder / "in/#recycle";
+      }};
   DiskWalk walk(folder.Path(), "", rules);
-  EXPECT_EQ(PathsOf(walk),
-            (std::vector<std::string>{folder / "in", folder / "in/deep", folder / "in/deep/x",
-                                      folder / "way/in", folder / "way/in/x"}));
+  EXPECT_EQ(PathsOf(walk), (std::vector<std::string>{folder / "in", folder / "in/a#snapshot",
+                                                     folder / "in/deep", folder / "in/deep/x",
+                                                     folder / "way/in", folder / "way/in/x"}));
 }
 
 TEST(DiskWalk, WhatIsNoFolderOrMissingIsNoFailure) {
@@ -129,10 +134,10 @@ TEST(DiskScan, AddsUpWhatTheWalkGives) {
     }
     fs::create_symlink("a", folder / "link");
     fs::create_directory(folder / ".git");
-    const std::string refused = folder / "a";
+    const std::set<std::string> refused = {folder / "a", folder / "#recycle"};
     const auto covers = [&](const std::string& path) { return path != folder / "b"; };
     const WalkRules rules = {covers, [](const std::string&) { return true; },
-                             [&](const std::string& path) { return path != refused; }};
+                             [&](const std::string& path) { return !refused.contains(path); }};
     const auto wants = [&](const std::string& path) {
       return by_type.at(static_cast<size_t>(fileindex::GetFileTypeByFullPath(path)));
     };

@@ -5,6 +5,7 @@
 #include <cerrno>
 #include <map>
 #include <mutex>
+#include <optional>
 #include <set>
 #include <string>
 #include <utility>
@@ -144,15 +145,26 @@ void SettleFolders() {
   }
   FolderMgr folders;
   const Unsettled found = FindUnsettled(folders);
+  // One share that fails keeps nothing from the others.
+  std::optional<Error> failure;
+  const auto settle = [&failure](const std::string& share, const char* done, const auto& act) {
+    try {
+      act();
+      daemon::Log(daemon::Level::kNotice, VEXLO_SOURCE, __LINE__,
+                  share + ": " + done + ", as a change of folders was cut short");
+    } catch (const Error& error) {
+      failure = error;
+    }
+  };
   for (const std::string& share : found.unwatched) {
-    Watch(share, folders);
-    daemon::Log(daemon::Level::kNotice, VEXLO_SOURCE, __LINE__,
-                share + ": its folders are watched again, as a change of them was cut short");
+    settle(share, "its folders are watched again", [&] { Watch(share, folders); });
   }
-  for (const auto& [share, queue] : found.unlisted) {
-    Forget(share, queue);
-    daemon::Log(daemon::Level::kNotice, VEXLO_SOURCE, __LINE__,
-                share + ": what its index left is removed, as a change of folders was cut short");
+  for (const auto& unlisted : found.unlisted) {
+    settle(unlisted.first, "what its index left is removed",
+           [&unlisted] { Forget(unlisted.first, unlisted.second); });
+  }
+  if (failure) {
+    throw Error(*failure);
   }
   VEXLO_CHECK(!FindUnsettled(folders).IsNothing(), ERR_SYSTEM,
               "the registrations are others than they were made");

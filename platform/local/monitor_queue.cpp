@@ -219,7 +219,11 @@ bool Edit(const std::string& app, const Change& change) noexcept {
     const EditLock lock(file);
     std::vector<RegisteredQueue> queues = ReadFile(app, file);
     if (change(queues)) {
-      ReplaceWhole(file, Serialise(queues));
+      const std::string text = Serialise(queues);
+      if (text.size() > kMaxFileBytes) {
+        throw FileError(file + ": the queues of an application may take 64 MiB");
+      }
+      ReplaceWhole(file, text);
     }
     return true;
   } catch (const std::exception& error) {

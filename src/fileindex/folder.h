@@ -19,7 +19,7 @@ namespace vexlo::fileindex {
 class VEXLO_EXPORT Folder {
  public:
   // From an object as GetData() gives it. "path", "name" and the four types are required; the rest
-  // may be missing, or be of another type, and is "" or false then. Throws Error 120 as
+  // may be missing, and is "" or false then, as it is when it does not convert. Throws Error 120 as
   // GetJsonValue() and Validate() do. Nothing is looked up: the share need not exist.
   explicit Folder(const Json::Value& data);
 

@@ -1,7 +1,7 @@
 // Administration of the indexed folders: the list, and everything else that has to follow it.
 //
 // - FolderAdd(), FolderSet() and FolderDelete() hold the folders' lock file throughout, so they
-//   never overlap, across processes too. They wait for it up to half a minute and then throw Error
+//   never overlap, across processes too. They wait for it up to a minute and then throw Error
 //   506. What they wait for under it has no limit: a busy engine, and a daemon that takes a command
 //   and does not answer. Callers that serve people run them where waiting does no harm.
 // - A whole list is checked before anything is changed. Then the services, the engine's index of

@@ -7,7 +7,7 @@ void MissedPaths::Note(const std::string& path) {
     return;
   }
   paths_.insert(path);
-  if (paths_.size() > kMost) {
+  if (path.empty() || paths_.size() > kMost) {
     paths_.clear();
     paths_.insert("");
   }

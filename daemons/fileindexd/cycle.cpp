@@ -73,8 +73,60 @@ Cycle::Cycle(const std::string& share, const std::string& share_path, std::strin
       indexer_(id_, stats, is_interrupted_),
       engine_run_(EngineRun()) {}
 
+void Cycle::LookAheadIn(const std::string& queue_path, std::chrono::milliseconds step) {
+  tail_.emplace(queue_path);
+  look_step_ = step;
+  looked_ = std::chrono::steady_clock::now();
+}
+
+// What goes wrong with a line alone will be told by the cycle that takes it.
+void Cycle::LookAhead() {
+  const auto now = std::chrono::steady_clock::now();
+  if (!tail_ || now - looked_ < look_step_) {
+    return;
+  }
+  looked_ = now;
+  std::vector<GoneList::Gone> gone;
+  for (const std::string& line : tail_->Next()) {
+    try {
+      LookAt(fileindex::Event(line), &gone);
+    } catch (const Error& error) {
+      if (OfOperation(error.GetErrorCode()) != Consequence::kGoOn) {
+        throw;
+      }
+    }
+  }
+  if (!gone.empty()) {
+    Settle();
+    Remove(gone);
+  }
+}
+
+// Folders are left to the crawl that will be asked for.
+void Cycle::LookAt(const fileindex::Event& event, std::vector<GoneList::Gone>* gone) {
+  constexpr uint32_t kWritten = fileindex::EV_CLOSE_WRITE | fileindex::EV_RENAME;
+  if (event.is_dir) {
+    return;
+  }
+  for (const std::string* const path : {&event.path, &event.path_old}) {
+    if (path->empty() || path->find('\0') != std::string::npos || !scope_.IsInShare(*path)) {
+      continue;
+    }
+    NoteTouched(*path);  // Whatever is handed over after this is from before.
+    const bool is_new = path == &event.path;
+    if (is_new && (event.event & kWritten) != 0 && IsWanted(*path)) {
+      Submit(*path);
+    } else if ((!is_new || (event.event & fileindex::EV_DELETE) != 0) && scope_.Covers(*path) &&
+               IsGone(*path)) {
+      ForgetTaken(*path);
+      gone->push_back({*path, /*with_all_below=*/false});
+    }
+  }
+}
+
 void Cycle::Handle(const fileindex::OP& op) {
   Check();
+  LookAhead();
   const std::shared_ptr<fileindex::OPNode> node = op.node.lock();
   if (node == nullptr) {
     return;
@@ -368,6 +420,7 @@ bool Cycle::IndexUnread() {
     }
     for (const std::string& path : page) {
       Check();
+      LookAhead();
       if (IsWanted(path)) {
         Submit(path);
       } else {
@@ -408,6 +461,7 @@ void Cycle::Reconcile(const std::string& root, const Json::Value& types, const c
   bool is_first_time = true;  // What cannot be read is tried once more, and then passed over.
   deeds.check = [this] { Check(); };
   deeds.compare = [&](const DiskEntry& entry, const IndexedPath* indexed, bool first_pass) {
+    LookAhead();
     Compare(entry, indexed, first_pass && is_first_time ? types : Json::Value::nullSingleton());
   };
   deeds.is_gone = IsGone;

@@ -4,6 +4,7 @@
 
 #include <json/value.h>
 
+#include <chrono>
 #include <functional>
 #include <map>
 #include <memory>
@@ -14,10 +15,12 @@
 
 #include "daemons/fileindexd/crawl.h"
 #include "daemons/fileindexd/indexer.h"
+#include "daemons/fileindexd/queue_tail.h"
 #include "daemons/fileindexd/scope.h"
 #include "daemons/fileindexd/share_state.h"
 #include "daemons/fileindexd/stamp.h"
 #include "daemons/fileindexd/stats.h"
+#include "fileindex/optree/event.h"
 #include "fileindex/optree/op.h"
 
 namespace vexlo::fileindexd {
@@ -31,6 +34,11 @@ class Cycle {
   // outlive the cycle. Throws as Scope does.
   Cycle(const std::string& share, const std::string& share_path, std::string cause,
         ShareState& state, Stats& stats, std::function<bool()> is_interrupted);
+
+  // From now on looks at the queue every `step` while it works, so that a change need not wait for
+  // the end of all this to be found: files that were written or renamed are indexed at once, and
+  // those that are gone removed, as if a crawl had come by. The lines stay for the next cycle.
+  void LookAheadIn(const std::string& queue_path, std::chrono::milliseconds step);
 
   // Carries out one operation. What is wrong with it alone is logged, counted, and passed over.
   void Handle(const fileindex::OP& op);
@@ -69,6 +77,8 @@ class Cycle {
   // are indexed anew even so, or is null. The cycle's cause where `cause` is null.
   void Reconcile(const std::string& root, const Json::Value& types, const char* cause = nullptr);
   void ReconcileMixed(const std::string& path);
+  void LookAhead();
+  void LookAt(const fileindex::Event& event, std::vector<GoneList::Gone>* gone);
   void Compare(const DiskEntry& entry, const IndexedPath* indexed, const Json::Value& types);
   void Remove(const std::vector<GoneList::Gone>& gone);
   void MarkCrawled(const std::string& root);
@@ -107,6 +117,10 @@ class Cycle {
   Stats& stats_;
   const std::function<bool()> is_interrupted_;
   Indexer indexer_;
+
+  std::optional<QueueTail> tail_;
+  std::chrono::milliseconds look_step_{0};
+  std::chrono::steady_clock::time_point looked_;
 
   std::string engine_run_;  // That has taken what was sent since the last commit.
   Json::Value deletes_ = Json::Value(Json::arrayValue);  // Wait to be sent as one request.

@@ -196,6 +196,7 @@ Worker::Outcome Worker::RunCycle() {
     if (!made) {
       made.emplace(share_, share.GetPath(), SnapshotName(queue_path + ".tmp"), state_, stats_,
                    [this] { return IsInterrupted(); });
+      made->LookAheadIn(queue_path, coalescing_);
     }
     return *made;
   };

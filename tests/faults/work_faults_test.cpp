@@ -2,6 +2,7 @@
 // old or new and whole, what was committed is there, and the same work succeeds when the fault is
 // gone.
 #include <sstream>
+#include <thread>
 
 #include "cli/command.h"
 #include "common/error.h"
@@ -336,6 +337,53 @@ TEST(WorkFaults, AComparisonCommitsWhatItFound) {
   kDaemons->StartEngine();
   const Listing index = ListIndex("docs", {"q000000000000001", "q000000000000002"});
   EXPECT_EQ(Differences(ListDisk(kIn), index), "");
+}
+
+// Neither what it has passed already nor what it will not find.
+TEST(WorkFaults, AComparisonLooksAtWhatIsQueuedMeanwhile) {
+  Clear();
+  fs::remove_all(kIn);
+  kRoot.MakeFolder("vol/docs/in");
+  for (int i = 0; i < 30; ++i) {
+    WriteText(kIn + "/" + std::to_string(i) + ".txt", "q000000000000001");
+  }
+  ASSERT_EQ(Tool({"folder", "add", kIn}), 0);
+  const std::string queue = vexlo::sdk::SDKShare("docs").GetQueuePath();
+  WriteText(queue, "{\"event\":8,\"path\":\"" + kIn + "/no such\"}\n");
+  const auto change = [&] {
+    std::string lines;
+    const auto note = [&](int event, const char* path, const std::string& more = "") {
+      lines +=
+          "{\"event\":" + std::to_string(event) + ",\"path\":\"" + kIn + path + "\"" + more + "}\n";
+    };
+    WriteText(kIn + "/+new.txt", "q000000000000002");
+    note(8, "/+new.txt");
+    fs::rename(kIn + "/0.txt", kIn + "/+renamed.txt");
+    note(256, "/+renamed.txt", ",\"path_old\":\"" + kIn + "/0.txt\"");
+    fs::remove(kIn + "/1.txt");
+    note(128, "/1.txt");
+    lines += "{\"event\":8,\"path\":\"" + kIn + "/9.txt";  // Is being written.
+    WriteText(queue, ReadText(queue) + lines);
+  };
+  const auto self = std::this_thread::get_id();
+  int asked = 0;
+  vexlo::fileindexd::Stats stats;
+  vexlo::fileindexd::ShareState state;
+  vexlo::fileindexd::Cycle cycle("docs", kDocs, "test", state, stats, [&] {
+    // Behind the first files, and the folder's names were all read.
+    if (std::this_thread::get_id() == self && ++asked == 15) {
+      change();
+    }
+    return false;
+  });
+  cycle.LookAheadIn(queue, std::chrono::milliseconds(0));
+  cycle.ReconcileShare();
+  cycle.Finish();
+  EXPECT_GT(asked, 15);
+  const Listing index = ListIndex("docs", {"q000000000000001", "q000000000000002"});
+  Listing disk = ListDisk(kIn);
+  // The folder itself has another date, of which its own event would tell.
+  EXPECT_EQ(index.tokens, disk.tokens);
 }
 
 }  // namespace

@@ -4,6 +4,8 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <cerrno>
+
 #include "cli/daemon_stats.h"
 #include "fileindex/paths.h"
 #include "kavo/local/content.h"
@@ -21,8 +23,10 @@ bool IsListening(const std::string& path) {
     return false;
   }
   path.copy(address.sun_path, sizeof(address.sun_path) - 1);
+  // A queue of connections that is full is somebody's, too.
   const bool connected =
-      connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
+      connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0 ||
+      errno == EAGAIN;
   close(fd);
   return connected;
 }

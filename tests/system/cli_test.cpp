@@ -217,6 +217,21 @@ TEST_F(Cli, AdministersFolders) {
   EXPECT_EQ(ReadText(files_ / "root/var/lib/kavo/evnotify/fileindex.json"), "{\"queues\": [\n]}\n");
 }
 
+TEST_F(Cli, UpTakesOverTheDaemonsOfAnotherThatEnds) {
+  MakeFolders({"vol/docs", "vol/two"});
+  Program first = Start(FILEINDEX_PROGRAM " up vol/docs");
+  EXPECT_TRUE(first.Await("following")) << first.text;
+  Program second = Start(FILEINDEX_PROGRAM " up vol/two");
+  EXPECT_TRUE(second.Await("following")) << second.text;
+  EXPECT_EQ(first.End(SIGINT), 0) << first.text;
+  EXPECT_TRUE(second.Await("evnotifyd runs no longer, and is started")) << second.text;
+  WriteText(files_ / "vol/docs/a.txt", "harbour");
+  Program search = Start("sh -c 'until " FILEINDEX_PROGRAM " search harbour; do sleep .1; done'");
+  EXPECT_TRUE(search.Await("vol/docs/a.txt\n")) << second.text;
+  EXPECT_EQ(search.End(), 0);
+  EXPECT_EQ(second.End(SIGINT), 0) << second.text;
+}
+
 TEST_F(Cli, WatchDeliversWhatAnEarlierRunLeftAndThenWhatHappens) {
   const std::string root = files_ / "tree";
   std::filesystem::create_directory(root);

@@ -8,6 +8,7 @@
 
 #include "cli/text.h"
 #include "common/error.h"
+#include "kavo/local/shares.h"
 
 namespace vexlo::cli {
 namespace {
@@ -113,6 +114,9 @@ ExitStatus RunCommand(const Command& command, const std::vector<std::string>& wo
     if (!arguments.has_value()) {
       PrintHelp(console.out, command);
       return kDone;
+    }
+    if (const std::string fault = kavo::local::RootFault(); !fault.empty()) {
+      throw Failure(fault);
     }
     const ExitStatus status = command.run(*arguments, console);
     console.out.flush();

@@ -187,6 +187,8 @@ TEST_F(Cli, AnswersEveryCommandLine) {
   WriteText(files_ / "vol/photo/note.txt", "The harbour\nis closed");
   WriteText(files_ / "vol/photo/note.pdf", "%PDF");
   Check(kCases);
+  Program astray = Start("env FILEINDEX_ROOT=root " FILEINDEX_PROGRAM " share list");
+  EXPECT_EQ(astray.End(), 3) << "a root that is not absolute: " << astray.text;
   const std::string rest = R"(,"name":"","document":true,"audio":true,"video":true,"photo":true)";
   WriteText(etc + "/fileindex.folders",
             R"([{"path":"/photo")" + rest + R"(,"owner":{}},{"path":"/photo")" + rest +

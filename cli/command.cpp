@@ -129,8 +129,7 @@ ExitStatus RunCommand(const Command& command, const std::vector<std::string>& wo
     PrintUsage(console.err, command);
     return kBadUsage;
   } catch (const Error& error) {
-    console.err << kName << ": " << ForTerminal(error.what()) << " (error " << error.GetErrorCode()
-                << ")\n";
+    console.err << kName << ": " << TextOf(error) << "\n";
     return kFailed;
   } catch (const std::exception& error) {
     console.err << kName << ": " << ForTerminal(error.what()) << "\n";

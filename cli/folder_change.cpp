@@ -71,7 +71,7 @@ void ChangeFolders(const Console& console, const Json::Value& paths,
     try {
       work();
     } catch (const Error& error) {
-      if (error.GetErrorCode() != ERR_SYSTEM || IsIndexDaemonRunning() ||
+      if (error.GetErrorCode() != ERR_SYSTEM || IsIndexDaemonListening() ||
           !std::string_view(error.what()).starts_with("write failed")) {
         throw;
       }

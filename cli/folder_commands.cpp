@@ -217,7 +217,7 @@ ExitStatus Reindex(const Arguments& arguments, const Console& console) {
   for (const Json::Value& path : paths) {
     console.out << "to be indexed again: " << ForTerminal(path.asString()) << "\n";
   }
-  if (!IsIndexDaemonRunning()) {
+  if (!IsIndexDaemonListening()) {
     console.err << NoIndexDaemon() << "; this waits for it\n";
   }
   return kDone;

@@ -38,8 +38,11 @@ ExitStatus CheckHealth(const Arguments& arguments, const Console& console) {
   const double oldest = arguments.Has("--fresh") ? ReadSeconds(arguments.Get("--fresh")) : -1;
   const Json::Value state = StateWithBacklogs();
   std::vector<std::string> faults;
+  std::string closed;
   for (const Json::Value& daemon : state["daemons"]) {
-    if (!daemon["running"].asBool()) {
+    if (daemon["running"].isNull()) {
+      closed.append(closed.empty() ? "" : ", ").append(daemon["name"].asString());
+    } else if (!daemon["running"].asBool()) {
       faults.push_back(daemon["name"].asString() + " does not answer");
     }
   }
@@ -67,6 +70,11 @@ ExitStatus CheckHealth(const Arguments& arguments, const Console& console) {
   }
   for (const std::string& fault : faults) {
     console.out << fault << "\n";
+  }
+  // To start what runs again would not help.
+  if (!closed.empty()) {
+    console.err << "not told: the sockets of " << closed << " are closed to this user\n";
+    return faults.empty() ? kFailed : kNothingFound;
   }
   if (faults.empty()) {
     console.out << "healthy\n";
@@ -99,7 +107,10 @@ std::vector<Command> MetricsCommands() {
        "says whether the service works, for probes",
        "Exit status 0 when all is well, 1 with a line for each fault otherwise. Without options "
        "the\n"
-       "daemons must answer, no more: what a probe asks that would start them again.\n"
+       "daemons must answer, no more: what a probe asks that would start them again. 3 when "
+       "nothing\n"
+       "is wrong as far as this user may ask: the daemons' sockets are closed to all but their "
+       "owner.\n"
        "\n"
        "  fileindex health --ready --fresh 300 || mail -s 'the index is behind' root </dev/null\n",
        {{"--ready", nullptr, "also each share must be indexed without fault and watched in full"},

@@ -65,6 +65,9 @@ Stack::~Stack() { Stop(); }
 
 bool Stack::Start(const std::function<bool()>& is_stopped) {
   for (Child& child : children_) {
+    if (ReachOf(child.place.socket) == Reach::kClosed) {
+      throw Failure(WhyUnreached(child.place.name, child.place.socket));
+    }
     if (IsListening(child.place.socket)) {
       notice_(std::string(child.place.name) + " runs already, and is left alone");
       continue;
@@ -109,7 +112,7 @@ void Stack::Tend() {
 
 // Somebody else's is left alone as long as it is there.
 void Stack::TakeOver(Child& child) {
-  if (IsListening(child.place.socket)) {
+  if (ReachOf(child.place.socket) != Reach::kNobody) {
     child.is_missed = false;
     return;
   }

@@ -28,7 +28,8 @@ class Stack {
   Stack& operator=(const Stack&) = delete;
 
   // Starts them in order, each when the one before listens. Throws Failure when one ends instead,
-  // with the last line that it wrote. `is_stopped` is asked meanwhile; false when it said so.
+  // with the last line that it wrote, and where a socket is closed to this user. `is_stopped` is
+  // asked meanwhile; false when it said so.
   bool Start(const std::function<bool()>& is_stopped);
 
   // Starts anew those that have ended, also those that ran before Start() and were left alone.

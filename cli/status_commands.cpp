@@ -63,10 +63,12 @@ std::string WatchText(const Json::Value& watch) {
 std::string TableOf(const Json::Value& all, const std::map<std::string, double>& rates) {
   Rows daemons = {{"DAEMON", "STATE"}};
   for (const Json::Value& daemon : all["daemons"]) {
-    daemons.push_back(
-        {daemon["name"].asString(), daemon["running"].asBool()
-                                        ? "running"
-                                        : "does not answer on " + daemon["socket"].asString()});
+    const std::string socket = daemon["socket"].asString();
+    const bool is_closed = daemon["running"].isNull();
+    daemons.push_back({daemon["name"].asString(), is_closed ? "closed to this user on " + socket
+                                                  : daemon["running"].asBool()
+                                                      ? "running"
+                                                      : "does not answer on " + socket});
   }
   Rows shares = {{"SHARE", "STATE", "QUEUED", "DONE", "A SECOND", "WATCHED", "LAST ERROR"}};
   for (const Json::Value& share : all["shares"]) {
@@ -109,7 +111,7 @@ ExitStatus ShowStatus(const Arguments& arguments, const Console& console) {
   }
   const std::string status = fileindex::GetIndexProcessingStatus();
   console.out << (arguments.Has("--json") ? JsonToString(status) : status) << "\n";
-  if (!IsIndexDaemonRunning()) {
+  if (!IsIndexDaemonListening()) {
     console.err << NoIndexDaemon() << "\n";
   }
   return kDone;

@@ -52,6 +52,15 @@ std::string CauseOf(std::string_view reason) {
   return std::string(at == std::string_view::npos ? reason : reason.substr(at + kMark.size()));
 }
 
+std::string TextOf(const Error& error) {
+  std::string reason = error.what();
+  if (reason.empty() && error.GetErrorCode() == ERR_CREDENTIALS) {
+    reason = "this user has not the rights for it; root has";
+  }
+  return ForTerminal(reason) + " (error " + std::to_string(static_cast<int>(error.GetErrorCode())) +
+         ")";
+}
+
 std::string AbsolutePath(const std::string& path) {
   std::string absolute = std::filesystem::absolute(path).lexically_normal().string();
   if (absolute.size() > 1 && absolute.back() == '/') {

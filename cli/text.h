@@ -7,6 +7,8 @@
 #include <string_view>
 #include <vector>
 
+#include "common/error.h"
+
 namespace vexlo::cli {
 
 std::vector<std::string> Split(std::string_view text, char separator);
@@ -22,6 +24,10 @@ std::string ForTerminal(std::string_view text);
 
 // What a library reason says of the system's error: the text behind its last "reason=", or all.
 std::string CauseOf(std::string_view reason);
+
+// An error of the library for people: its reason and number. The one that comes without a reason,
+// for want of root's rights, gets one.
+std::string TextOf(const Error& error);
 
 // The argument as an absolute path without ".", ".." and doubled or trailing slashes. Works on the
 // text alone: nothing needs to exist.

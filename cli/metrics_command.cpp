@@ -1,10 +1,19 @@
 // "fileindex metrics" and "fileindex health": the service for monitoring.
+#include <algorithm>
 #include <charconv>
+#include <iterator>
+#include <map>
+#include <optional>
+#include <set>
 
 #include "cli/command.h"
+#include "cli/daemon_stats.h"
 #include "cli/metrics.h"
 #include "cli/stack_report.h"
 #include "cli/text.h"
+#include "fileindex/elastic_control/share_index.h"
+#include "fileindex/folder_mgr.h"
+#include "fileindex/paths.h"
 
 namespace vexlo::cli {
 namespace {
@@ -34,6 +43,65 @@ double ReadSeconds(const std::string& text) {
   return seconds;
 }
 
+std::string WorkerFault(const Json::Value& share) {
+  const std::string name = ForTerminal(share["share"].asString());
+  const std::string worker = share["state"].asString();
+  if (worker != "failing" && worker != "unavailable") {
+    return "";
+  }
+  std::string fault = "the share " + name;
+  fault.append(" is ").append(worker);
+  const std::string error = share["last_error"].asString();
+  return error.empty() ? fault : fault.append(": ").append(ForTerminal(error));
+}
+
+std::string WatchFault(const Json::Value& share) {
+  const std::string name = ForTerminal(share["share"].asString());
+  const Json::Value& watch = share["watch"];
+  return watch.isNull() ? "nobody watches the share " + name
+         : watch["state"] == "degraded"
+             ? "not all changes in the share " + name +
+                   " are seen at once: " + ForTerminal(watch["reason"].asString())
+             : "";
+}
+
+// Of the shares that are to be indexed. What a daemon would tell that does not answer is no fault
+// of its own: one line says that already.
+std::vector<std::string> ShareFaults(const Json::Value& state) {
+  std::set<std::string> answering;
+  for (const Json::Value& daemon : state["daemons"]) {
+    answering.insert(daemon["running"] == true ? daemon["name"].asString() : "");
+  }
+  std::vector<std::string> faults;
+  std::set<std::string> with_worker;
+  for (const Json::Value& share : state["shares"]) {
+    with_worker.insert(share["share"].asString());
+    faults.push_back(WorkerFault(share));
+    faults.push_back(answering.contains("evnotifyd") ? WatchFault(share) : "");
+  }
+  std::map<std::string, std::string> indexes;  // States by id.
+  const std::optional<Json::Value> list =
+      answering.contains("kavoelasticd")
+          ? AskDaemon(fileindex::kElasticdSocketPath.Get(), R"({"command":"index_list"})")
+          : std::nullopt;
+  for (const Json::Value& index : list ? (*list)["data"] : Json::Value()) {
+    indexes[index["id"].asString()] = index["state"].asString();
+  }
+  for (const std::string& share : fileindex::FolderMgr().GetIndexedShares()) {
+    const std::string name = ForTerminal(share);
+    const std::string index = indexes[fileindex::elastic::GetFileIndexID(share)];
+    if (list && index != "active") {
+      faults.push_back(index.empty() ? "the share " + name + " has no index"
+                                     : "the index of the share " + name + " is " + index);
+    }
+    if (answering.contains("fileindexd") && !with_worker.contains(share)) {
+      faults.push_back("fileindexd has no worker for the share " + name);
+    }
+  }
+  std::erase(faults, "");
+  return faults;
+}
+
 ExitStatus CheckHealth(const Arguments& arguments, const Console& console) {
   const double oldest = arguments.Has("--fresh") ? ReadSeconds(arguments.Get("--fresh")) : -1;
   const Json::Value state = StateWithBacklogs();
@@ -46,26 +114,14 @@ ExitStatus CheckHealth(const Arguments& arguments, const Console& console) {
       faults.push_back(daemon["name"].asString() + " does not answer");
     }
   }
+  if (arguments.Has("--ready")) {
+    std::ranges::move(ShareFaults(state), std::back_inserter(faults));
+  }
   for (const Json::Value& share : state["shares"]) {
-    const std::string name = ForTerminal(share["share"].asString());
-    const std::string worker = share["state"].asString();
-    if (arguments.Has("--ready") && (worker == "failing" || worker == "unavailable")) {
-      const std::string error = share["last_error"].asString();
-      std::string fault = "the share " + name;
-      fault.append(" is ").append(worker);
-      if (!error.empty()) {
-        fault.append(": ").append(ForTerminal(error));
-      }
-      faults.push_back(std::move(fault));
-    }
-    if (arguments.Has("--ready") && share["watch"]["state"] == "degraded") {
-      faults.push_back("not all changes in the share " + name +
-                       " are seen at once: " + ForTerminal(share["watch"]["reason"].asString()));
-    }
     if (oldest >= 0 && share["backlog"]["age"].asDouble() > oldest) {
-      faults.push_back("changes in the share " + name + " wait for " +
-                       Grouped(static_cast<uint64_t>(share["backlog"]["age"].asDouble())) +
-                       " seconds");
+      faults.push_back(
+          "changes in the share " + ForTerminal(share["share"].asString()) + " wait for " +
+          Grouped(static_cast<uint64_t>(share["backlog"]["age"].asDouble())) + " seconds");
     }
   }
   for (const std::string& fault : faults) {

@@ -129,6 +129,16 @@ const CliCase kFolderCases[] = {
     {"IndexPruned", "index list", 1, "", ""},
 };
 
+// With everything running, and the shares docs and two.
+const CliCase kRunningCases[] = {
+    {"Ready", "health --ready", 0, "healthy\n", ""},
+    {"PauseIndex", "index pause two", 0, "*paused", ""},
+    {"PausedIndex", "health --ready", 1, "the index of the share two is paused\n", ""},
+    {"ResumeIndex", "index resume two", 0, "*resumed", ""},
+    {"DeleteIndex", "index delete two", 0, "*deleted", ""},
+    {"MissingIndex", "health --ready", 1, "the share two has no index\n", ""},
+};
+
 class Cli : public testing::Test {
  protected:
   // In the folder, and ended by timeout(1) if it would never end.
@@ -231,6 +241,11 @@ TEST_F(Cli, UpTakesOverTheDaemonsOfAnotherThatEnds) {
   Program search = Start("sh -c 'until " FILEINDEX_PROGRAM " search harbour; do sleep .1; done'");
   EXPECT_TRUE(search.Await("vol/docs/a.txt\n")) << second.text;
   EXPECT_EQ(search.End(), 0);
+  Check(kRunningCases);
+  Program unwatched = Start("sh -c 'rm root/var/lib/kavo/evnotify/*.json; until " FILEINDEX_PROGRAM
+                            " health --ready | grep watches; do sleep .1; done'");
+  EXPECT_TRUE(unwatched.Await("nobody watches the share docs\n"));
+  EXPECT_EQ(unwatched.End(), 0);
   EXPECT_EQ(second.End(SIGINT), 0) << second.text;
 }
 

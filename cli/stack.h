@@ -15,7 +15,7 @@ namespace vexlo::cli {
 
 // Starts those of the four daemons that do not run yet, and ends them: by Stop(), or by SIGTERM
 // from the kernel when the tool is killed. Their lines go to files below the root. The programs are
-// those beside the tool's own. For a program of one thread that blocks SIGINT, SIGTERM and SIGHUP;
+// those beside the tool's own. For a program of one thread that blocks what StopSignalSet() gives;
 // the daemons do not inherit that, and signals of the terminal do not reach them.
 class Stack {
  public:

@@ -17,6 +17,7 @@
 #include "cli/folder_change.h"
 #include "cli/service.h"
 #include "cli/stack.h"
+#include "cli/stop_signals.h"
 #include "cli/text.h"
 #include "common/file.h"
 #include "common/json.h"
@@ -33,17 +34,17 @@ constexpr auto kLineInterval = std::chrono::seconds(2);  // Where there is no te
 constexpr auto kFollowInterval = std::chrono::seconds(1);
 constexpr size_t kBarWidth = 30;
 
-// SIGINT, SIGTERM and SIGHUP, blocked as long as it lives.
+// What ends the command, blocked as long as it lives.
 class StopSignals {
  public:
-  StopSignals() {
-    sigemptyset(&signals_);
-    for (const int signal : {SIGINT, SIGTERM, SIGHUP}) {
-      sigaddset(&signals_, signal);
+  StopSignals() { sigprocmask(SIG_BLOCK, &signals_, &before_); }
+  ~StopSignals() {
+    // A second Ctrl-C, while all was ending, asked for nothing new.
+    constexpr timespec kNoTime = {0, 0};
+    while (sigtimedwait(&signals_, nullptr, &kNoTime) > 0) {
     }
-    sigprocmask(SIG_BLOCK, &signals_, &before_);
+    sigprocmask(SIG_SETMASK, &before_, nullptr);
   }
-  ~StopSignals() { sigprocmask(SIG_SETMASK, &before_, nullptr); }
   StopSignals(const StopSignals&) = delete;
   StopSignals& operator=(const StopSignals&) = delete;
 
@@ -55,7 +56,7 @@ class StopSignals {
   }
 
  private:
-  sigset_t signals_{};
+  const sigset_t signals_ = StopSignalSet();
   sigset_t before_{};
   bool stopped_ = false;
 };

@@ -22,6 +22,9 @@ std::string Counted(uint64_t number, std::string_view noun);
 // Control characters as "\012", so that a file name cannot drive the terminal; the rest as it is.
 std::string ForTerminal(std::string_view text);
 
+// A word as a shell takes it: as it is, or in single quotes where that is wanted.
+std::string ForShell(const std::string& word);
+
 // What a library reason says of the system's error: the text behind its last "reason=", or all.
 std::string CauseOf(std::string_view reason);
 

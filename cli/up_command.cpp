@@ -1,11 +1,13 @@
 // "fileindex up DIR...": the whole local stack in the foreground.
 #include <json/value.h>
+#include <sys/ioctl.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <csignal>
+#include <cstdint>
 #include <cstdlib>
 #include <ctime>
 #include <filesystem>
@@ -96,6 +98,13 @@ class Count {
   std::thread thread_;
 };
 
+// What the terminal shows without going on to another line, at its present size.
+size_t WidestLine() {
+  winsize size{};
+  return ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) != 0 || size.ws_col == 0 ? std::string::npos
+                                                                          : size.ws_col - 1U;
+}
+
 // Says things to people, or in JSON to programs: an object a line, with "event".
 class Voice {
  public:
@@ -113,7 +122,8 @@ class Voice {
     }
   }
 
-  // Drawn over the last one on a terminal, a line every other second elsewhere.
+  // Drawn over the last one on a terminal, no wider than that; elsewhere a line every other second
+  // in which something was done.
   void ShowProgress(uint64_t done, const Count& total, double seconds) {
     const auto rate = static_cast<uint64_t>(static_cast<double>(done) / std::max(seconds, 0.001));
     std::string text = Counted(done, "file");
@@ -127,11 +137,13 @@ class Voice {
     if (has_bar_) {
       const size_t most = std::max<uint64_t>({total.Get(), done, 1});
       const size_t filled = total.IsDone() ? done * kBarWidth / most : 0;
-      console_.out << "\r\033[K[" << std::string(filled, '#')
-                   << std::string(kBarWidth - filled, '.') << "] " << text << std::flush;
+      std::string bar = "[" + std::string(filled, '#');
+      bar.append(kBarWidth - filled, '.').append("] ").append(text);
+      console_.out << "\r\033[K" << bar.substr(0, WidestLine()) << std::flush;
       drawn_ = true;
-    } else if (Clock::now() >= next_) {
+    } else if (Clock::now() >= next_ && done != done_said_) {
       next_ = Clock::now() + kLineInterval;
+      done_said_ = done;
       Json::Value fields;
       fields["done"] = Json::UInt64{done};
       fields["total"] = total.IsDone() ? Json::Value(Json::UInt64{total.Get()}) : Json::Value();
@@ -152,6 +164,7 @@ class Voice {
   const bool as_json_;
   const bool has_bar_;
   bool drawn_ = false;
+  uint64_t done_said_ = UINT64_MAX;
   Clock::time_point next_ = Clock::now() + kLineInterval;
 };
 
@@ -163,7 +176,8 @@ uint64_t FilesTaken(const Json::Value& shares) {
   return files;
 }
 
-// Whether every share has a worker that has nothing left to do, and every queue is fed.
+// Whether every share has a worker that has nothing left to do or does nothing at present, and
+// every queue is fed.
 bool IsQuiet(const Json::Value& shares) {
   const size_t wanted = fileindex::FolderMgr().GetIndexedShares().size();
   const bool are_idle = std::all_of(shares.begin(), shares.end(), [](const Json::Value& share) {
@@ -205,8 +219,8 @@ std::vector<std::string> AddFolders(const std::vector<std::string>& folders, Voi
 std::string OwnCall() {
   std::error_code error;
   const char* const root = getenv("FILEINDEX_ROOT");  // NOLINT(concurrency-mt-unsafe)
-  return (root == nullptr ? "" : "FILEINDEX_ROOT=" + std::string(root) + " ") +
-         std::filesystem::read_symlink("/proc/self/exe", error).string();
+  return (root == nullptr ? "" : "FILEINDEX_ROOT=" + ForShell(root) + " ") +
+         ForShell(std::filesystem::read_symlink("/proc/self/exe", error).string());
 }
 
 std::string TimeOfDay() {
@@ -237,9 +251,59 @@ void SayWhatIsNew(const Json::Value& shares, std::map<std::string, uint64_t>& op
   }
 }
 
+// Says why shares fail, each reason once until they are done with what failed.
+class FailureNotes {
+ public:
+  explicit FailureNotes(Voice& voice) : voice_(voice) {}
+
+  void Say(const Json::Value& shares) {
+    for (const Json::Value& share : shares) {
+      const std::string name = share["share"].asString();
+      const std::string state = share["state"].asString();
+      const std::string error = share["last_error"].asString();
+      if (state == "idle") {
+        said_.erase(name);
+      } else if (state == "failing" && said_[name] != error) {
+        said_[name] = error;
+        Json::Value fields;
+        fields["share"] = name;
+        voice_.Say("failing", TimeOfDay() + "  " + name + ": fails, and is tried again: " + error,
+                   fields);
+      }
+    }
+  }
+
+ private:
+  Voice& voice_;
+  std::map<std::string, std::string> said_;  // By share.
+};
+
+// Says which shares nothing is done for at present. Whether there are some.
+bool SayWhatRests(const Json::Value& shares, Voice& voice) {
+  bool is_some = false;
+  for (const Json::Value& share : shares) {
+    const std::string name = share["share"].asString();
+    const std::string state = share["state"].asString();
+    if (state != "paused" && state != "unavailable") {
+      continue;
+    }
+    is_some = true;
+    const std::string error = share["last_error"].asString();
+    Json::Value fields;
+    fields["share"] = name;
+    voice.Say(state.c_str(),
+              name + ": " +
+                  (state == "paused" ? "indexing is paused; 'fileindex resume' goes on"
+                   : error.empty()   ? "is unavailable; 'fileindex doctor' says more"
+                                     : "is unavailable: " + error),
+              fields);
+  }
+  return is_some;
+}
+
 // False when a signal came before all of it was found.
 bool AwaitFirstCrawl(const std::vector<std::string>& folders, StopSignals& signals, Stack& stack,
-                     Voice& voice) {
+                     Voice& voice, FailureNotes& failures) {
   const Count total(folders);
   const Clock::time_point began = Clock::now();
   for (;;) {
@@ -252,12 +316,14 @@ bool AwaitFirstCrawl(const std::vector<std::string>& folders, StopSignals& signa
       fields["seconds"] = seconds;
       char text[32];
       snprintf(text, sizeof(text), "%.1f", seconds);
-      voice.Say("ready",
-                "everything can be found: " + Counted(done, "file") + " and folders indexed in " +
-                    text + " s",
+      const bool is_all = !SayWhatRests(shares, voice);
+      voice.Say(is_all ? "ready" : "resting",
+                (is_all ? "everything can be found: " : "the rest can be found: ") +
+                    Counted(done, "file") + " and folders indexed in " + text + " s",
                 fields);
       return true;
     }
+    failures.Say(shares);
     voice.ShowProgress(done, total, seconds);
     if (signals.Await(kProgressInterval)) {
       return false;
@@ -300,7 +366,8 @@ ExitStatus Up(const Arguments& arguments, const Console& console) {
   if (folders.empty()) {
     throw Failure("no folder is indexed; name one: fileindex up DIR");
   }
-  if (!AwaitFirstCrawl(folders, signals, stack, voice)) {
+  FailureNotes failures(voice);
+  if (!AwaitFirstCrawl(folders, signals, stack, voice, failures)) {
     return kDone;
   }
   Json::Value fields;
@@ -316,7 +383,9 @@ ExitStatus Up(const Arguments& arguments, const Console& console) {
   }
   while (!signals.Await(kFollowInterval)) {
     stack.Tend();
-    SayWhatIsNew(AskShares(), operations, voice);
+    const Json::Value shares = AskShares();
+    failures.Say(shares);
+    SayWhatIsNew(shares, operations, voice);
   }
   voice.Say("stopping", "stopping");
   stack.Stop();

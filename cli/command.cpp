@@ -54,6 +54,9 @@ size_t TakeOption(const Command& command, const std::vector<std::string>& words,
   if (option == nullptr) {
     throw UsageError("there is no option '" + name + "'");
   }
+  if (option->value != nullptr && arguments.Has(name)) {
+    throw UsageError("the option " + name + " was given more than once");
+  }
   if (option->value == nullptr) {
     if (equals != std::string::npos) {
       throw UsageError("the option " + name + " takes no value");

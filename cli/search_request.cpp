@@ -53,8 +53,14 @@ int64_t ReadTime(const std::string& text) {
     struct tm parts {};
     parts.tm_isdst = -1;
     const char* const rest = strptime(text.c_str(), format, &parts);
-    if (rest != nullptr && *rest == '\0') {
-      return static_cast<int64_t>(mktime(&parts));
+    if (rest == nullptr || *rest != '\0') {
+      continue;
+    }
+    // 31 February would be a day in March.
+    const int day = parts.tm_mday;
+    const auto instant = static_cast<int64_t>(mktime(&parts));
+    if (parts.tm_mday == day) {
+      return instant;
     }
   }
   throw UsageError("'" + text +

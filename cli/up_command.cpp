@@ -202,11 +202,11 @@ std::vector<std::string> AddFolders(const std::vector<std::string>& folders, Voi
                                     const Console& console) {
   std::vector<std::string> full_paths;
   for (const std::string& folder : folders) {
-    const std::string path = ShareFor(folder, console);
-    const bool is_new = !fileindex::FolderMgr().HasFolder(path);
-    if (is_new) {
-      AddFolder(NewFolder(path), console);
-    }
+    bool is_new = false;
+    AddFolder(folder, console, [&is_new](const Json::Value& record) {
+      is_new = !fileindex::FolderMgr().HasFolder(record["path"].asString());
+      return is_new;
+    });
     full_paths.push_back(RealPath(folder));
     Json::Value fields;
     fields["path"] = full_paths.back();

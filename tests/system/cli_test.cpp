@@ -84,6 +84,8 @@ const CliCase kEngineCases[] = {
     {"SearchFilesOnly", "search --type document --below vol --newer 1d --larger 5 --sort -size", 0,
      "*a.txt\n", ""},
     {"SearchNothing", "search", 2, "", "wants words"},
+    {"SearchTwice", "search x --share docs --share no", 2, "", "--share was given more than once"},
+    {"SearchBadDate", "search x --newer 2026-02-31", 2, "", "'2026-02-31' is no date"},
     {"SearchBadSize", "search x --larger 5q", 2, "", "'5q' is no size"},
     {"Pause", "index pause docs", 0, "paused: the index of docs\n", ""},
     {"SearchPaused", "search museum", 1, "", "not searched: fileindex_docs"},
@@ -104,6 +106,9 @@ const CliCase kFolderCases[] = {
     {"AddBelow", "folder add vol/docs/in", 0, "added: /docs/in (document,audio,video,photo)\n",
      "fileindexd does not run"},
     {"AddRefused", "folder add vol/docs/.git", 3, "", "/docs/.git cannot be indexed"},
+    {"AddNoType", "folder add vol/@eaDir --types fotos", 2, "", "'fotos' is no type"},
+    {"AddRefusedShare", "folder add vol/@eaDir", 3, "", "'@eaDir' was taken out again"},
+    {"NoShareIsLeft", "share remove @eaDir", 3, "", "@eaDir"},
     {"List", "folder list --sort -path", 0,
      "PATH      NAME     GROUP  TYPES                       STATUS\n"
      "/docs/in  in              document,audio,video,photo  finished\n"
@@ -120,6 +125,7 @@ const CliCase kFolderCases[] = {
     {"Summary", "summary", 0, "in       finished\nMy docs  processing\nin all   processing\n", ""},
     {"Delete", "folder delete vol/docs/in", 0, "deleted: /docs/in\n", ""},
     {"LoseTheIndex", "index delete docs", 0, "*deleted", ""},
+    {"DeleteNothing", "folder delete", 2, "", "wants FOLDER"},
     {"DeleteLast", "folder delete --share docs", 0, "deleted: /docs\n", ""},
     {"NoIndex", "index list", 1, "", ""},
     {"AddBack", "folder add vol/docs", 0, "*added", ""},
@@ -222,8 +228,8 @@ TEST_F(Cli, SearchesWhatItHasIndexed) {
 }
 
 TEST_F(Cli, AdministersFolders) {
-  MakeFolders({"vol/docs/in", "vol/docs/.git", "root/var/packages/Vexlo/etc", "root/tmp",
-               "root/var/lib/kavo/fileindex/queue", "root/var/run"});
+  MakeFolders({"vol/docs/in", "vol/docs/.git", "vol/@eaDir", "root/var/packages/Vexlo/etc",
+               "root/tmp", "root/var/lib/kavo/fileindex/queue", "root/var/run"});
   WriteText(files_ / "root/var/run/fileindexd.sock", "");
   CheckWithEngine(kFolderCases);
   EXPECT_EQ(ReadText(files_ / "root/var/lib/kavo/evnotify/fileindex.json"), "{\"queues\": [\n]}\n");

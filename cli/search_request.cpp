@@ -6,6 +6,7 @@
 #include <ctime>
 #include <limits>
 
+#include "cli/folder_paths.h"
 #include "cli/text.h"
 #include "fileindex/elastic_control/share_index.h"
 #include "fileindex/util/file_type.h"
@@ -126,7 +127,7 @@ Json::Value MakeSearchRequest(const Arguments& arguments) {
     data["ids"].append(fileindex::elastic::GetFileIndexID(arguments.Get("--share")));
   }
   if (arguments.Has("--below")) {
-    data["below"] = AbsolutePath(arguments.Get("--below"));
+    data["below"] = IndexedPath(arguments.Get("--below"));
   }
   if (arguments.Has("--name")) {
     data["name"] = arguments.Get("--name");

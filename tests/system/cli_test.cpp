@@ -75,6 +75,8 @@ const CliCase kEngineCases[] = {
     {"List", "index list", 0, "*fileindex_docs  active  /", ""},
     {"Put", "doc put docs vol/docs/a.txt", 0, "*indexed: /", ""},
     {"PutBySharePath", "doc put docs '/docs/Caf\xC3\xA9 \xE9.md'", 0, "*indexed: /", ""},
+    {"PutByLink", "doc put docs link/a.txt", 0, "*vol/docs/a.txt\n", ""},
+    {"PutOutside", "doc put docs vol/other.txt", 3, "", "does not lie in the share 'docs'"},
     {"PutFolder", "doc put docs vol/docs", 0, "*indexed: /", ""},
     {"Get", "doc get docs /docs/a.txt", 0, "*\"KAVOMDExtension\" : \"txt\"", ""},
     {"GetMissing", "doc get docs /docs/none", 1, "", "not in the index"},
@@ -83,6 +85,7 @@ const CliCase kEngineCases[] = {
     {"SearchJson", "search museum --json", 0, "*\"snippet\":\"", ""},
     {"SearchFilesOnly", "search --type document --below vol --newer 1d --larger 5 --sort -size", 0,
      "*a.txt\n", ""},
+    {"SearchBelowLink", "search museum --below link", 0, "*vol/docs/a.txt\n", ""},
     {"SearchNothing", "search", 2, "", "wants words"},
     {"SearchTwice", "search x --share docs --share no", 2, "", "--share was given more than once"},
     {"SearchBadDate", "search x --newer 2026-02-31", 2, "", "'2026-02-31' is no date"},
@@ -116,6 +119,7 @@ const CliCase kFolderCases[] = {
      "2 folders of 2"},
     {"ListJson", "folder list --json --find MY --limit 1", 0, "*\"offset\":0,\"total\":1}", ""},
     {"Get", "folder get vol/docs/", 0, "*types  document\n", ""},
+    {"GetByLink", "folder get link/in", 0, "*/docs/in", ""},
     {"GetOutside", "folder get vol", 3, "", "'vol' lies in no share"},
     {"Groups", "folder groups", 0, "work\n", ""},
     {"Set", "folder set /docs --types none --group ''", 0, "changed: /docs (none)\n", ""},
@@ -218,6 +222,8 @@ TEST_F(Cli, AnswersEveryCommandLine) {
 
 TEST_F(Cli, SearchesWhatItHasIndexed) {
   MakeFolders({"vol/docs"});
+  std::filesystem::create_symlink("vol/docs", files_ / "link");
+  WriteText(files_ / "vol/other.txt", "");
   WriteText(files_ / "vol/docs/a.txt", "The harbour museum.");
   WriteText(files_ / "vol/docs/Caf\xC3\xA9 \xE9.md", "apples");
   const CliCase without[] = {{"NoEngine", "search museum", 3, "", "kavoelasticd does not run"}};
@@ -231,6 +237,7 @@ TEST_F(Cli, AdministersFolders) {
   MakeFolders({"vol/docs/in", "vol/docs/.git", "vol/@eaDir", "root/var/packages/Vexlo/etc",
                "root/tmp", "root/var/lib/kavo/fileindex/queue", "root/var/run"});
   WriteText(files_ / "root/var/run/fileindexd.sock", "");
+  std::filesystem::create_symlink("vol/docs", files_ / "link");
   CheckWithEngine(kFolderCases);
   EXPECT_EQ(ReadText(files_ / "root/var/lib/kavo/evnotify/fileindex.json"), "{\"queues\": [\n]}\n");
 }

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <functional>
 #include <iomanip>
 #include <optional>
 #include <utility>
@@ -110,22 +111,28 @@ std::optional<Arguments> ReadArguments(const Command& command,
   return arguments;
 }
 
+// Throws Failure when what was said cannot be written.
+void FlushOutput(const Console& console) {
+  console.out.flush();
+  if (!console.out) {
+    throw Failure("the output cannot be written");
+  }
+}
+
 ExitStatus RunCommand(const Command& command, const std::vector<std::string>& words,
                       const Console& console) {
   try {
     const std::optional<Arguments> arguments = ReadArguments(command, words);
     if (!arguments.has_value()) {
       PrintHelp(console.out, command);
+      FlushOutput(console);
       return kDone;
     }
     if (const std::string fault = kavo::local::RootFault(); !fault.empty()) {
       throw Failure(fault);
     }
     const ExitStatus status = command.run(*arguments, console);
-    console.out.flush();
-    if (!console.out) {
-      throw Failure("the output cannot be written");
-    }
+    FlushOutput(console);
     return status;
   } catch (const UsageError& error) {
     console.err << kName << " " << command.name << ": " << error.what() << "\n";
@@ -136,6 +143,18 @@ ExitStatus RunCommand(const Command& command, const std::vector<std::string>& wo
     return kFailed;
   } catch (const std::exception& error) {
     console.err << kName << ": " << ForTerminal(error.what()) << "\n";
+    return kFailed;
+  }
+}
+
+// What is no command's.
+ExitStatus Print(const Console& console, const std::function<void()>& print) {
+  try {
+    print();
+    FlushOutput(console);
+    return kDone;
+  } catch (const Failure& failure) {
+    console.err << kName << ": " << failure.what() << "\n";
     return kFailed;
   }
 }
@@ -190,12 +209,10 @@ ExitStatus Run(const std::vector<Command>& commands, const std::vector<std::stri
     return kBadUsage;
   }
   if (words[0] == "--help" || words[0] == "-h" || words[0] == "help") {
-    PrintOverview(console.out, commands);
-    return kDone;
+    return Print(console, [&] { PrintOverview(console.out, commands); });
   }
   if (words[0] == "--version") {
-    console.out << kName << " " << FILEINDEX_VERSION << "\n";
-    return kDone;
+    return Print(console, [&] { console.out << kName << " " << FILEINDEX_VERSION << "\n"; });
   }
   for (const Command& command : commands) {
     if (const size_t used = MatchName(command, words); used > 0) {

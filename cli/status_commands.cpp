@@ -62,9 +62,11 @@ std::string WatchText(const Json::Value& watch) {
 
 std::string TableOf(const Json::Value& all, const std::map<std::string, double>& rates) {
   Rows daemons = {{"DAEMON", "STATE"}};
+  bool is_told = false;  // Which shares there are.
   for (const Json::Value& daemon : all["daemons"]) {
     const std::string socket = daemon["socket"].asString();
     const bool is_closed = daemon["running"].isNull();
+    is_told = is_told || (daemon["name"] == "fileindexd" && daemon["running"] == true);
     daemons.push_back({daemon["name"].asString(), is_closed ? "closed to this user on " + socket
                                                   : daemon["running"].asBool()
                                                       ? "running"
@@ -83,7 +85,9 @@ std::string TableOf(const Json::Value& all, const std::map<std::string, double>&
          ForTerminal(WatchText(share["watch"])), ForTerminal(share["last_error"].asString())});
   }
   return "indexing is " + all["status"].asString() + "\n\n" + Table(daemons) +
-         (shares.size() > 1 ? "\n" + Table(shares) : "\nno share is indexed\n");
+         (shares.size() > 1 ? "\n" + Table(shares)
+          : is_told         ? "\nno share is indexed\n"
+                            : "\nof the shares nothing is told, as fileindexd was not reached\n");
 }
 
 void Show(const Arguments& arguments, const Console& console, Rates& rates, bool again) {

@@ -57,7 +57,8 @@ const CliCase kCases[] = {
 
 // With faults in the folders file and the status file.
 const CliCase kBadConfigCases[] = {
-    {"Check", "config check", 1, "*folders: .[3]: 'photo' is no share path", "6 findings"},
+    {"Check", "config check", 1, "*folders: .[3]: 'photo' is no share path", "7 findings"},
+    {"CheckPlace", "config check", 1, "*.share.\"my photo\"", ""},
     {"CheckJson", "config check --json", 1, "*.status\",\"place\":\".share.photo\"", ""},
     {"Pending", "queue pending /v --queue queue", 3, "", "'fileindex config check' says"},
 };
@@ -209,11 +210,15 @@ TEST_F(Cli, AnswersEveryCommandLine) {
   Check(kCases);
   Program astray = Start("env FILEINDEX_ROOT=root " FILEINDEX_PROGRAM " share list");
   EXPECT_EQ(astray.End(), 3) << "a root that is not absolute: " << astray.text;
+  for (const char* const words : {"--help", "--version", "search --help"}) {
+    Program full = Start("sh -c '" FILEINDEX_PROGRAM " " + std::string(words) + " >/dev/full'");
+    EXPECT_EQ(full.End(), 3) << words;
+  }
   const std::string rest = R"(,"name":"","document":true,"audio":true,"video":true,"photo":true)";
   WriteText(etc + "/fileindex.folders",
             R"([{"path":"/photo")" + rest + R"(,"owner":{}},{"path":"/photo")" + rest +
                 R"(},{"path":"/gone")" + rest + R"(},{"path":"photo")" + rest + "},{}]");
-  WriteText(etc + "/fileindex.status", R"({"share": {"photo": "1"}})");
+  WriteText(etc + "/fileindex.status", R"({"share": {"photo": "1", "my photo": 1}})");
   Check(kBadConfigCases);
   WriteText(etc + "/fileindex.folders", "[\n{");
   WriteText(files_ / "root/etc/kavo/shares.json", "{\"shares\": [\n{\"name\": \"a\"}]}");

@@ -133,13 +133,13 @@ void MoveDatabase(const std::string& from, const std::string& to) {
   rmdir(from.c_str());
 }
 
-std::string SetAside(const std::string& folder) {
+std::string SetAside(const std::string& folder, const std::string& why) {
   if (!Exists(Database(folder))) {
     return "";
   }
   std::string aside;
   for (int n = 1; aside.empty() || Exists(aside); ++n) {
-    aside = Database(folder) + ".damaged-" + std::to_string(n);
+    aside = Database(folder) + "." + why + "-" + std::to_string(n);
   }
   for (const char* suffix : kSuffixes) {
     const std::string file = Database(folder) + suffix;

@@ -32,9 +32,9 @@ void RemoveIndexFolder(const std::string& folder);
 // is there; across disks as a copy that stands whole before the old one goes. Throws Failure.
 void MoveDatabase(const std::string& from, const std::string& to);
 
-// Renames the database to "index.db.damaged-N" with a new N; the name, or "" when there was
-// nothing. Throws Failure kStorage.
-std::string SetAside(const std::string& folder);
+// Renames the database to "index.db.WHY-N" with a new N; the name, or "" when there was nothing.
+// RemoveIndexFolder() removes those that are "damaged". Throws Failure kStorage.
+std::string SetAside(const std::string& folder, const std::string& why = "damaged");
 
 }  // namespace vexlo::elasticd
 

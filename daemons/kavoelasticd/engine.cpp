@@ -441,6 +441,10 @@ void Engine::IndexConfigSet(const Json::Value& data) {
   if (entry.path != from && Exists(DatabaseFile(from))) {
     MakeFolders(entry.path);
     // For good before the registry tells of the move: a database that stands there counts as moved.
+    // It may be somebody's backup.
+    if (slot->entry.move_to != entry.path) {
+      SetAside(entry.path, "found");
+    }
     RemoveDatabase(entry.path);
     SyncFolder(entry.path);
     RegistryEntry moving = slot->entry;

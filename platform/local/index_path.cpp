@@ -20,6 +20,14 @@ bool IsEncoded(char byte) {
   return byte == '%' || byte == '/' || value < 0x20 || value == 0x7f;
 }
 
+// The snapshot of a queue is the queue's name with this, so no queue may end so.
+constexpr std::string_view kSnapshotSuffix = ".tmp";
+
+// Where the "." of such an end stands; the path's length where it has another.
+size_t EncodedDot(std::string_view path) {
+  return path.ends_with(kSnapshotSuffix) ? path.size() - kSnapshotSuffix.size() : path.size();
+}
+
 char* Append(char* out, std::string_view text) { return std::copy(text.begin(), text.end(), out); }
 
 int Compose(const char* subfolder, const char* share_path, char* buffer, size_t bytes) {
@@ -36,8 +44,9 @@ int Compose(const char* subfolder, const char* share_path, char* buffer, size_t 
     return Fail(KAVO_ERR_BAD_PARAMETER, ERANGE);
   }
   char* out = Append(Append(Append(buffer, root), kIndexFolder), subfolder);
-  for (const char byte : path) {
-    if (IsEncoded(byte)) {
+  for (size_t i = 0; i < path.size(); ++i) {
+    const char byte = path[i];
+    if (IsEncoded(byte) || i == EncodedDot(path)) {
       const auto value = static_cast<unsigned char>(byte);
       *out++ = '%';
       *out++ = kHex[value >> 4];
@@ -53,8 +62,9 @@ int Compose(const char* subfolder, const char* share_path, char* buffer, size_t 
 }  // namespace
 
 size_t EncodedBytes(std::string_view share_path) {
-  return share_path.size() +
-         2 * static_cast<size_t>(std::count_if(share_path.begin(), share_path.end(), IsEncoded));
+  const auto encoded = std::count_if(share_path.begin(), share_path.end(), IsEncoded) +
+                       (EncodedDot(share_path) < share_path.size() ? 1 : 0);
+  return share_path.size() + 2 * static_cast<size_t>(encoded);
 }
 
 }  // namespace kavo::local

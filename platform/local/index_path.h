@@ -14,8 +14,8 @@ inline constexpr char kIndexFolder[] = "/var/lib/kavo/fileindex";
 // temporary name unique.
 inline constexpr size_t kMaxEncodedBytes = 240;
 
-// The length of the file name that a share's path becomes: '%', '/' and control bytes are written
-// as "%XX", all others stand as they are.
+// The length of the file name that a share's path becomes: '%', '/', control bytes and the "." of a
+// ".tmp" at its end are written as "%XX", all others stand as they are.
 size_t EncodedBytes(std::string_view share_path);
 
 }  // namespace kavo::local

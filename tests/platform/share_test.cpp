@@ -252,6 +252,7 @@ TEST_F(Shares, QueueAndIndexHaveAPlace) {
   for (const auto& [path, name, error] : std::vector<std::tuple<std::string, std::string, int>>{
            {"/volume1/photo", "%2Fvolume1%2Fphoto", 0},
            {"/caf\xE9 \n\x7f", "%2Fcaf\xE9 %0A%7F", 0},
+           {"/v.tmp/a.tmp", "%2Fv.tmp%2Fa%2Etmp", 0},  // Or it would be a snapshot of "/v.tmp/a".
            {longest, "%2F" + longest.substr(1), 0},
            {longest + "n", "", ENAMETOOLONG},
            {"", "", EINVAL},

@@ -287,7 +287,7 @@ TEST_F(Fileindexd, TakesCareOfTheStatusBitsAndEndsAPause) {
   Write("z", "untold");
   StatusMgr().SetShareStatus("docs", 1);
   Signal("kavocontentextractd", SIGCONT);
-  EXPECT_TRUE(Await([this] { return StatusMgr().GetShareStatus("docs") == 0; }));
+  EXPECT_TRUE(Await([] { return StatusMgr().GetShareStatus("docs") == 0; }));
   ASSERT_TRUE(AwaitAllDone());
   ExpectIndexed();
   // Something of which a new index knows nothing.

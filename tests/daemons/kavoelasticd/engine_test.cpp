@@ -209,10 +209,13 @@ TEST(Engine, IndexesArePausedMovedRenamedAndDeleted) {
   for (const char* command : {"commit", "document_get_by_query", "document_upsert_by_id"}) {
     EXPECT_EQ(engine.Do(command, R"({"doc_id":"/x","data":{}})"), "2004") << command;
   }
-  // Moved while it is paused, it stays so.
+  // Moved while it is paused, it stays so. What stands there is kept.
+  std::filesystem::create_directories(other / "m/n");
+  WriteText(other / "m/n/index.db", "a backup");
   EXPECT_EQ(engine.Move(other / "m/n"), "ok");
   EXPECT_EQ(state(), "i=paused@n j=active@j ");
   expect_private(other / "m/n/index.db");
+  EXPECT_EQ(ReadText(other / "m/n/index.db.found-1"), "a backup");
   EXPECT_FALSE(std::filesystem::exists(folder / "i"));
   EXPECT_EQ(engine.Do("index_resume"), "ok");
   EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");

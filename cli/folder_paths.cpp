@@ -19,14 +19,14 @@
 namespace vexlo::cli {
 
 std::string IndexedPath(const std::string& named) {
-  const std::string path = AbsolutePath(named);
+  std::string path = AbsolutePath(named);
   std::error_code error;
   const std::filesystem::path real =
       std::filesystem::weakly_canonical(std::filesystem::absolute(named), error);
   if (error || real == path) {
     return path;
   }
-  const std::string followed = AbsolutePath(real);
+  std::string followed = AbsolutePath(real);
   std::vector<kavo::local::Share> shares;
   try {
     shares = kavo::local::ReadShares(kavo::local::SharesFile());

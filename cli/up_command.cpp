@@ -400,11 +400,13 @@ std::vector<Command> UpCommands() {
        "[DIR...]",
        "starts everything, indexes folders and follows their changes until Ctrl-C",
        "Starts the daemons that do not run yet, adds the folders (a folder that no share holds is\n"
-       "made a share), shows how far the first crawl is, and says so when everything can be "
-       "found.\n"
-       "Then it goes on following changes. Without DIR it goes on with the folders that are\n"
-       "indexed. Ctrl-C stops what it started within five seconds; the index stays. What the\n"
-       "daemons say is in var/log/fileindex below the root.\n"
+       "made a share), shows how far the first crawl is, and says so when everything can be\n"
+       "found, or which shares are paused or unavailable, and why one fails. Then it goes on\n"
+       "following changes. Without DIR it goes on with the folders that are indexed. A daemon "
+       "that\n"
+       "ran already is left alone, and started when it ends. Ctrl-C stops what it started within\n"
+       "five seconds; the index stays. What the daemons say is in var/log/fileindex below the\n"
+       "root.\n"
        "\n"
        "  fileindex up ~/Documents\n",
        {{"--json", nullptr, "one JSON object a line: event, text, and what belongs to it"}},

@@ -265,6 +265,13 @@ TEST_F(Cli, UpTakesOverTheDaemonsOfAnotherThatEnds) {
   EXPECT_TRUE(unwatched.Await("nobody watches the share docs\n"));
   EXPECT_EQ(unwatched.End(), 0);
   EXPECT_EQ(second.End(SIGINT), 0) << second.text;
+  const CliCase pause[] = {{"Pause", "pause", 0, "*is paused", "will go by the status file"}};
+  Check(pause);
+  Program paused = Start(FILEINDEX_PROGRAM " up");
+  EXPECT_TRUE(paused.Await("docs: indexing is paused; 'fileindex resume' goes on\n"));
+  EXPECT_TRUE(paused.Await("following"));
+  EXPECT_EQ(paused.text.find("everything can be found"), std::string::npos) << paused.text;
+  EXPECT_EQ(paused.End(SIGINT), 0);
 }
 
 TEST_F(Cli, WatchDeliversWhatAnEarlierRunLeftAndThenWhatHappens) {

@@ -90,7 +90,7 @@ std::string DocumentPath(const std::string& path) {
   std::string absolute = AbsolutePath(path);
   const std::string folder = absolute.substr(0, std::max<size_t>(absolute.rfind('/'), 1));
   const std::string followed = IndexedPath(folder);
-  if (const std::string in_share = followed + "/" + Basename(absolute);
+  if (std::string in_share = followed + "/" + Basename(absolute);
       followed != folder && !SharePathOf(in_share).empty()) {
     return in_share;
   }

@@ -91,11 +91,12 @@ std::vector<std::string> ShareFaults(const Json::Value& state) {
     const std::string name = ForTerminal(share);
     const std::string index = indexes[fileindex::elastic::GetFileIndexID(share)];
     if (list && index != "active") {
-      faults.push_back(index.empty() ? "the share " + name + " has no index"
-                                     : "the index of the share " + name + " is " + index);
+      std::string& fault = faults.emplace_back("the ");
+      fault.append(index.empty() ? "share " : "index of the share ").append(name);
+      fault.append(index.empty() ? " has no index" : " is ").append(index);
     }
     if (answering.contains("fileindexd") && !with_worker.contains(share)) {
-      faults.push_back("fileindexd has no worker for the share " + name);
+      faults.emplace_back("fileindexd has no worker for the share ").append(name);
     }
   }
   std::erase(faults, "");

@@ -5,6 +5,7 @@
 #include <cerrno>
 #include <string>
 
+#include "cli/service.h"
 #include "cli/shares.h"
 #include "cli/text.h"
 #include "common/json.h"
@@ -20,8 +21,8 @@ constexpr fileindex::FixedPath kSearchSocket("/var/run/kavoelasticd.search.sock"
 constexpr int kConnectSeconds = 10;
 
 [[noreturn]] void FailWithoutEngine() {
-  throw Failure("the search engine kavoelasticd does not run (nobody answers on '" +
-                fileindex::kElasticdSocketPath.Get() + "')");
+  throw Failure(
+      WhyUnreached("the search engine kavoelasticd", fileindex::kElasticdSocketPath.Get()));
 }
 
 }  // namespace

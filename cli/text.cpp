@@ -46,10 +46,32 @@ std::string ForTerminal(std::string_view text) {
   return shown;
 }
 
+std::string ForShell(const std::string& word) {
+  constexpr std::string_view kPlain =
+      "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789_-+./:,@%";
+  if (!word.empty() && word.find_first_not_of(kPlain) == std::string::npos) {
+    return word;
+  }
+  std::string quoted = "'";
+  for (const char c : word) {
+    quoted += c == '\'' ? std::string("'\\''") : std::string(1, c);
+  }
+  return quoted + "'";
+}
+
 std::string CauseOf(std::string_view reason) {
   constexpr std::string_view kMark = "reason=";
   const size_t at = reason.rfind(kMark);
   return std::string(at == std::string_view::npos ? reason : reason.substr(at + kMark.size()));
+}
+
+std::string TextOf(const Error& error) {
+  std::string reason = error.what();
+  if (reason.empty() && error.GetErrorCode() == ERR_CREDENTIALS) {
+    reason = "this user has not the rights for it; root has";
+  }
+  return ForTerminal(reason) + " (error " + std::to_string(static_cast<int>(error.GetErrorCode())) +
+         ")";
 }
 
 std::string AbsolutePath(const std::string& path) {

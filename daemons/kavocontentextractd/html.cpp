@@ -21,7 +21,7 @@ namespace field = fileindex::elastic::field;
 constexpr size_t kMostBytes = size_t{32} << 20;
 constexpr size_t kPartBytes = size_t{64} << 10;
 // How far into a page its encoding may be told.
-constexpr size_t kHeadBytes = size_t{4} << 10;
+constexpr size_t kHeadBytes = size_t{64} << 10;
 
 // Elements between whose texts a word does not go on.
 constexpr std::string_view kBlocks[] = {
@@ -144,32 +144,87 @@ struct Page {
   }
 };
 
-// Whether the page says by itself what encoding it has.
-bool TellsEncoding(const std::string& html) {
+// The next tag, without its brackets, taken off the page with all before it. Comments are none.
+std::string_view TakeTag(std::string_view& html) {
+  html.remove_prefix(std::min(html.find('<'), html.size()));
+  while (html.starts_with("<!--")) {
+    html.remove_prefix(std::min(html.find("-->"), html.size()));
+    html.remove_prefix(std::min(html.find('<'), html.size()));
+  }
+  const std::string_view tag = html.substr(0, html.find('>'));
+  html.remove_prefix(tag.size());
+  return tag.substr(std::min<size_t>(tag.size(), 1));
+}
+
+// What stands behind the name and "=", be it an attribute or a part of one; "" without it.
+std::string_view ValueOf(std::string_view tag, std::string_view name) {
+  const auto skip = [&tag](std::string_view bytes) {
+    tag.remove_prefix(std::min(tag.find_first_not_of(bytes), tag.size()));
+  };
+  const size_t at = tag.find(name);
+  if (at == std::string_view::npos) {
+    return {};
+  }
+  tag.remove_prefix(at + name.size());
+  skip(" \t\r\n");
+  if (!tag.starts_with('=')) {
+    return {};
+  }
+  skip("= \t\r\n\"'");
+  return tag.substr(0, tag.find_first_of(" \t\r\n\"';/?"));
+}
+
+// The encoding that the page says it has, "" without one. UTF-8 shows in the bytes, and in others
+// that do not have ASCII's letters nobody could read what the page says.
+std::string ToldEncoding(const std::string& html) {
   std::string head = html.substr(0, kHeadBytes);
   std::transform(head.begin(), head.end(), head.begin(),
                  [](char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c + 32) : c; });
-  return head.find("charset=") != std::string::npos || head.find("encoding=") != std::string::npos;
-}
-
-// The bytes as UTF-8, unless the page says what it is.
-std::optional<std::string> AsUtf8(const std::string& html, bool has_more) {
-  if (!html.starts_with("\xFF\xFE") && !html.starts_with("\xFE\xFF")) {
-    if (IsUtf8(html, has_more)) {
-      return html;
-    }
-    if (TellsEncoding(html)) {
-      return std::nullopt;
+  std::string_view rest = head;
+  while (!rest.empty()) {
+    const std::string_view tag = TakeTag(rest);
+    const std::string_view label = tag.starts_with("?xml")   ? ValueOf(tag, "encoding")
+                                   : tag.starts_with("meta") ? ValueOf(tag, "charset")
+                                                             : std::string_view();
+    std::string encoding = FindEncoding(std::string(label));
+    if (!encoding.empty() && label.find("utf") == std::string::npos &&
+        Convert("<", encoding) == "<") {
+      return encoding;
     }
   }
-  return DecodeText(html, has_more);
+  return "";
+}
+
+// Whether it begins as pages do, and as next to nothing does that is encrypted.
+bool IsMarkup(std::string_view bytes) {
+  bytes.remove_prefix(std::min(bytes.find_first_not_of(" \t\r\n\f"), bytes.size()));
+  const char c = bytes.size() > 1 && bytes.front() == '<' ? bytes[1] : '\0';
+  return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || c == '!' || c == '?';
+}
+
+// The page as UTF-8; nothing for what is no text. The parser is given nothing else, as it ends at
+// the first byte that an encoding has no character for.
+std::optional<std::string> AsUtf8(const std::string& html, bool has_more) {
+  if (!html.starts_with("\xEF\xBB\xBF")) {
+    if (IsUtf8(html, has_more) && !HasShifts(html)) {
+      return html;
+    }
+    if (const std::string told = ToldEncoding(html); !told.empty()) {
+      return Convert(html, told);
+    }
+  }
+  std::optional<std::string> text = DecodeText(html, has_more);
+  // Some pages have a stray control character.
+  return text || !IsMarkup(html) ? text : Convert(html, GuessEncoding(html));
 }
 
 }  // namespace
 
 void AddHtml(const std::string& html, bool is_whole, Document& document) {
-  const std::optional<std::string> utf8 = AsUtf8(html, /*has_more=*/html.size() >= kMostBytes);
-  const std::string& text = utf8 ? *utf8 : html;
+  const std::optional<std::string> text = AsUtf8(html, /*has_more=*/html.size() >= kMostBytes);
+  if (!text) {
+    return;
+  }
   xmlSAXHandler sax{};
   sax.startElement = Page::Start;
   sax.endElement = Page::End;
@@ -178,17 +233,19 @@ void AddHtml(const std::string& html, bool is_whole, Document& document) {
   sax.ignorableWhitespace = Page::Characters;
   Page page{document, is_whole, 0, false, {}, nullptr};
   const std::unique_ptr<htmlParserCtxt, void (*)(htmlParserCtxtPtr)> parser(
-      htmlCreatePushParserCtxt(&sax, &page, nullptr, 0, nullptr,
-                               utf8 ? XML_CHAR_ENCODING_UTF8 : XML_CHAR_ENCODING_NONE),
+      htmlCreatePushParserCtxt(&sax, &page, nullptr, 0, nullptr, XML_CHAR_ENCODING_UTF8),
       htmlFreeParserCtxt);
   if (parser == nullptr) {
     throw std::bad_alloc();
   }
   htmlCtxtUseOptions(parser.get(), HTML_PARSE_RECOVER | HTML_PARSE_NONET | HTML_PARSE_NOERROR |
-                                       HTML_PARSE_NOWARNING | (utf8 ? HTML_PARSE_IGNORE_ENC : 0));
-  for (size_t at = 0; at < text.size() && !document.text.IsFull(); at += kPartBytes) {
-    const size_t size = std::min(kPartBytes, text.size() - at);
-    htmlParseChunk(parser.get(), text.data() + at, static_cast<int>(size), /*terminate=*/0);
+                                       HTML_PARSE_NOWARNING | HTML_PARSE_IGNORE_ENC);
+  for (size_t at = 0; at < text->size() && !document.text.IsFull(); at += kPartBytes) {
+    const size_t size = std::min(kPartBytes, text->size() - at);
+    if (htmlParseChunk(parser.get(), text->data() + at, static_cast<int>(size), /*terminate=*/0) ==
+        XML_ERR_NO_MEMORY) {
+      throw std::bad_alloc();
+    }
   }
   htmlParseChunk(parser.get(), nullptr, 0, /*terminate=*/1);
   if (page.thrown) {

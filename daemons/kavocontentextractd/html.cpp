@@ -25,10 +25,14 @@ constexpr size_t kHeadBytes = size_t{64} << 10;
 
 // Elements between whose texts a word does not go on.
 constexpr std::string_view kBlocks[] = {
-    "address", "article",  "aside",      "blockquote", "br",   "caption", "dd",    "div", "dl",
-    "dt",      "fieldset", "figcaption", "footer",     "form", "h1",      "h2",    "h3",  "h4",
-    "h5",      "h6",       "header",     "hr",         "li",   "main",    "nav",   "ol",  "option",
-    "p",       "pre",      "section",    "table",      "td",   "th",      "title", "tr",  "ul"};
+    "address", "article",   "aside",    "blockquote", "body",    "br",       "button",  "canvas",
+    "caption", "center",    "datalist", "dd",         "details", "dialog",   "dir",     "div",
+    "dl",      "dt",        "fieldset", "figcaption", "figure",  "footer",   "form",    "h1",
+    "h2",      "h3",        "h4",       "h5",         "h6",      "head",     "header",  "hgroup",
+    "hr",      "iframe",    "input",    "label",      "legend",  "li",       "listing", "main",
+    "marquee", "menu",      "nav",      "noframes",   "ol",      "optgroup", "option",  "output",
+    "p",       "plaintext", "pre",      "search",     "section", "select",   "summary", "table",
+    "td",      "textarea",  "th",       "title",      "tr",      "tspan",    "ul",      "xmp"};
 constexpr std::string_view kCells[] = {"option", "td", "th"};
 constexpr std::string_view kHidden[] = {"noscript", "object", "script", "style", "svg", "template"};
 

@@ -116,6 +116,10 @@ inline std::vector<Sample> Samples() {
        R"({"KAVOMDTextContent":"gr\u00fcn\n"})"},
       {"html with a byte-order mark", "\xEF\xBB\xBF<html><title>a</title>b",
        R"({"KAVOMDTextContent":"a\nb\n","KAVOMDTitle":"a"})"},
+      {"html with blocks of all kinds",
+       "<html><details><summary>a</summary>b</details><center>c</center><textarea>d</textarea>"
+       "<button>e</button><button>f</button><svg><title>no</title><text>no</text></svg>g",
+       R"({"KAVOMDTextContent":"a\nb\nc\nd\ne\nf\ng\n","KAVOMDTitle":null})"},
       {"epub of many encodings, and with an encrypted page",
        Zip({{"mimetype", "application/epub+zip"},
             {"O/1.xhtml", "<?xml version='1.0' encoding='euc-kr'?><html>\x8C\x63\xB9\xE6</html>"},

@@ -25,16 +25,20 @@ constexpr size_t kHeadBytes = size_t{64} << 10;
 
 // Elements between whose texts a word does not go on.
 constexpr std::string_view kBlocks[] = {
-    "address", "article",   "aside",    "blockquote", "body",    "br",       "button",  "canvas",
-    "caption", "center",    "datalist", "dd",         "details", "dialog",   "dir",     "div",
-    "dl",      "dt",        "fieldset", "figcaption", "figure",  "footer",   "form",    "h1",
-    "h2",      "h3",        "h4",       "h5",         "h6",      "head",     "header",  "hgroup",
-    "hr",      "iframe",    "input",    "label",      "legend",  "li",       "listing", "main",
-    "marquee", "menu",      "nav",      "noframes",   "ol",      "optgroup", "option",  "output",
-    "p",       "plaintext", "pre",      "search",     "section", "select",   "summary", "table",
-    "td",      "textarea",  "th",       "title",      "tr",      "tspan",    "ul",      "xmp"};
+    "address", "article", "aside",     "blockquote", "body",       "br",      "button",   "canvas",
+    "caption", "center",  "datalist",  "dd",         "desc",       "details", "dialog",   "dir",
+    "div",     "dl",      "dt",        "fieldset",   "figcaption", "figure",  "footer",   "form",
+    "h1",      "h2",      "h3",        "h4",         "h5",         "h6",      "head",     "header",
+    "hgroup",  "hr",      "iframe",    "input",      "label",      "legend",  "li",       "listing",
+    "main",    "marquee", "menu",      "nav",        "noframes",   "ol",      "optgroup", "option",
+    "output",  "p",       "plaintext", "pre",        "search",     "section", "select",   "summary",
+    "table",   "td",      "text",      "textarea",   "th",         "title",   "tr",       "tspan",
+    "ul",      "xmp"};
 constexpr std::string_view kCells[] = {"option", "td", "th"};
-constexpr std::string_view kHidden[] = {"noscript", "object", "script", "style", "svg", "template"};
+// An illustrator writes itself a copy into its drawings.
+constexpr std::string_view kHidden[] = {"i:pgf",  "metadata", "noscript", "object",
+                                        "script", "style",    "svg",      "template"};
+constexpr std::string_view kDrawing = "svg";
 
 template <size_t N>
 bool IsOneOf(const std::string_view (&names)[N], std::string_view name) {
@@ -47,7 +51,8 @@ std::string_view TextOf(const xmlChar* text) {
 
 struct Page {
   Document& document;
-  bool is_whole;  // Its title and author are those of the document.
+  bool is_whole;    // Its title and author are those of the document.
+  bool is_drawing;  // By itself, not one within a page.
   int hidden = 0;
   bool is_title = false;
   Text title;
@@ -65,6 +70,10 @@ struct Page {
     } catch (...) {
       thrown = std::current_exception();
     }
+  }
+
+  [[nodiscard]] bool IsHidden(std::string_view name) const {
+    return IsOneOf(kHidden, name) && !(is_drawing && name == kDrawing);
   }
 
   void Break(std::string_view name) {
@@ -101,8 +110,9 @@ struct Page {
     Page& page = Of(data);
     page.Guard([&] {
       const std::string_view name = TextOf(element);
-      page.hidden += IsOneOf(kHidden, name) ? 1 : 0;
-      page.is_title = page.hidden == 0 && name == "title";
+      page.hidden += page.IsHidden(name) ? 1 : 0;
+      // The parts of a drawing have titles, too.
+      page.is_title = page.hidden == 0 && name == "title" && page.title.Get().empty();
       page.Break(name);
       if (page.is_whole && name == "meta") {
         page.Meta(attributes);
@@ -113,7 +123,7 @@ struct Page {
     Page& page = Of(data);
     page.Guard([&] {
       const std::string_view name = TextOf(element);
-      page.hidden -= IsOneOf(kHidden, name) && page.hidden > 0 ? 1 : 0;
+      page.hidden -= page.IsHidden(name) && page.hidden > 0 ? 1 : 0;
       page.is_title = false;
       page.Break(name);
     });
@@ -199,6 +209,20 @@ std::string ToldEncoding(const std::string& html) {
   return "";
 }
 
+// From the outermost element on, when that is a drawing's; else "". Types do not tell, as pages
+// have drawings in them, and what a drawing declares before is nothing that an HTML parser knows.
+std::string_view FindDrawing(std::string_view page) {
+  std::string_view rest = page;
+  while (!rest.empty()) {
+    const std::string_view tag = TakeTag(rest);
+    if (!tag.empty() && tag.front() != '?' && tag.front() != '!') {
+      const bool is_drawing = tag.substr(0, tag.find_first_of(" \t\r\n/")) == kDrawing;
+      return is_drawing ? page.substr(page.size() - rest.size() - tag.size() - 1) : "";
+    }
+  }
+  return "";
+}
+
 // Whether it begins as pages do, and as next to nothing does that is encrypted.
 bool IsMarkup(std::string_view bytes) {
   bytes.remove_prefix(std::min(bytes.find_first_not_of(" \t\r\n\f"), bytes.size()));
@@ -235,7 +259,9 @@ void AddHtml(const std::string& html, bool is_whole, Document& document) {
   sax.characters = Page::Characters;
   sax.cdataBlock = Page::Characters;
   sax.ignorableWhitespace = Page::Characters;
-  Page page{document, is_whole, 0, false, {}, nullptr};
+  const std::string_view drawing = FindDrawing(*text);
+  std::string_view rest = drawing.empty() ? *text : drawing;
+  Page page{document, is_whole, !drawing.empty(), 0, false, {}, nullptr};
   const std::unique_ptr<htmlParserCtxt, void (*)(htmlParserCtxtPtr)> parser(
       htmlCreatePushParserCtxt(&sax, &page, nullptr, 0, nullptr, XML_CHAR_ENCODING_UTF8),
       htmlFreeParserCtxt);
@@ -244,12 +270,13 @@ void AddHtml(const std::string& html, bool is_whole, Document& document) {
   }
   htmlCtxtUseOptions(parser.get(), HTML_PARSE_RECOVER | HTML_PARSE_NONET | HTML_PARSE_NOERROR |
                                        HTML_PARSE_NOWARNING | HTML_PARSE_IGNORE_ENC);
-  for (size_t at = 0; at < text->size() && !document.text.IsFull(); at += kPartBytes) {
-    const size_t size = std::min(kPartBytes, text->size() - at);
-    if (htmlParseChunk(parser.get(), text->data() + at, static_cast<int>(size), /*terminate=*/0) ==
-        XML_ERR_NO_MEMORY) {
+  while (!rest.empty() && !document.text.IsFull()) {
+    const std::string_view part = rest.substr(0, kPartBytes);
+    if (htmlParseChunk(parser.get(), part.data(), static_cast<int>(part.size()),
+                       /*terminate=*/0) == XML_ERR_NO_MEMORY) {
       throw std::bad_alloc();
     }
+    rest.remove_prefix(part.size());
   }
   htmlParseChunk(parser.get(), nullptr, 0, /*terminate=*/1);
   if (page.thrown) {

@@ -120,6 +120,11 @@ inline std::vector<Sample> Samples() {
        "<html><details><summary>a</summary>b</details><center>c</center><textarea>d</textarea>"
        "<button>e</button><button>f</button><svg><title>no</title><text>no</text></svg>g",
        R"({"KAVOMDTextContent":"a\nb\nc\nd\ne\nf\ng\n","KAVOMDTitle":null})"},
+      {"svg",
+       "<?xml version='1.0'?><!DOCTYPE svg [<!ENTITY a 'b'>]><!-- <p> --><svg><title>Map</title>"
+       "<style>no</style><metadata>no</metadata><desc>of</desc><g><title>Pier</title><text>har"
+       "<tspan>bour</tspan></text><text>x</text></g><svg><text>y</text></svg></svg>",
+       R"({"KAVOMDTextContent":"Map\nof\nPier\nhar\nbour\nx\ny\n","KAVOMDTitle":"Map"})"},
       {"epub of many encodings, and with an encrypted page",
        Zip({{"mimetype", "application/epub+zip"},
             {"O/1.xhtml", "<?xml version='1.0' encoding='euc-kr'?><html>\x8C\x63\xB9\xE6</html>"},

@@ -136,6 +136,11 @@ inline std::vector<Sample> Samples() {
        R"({\*\generator no;}The {\b har}bour\'cf \u8364?5 \u55357?\u56832?\par{\pict 01ab}\{x\}\tab y})",
        R"({"KAVOMDTextContent":"The harbour\u041f \u20ac5 \ud83d\ude00\n{x}\ty","KAVOMDTitle":"Plan",)"
        R"("KAVOMDAuthors":"Ana","KAVOMDContentError":null})"},
+      {"rtf with fonts of many encodings, and a text box",
+       R"({\rtf1\pca\deff3{\info{\title\'94}}{\fonttbl{\f0\fcharset0 A;}{\f1\fcharset204 B;})"
+       R"({\f2\fcharset128 C;}{\f3\fcharset238 D;}}\'9c\f0\'94{\f1\'cf\f2\'8d\'60}\'94\plain\'9c)"
+       R"({\shp{\*\shpinst no{\shptxt box\par}}{\shprslt no}}\f1\'cf})",
+       R"({"KAVOMDTextContent":"\u015b\u00f6\u041f\u6e2f\u00f6\u015b\nbox\n\u041f","KAVOMDTitle":"\u00f6"})"},
       {"cut rtf", R"({\rtf1 some {\b text)",
        R"({"KAVOMDTextContent":"some text","KAVOMDContentError":"damaged: the RTF ends within a group"})"},
       {"photo", Data("photo.jpg"),

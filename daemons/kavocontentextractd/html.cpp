@@ -32,8 +32,8 @@ constexpr std::string_view kBlocks[] = {
     "hgroup",  "hr",      "iframe",    "input",      "label",      "legend",  "li",       "listing",
     "main",    "marquee", "menu",      "nav",        "noframes",   "ol",      "optgroup", "option",
     "output",  "p",       "plaintext", "pre",        "search",     "section", "select",   "summary",
-    "table",   "td",      "text",      "textarea",   "th",         "title",   "tr",       "tspan",
-    "ul",      "xmp"};
+    "table",   "td",      "text",      "textarea",   "th",         "title",   "tr",       "ul",
+    "xmp"};
 constexpr std::string_view kCells[] = {"option", "td", "th"};
 // An illustrator writes itself a copy into its drawings.
 constexpr std::string_view kHidden[] = {"i:pgf",  "metadata", "noscript", "object",
@@ -49,6 +49,15 @@ std::string_view TextOf(const xmlChar* text) {
   return text == nullptr ? std::string_view() : reinterpret_cast<const char*>(text);
 }
 
+std::string_view FindAttribute(const xmlChar** attributes, std::string_view name) {
+  for (; attributes != nullptr && attributes[0] != nullptr; attributes += 2) {
+    if (TextOf(attributes[0]) == name) {
+      return TextOf(attributes[1]);
+    }
+  }
+  return {};
+}
+
 struct Page {
   Document& document;
   bool is_whole;    // Its title and author are those of the document.
@@ -56,6 +65,7 @@ struct Page {
   int hidden = 0;
   bool is_title = false;
   Text title;
+  std::string line;  // Where the text of a drawing stands, as it says itself.
   std::exception_ptr thrown;
 
   static Page& Of(void* data) { return *static_cast<Page*>(data); }
@@ -84,17 +94,20 @@ struct Page {
     }
   }
 
-  void Meta(const xmlChar** attributes) {
-    std::string name;
-    std::string_view content;
-    for (; attributes != nullptr && attributes[0] != nullptr; attributes += 2) {
-      const std::string_view key = TextOf(attributes[0]);
-      if (key == "name") {
-        name = TextOf(attributes[1]);
-      } else if (key == "content") {
-        content = TextOf(attributes[1]);
-      }
+  // Programs that set letters one by one put parts of a word into elements of their own.
+  void DrawnText(std::string_view name, const xmlChar** attributes) {
+    const std::string_view height = FindAttribute(attributes, "y");
+    if (name == "text") {
+      line = height.empty() ? "0" : height;
+    } else if (height.empty() ? !FindAttribute(attributes, "dy").empty() : height != line) {
+      document.text.EndLine();
+      line = height.empty() ? line : height;
     }
+  }
+
+  void Meta(const xmlChar** attributes) {
+    std::string name(FindAttribute(attributes, "name"));
+    const std::string_view content = FindAttribute(attributes, "content");
     std::transform(name.begin(), name.end(), name.begin(),
                    [](char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c + 32) : c; });
     if (name == "author") {
@@ -114,6 +127,9 @@ struct Page {
       // The parts of a drawing have titles, too.
       page.is_title = page.hidden == 0 && name == "title" && page.title.Get().empty();
       page.Break(name);
+      if (page.is_drawing && (name == "text" || name == "tspan")) {
+        page.DrawnText(name, attributes);
+      }
       if (page.is_whole && name == "meta") {
         page.Meta(attributes);
       }
@@ -261,7 +277,7 @@ void AddHtml(const std::string& html, bool is_whole, Document& document) {
   sax.ignorableWhitespace = Page::Characters;
   const std::string_view drawing = FindDrawing(*text);
   std::string_view rest = drawing.empty() ? *text : drawing;
-  Page page{document, is_whole, !drawing.empty(), 0, false, {}, nullptr};
+  Page page{document, is_whole, !drawing.empty(), 0, false, {}, {}, nullptr};
   const std::unique_ptr<htmlParserCtxt, void (*)(htmlParserCtxtPtr)> parser(
       htmlCreatePushParserCtxt(&sax, &page, nullptr, 0, nullptr, XML_CHAR_ENCODING_UTF8),
       htmlFreeParserCtxt);

@@ -123,8 +123,9 @@ inline std::vector<Sample> Samples() {
       {"svg",
        "<?xml version='1.0'?><!DOCTYPE svg [<!ENTITY a 'b'>]><!-- <p> --><svg><title>Map</title>"
        "<style>no</style><metadata>no</metadata><desc>of</desc><g><title>Pier</title><text>har"
-       "<tspan>bour</tspan></text><text>x</text></g><svg><text>y</text></svg></svg>",
-       R"({"KAVOMDTextContent":"Map\nof\nPier\nhar\nbour\nx\ny\n","KAVOMDTitle":"Map"})"},
+       "<tspan x='9' y='0'>bour</tspan><tspan y='9'>x</tspan></text><text y='2'>y<tspan y='2'>a"
+       "</tspan><tspan dy='1em'>b</tspan></text></g><svg><text>z</text></svg></svg>",
+       R"({"KAVOMDTextContent":"Map\nof\nPier\nharbour\nx\nya\nb\nz\n","KAVOMDTitle":"Map"})"},
       {"epub of many encodings, and with an encrypted page",
        Zip({{"mimetype", "application/epub+zip"},
             {"O/1.xhtml", "<?xml version='1.0' encoding='euc-kr'?><html>\x8C\x63\xB9\xE6</html>"},

@@ -101,11 +101,47 @@ inline std::vector<Sample> Samples() {
        R"("KAVOMDAuthors":["Ana"],"KAVOMDContentError":null})"},
       {"Latin-2 html", "<html><head><meta charset=iso-8859-2></head><body>\xB1\xEA</body></html>",
        R"({"KAVOMDTextContent":"\u0105\u0119\n"})"},
+      {"Shift_JIS html with letters of one maker, and bytes that are none",
+       "<html><!-- <meta charset=koi8-r> --><META content='text/html; CHARSET = \"Shift_JIS\"'>"
+       "<body>\x8D\x60\x87\x40\xFB\xFC \xFC\xFC \x8D\x60</body></html>",
+       R"({"KAVOMDTextContent":"\u6e2f\u2460\u9ad9 \ufffd \u6e2f\n"})"},
+      {"Latin-1 html as it is written", "<html><meta charset=iso-8859-1><p>\x93\xE4\x94 \x80</p>",
+       R"({"KAVOMDTextContent":"\u201c\u00e4\u201d \u20ac\n"})"},
+      {"ISO-2022-JP html", "<html><meta charset=iso-2022-jp><p>\x1B$B4A;z\x1B(B</p></html>",
+       R"({"KAVOMDTextContent":"\u6f22\u5b57\n"})"},
+      {"UTF-8 html with a byte that is none",
+       "<html><meta charset=utf-8><p>\xE6\xB8\xAF\xE6\xB8\xAF \xE9 \xE6\xB8\xAF</p></html>",
+       R"({"KAVOMDTextContent":"\u6e2f\u6e2f \ufffd \u6e2f\n"})"},
+      {"Latin-1 html that says to be UTF-16", "<html><meta charset=utf-16><p>gr\xFCn",
+       R"({"KAVOMDTextContent":"gr\u00fcn\n"})"},
+      {"html with a byte-order mark", "\xEF\xBB\xBF<html><title>a</title>b",
+       R"({"KAVOMDTextContent":"a\nb\n","KAVOMDTitle":"a"})"},
+      {"html with blocks of all kinds",
+       "<html><details><summary>a</summary>b</details><center>c</center><textarea>d</textarea>"
+       "<button>e</button><button>f</button><svg><title>no</title><text>no</text></svg>g",
+       R"({"KAVOMDTextContent":"a\nb\nc\nd\ne\nf\ng\n","KAVOMDTitle":null})"},
+      {"svg",
+       "<?xml version='1.0'?><!DOCTYPE svg [<!ENTITY a 'b'>]><!-- <p> --><svg><title>Map</title>"
+       "<style>no</style><metadata>no</metadata><desc>of</desc><g><title>Pier</title><text>har"
+       "<tspan x='9' y='0'>bour</tspan><tspan y='9'>x</tspan></text><text y='2'>y<tspan y='2'>a"
+       "</tspan><tspan dy='1em'>b</tspan></text></g><svg><text>z</text></svg></svg>",
+       R"({"KAVOMDTextContent":"Map\nof\nPier\nharbour\nx\nya\nb\nz\n","KAVOMDTitle":"Map"})"},
+      {"epub of many encodings, and with an encrypted page",
+       Zip({{"mimetype", "application/epub+zip"},
+            {"O/1.xhtml", "<?xml version='1.0' encoding='euc-kr'?><html>\x8C\x63\xB9\xE6</html>"},
+            {"O/2.xhtml", "\x8F\x03<b>\xE6\x1F\xD2p\xFF<p>\x07\x9A"},
+            {"O/3.xhtml", "<p>gr\xFCn \x01</p>"}}),
+       R"({"KAVOMDTextContent":"\ub620\ubc29\ngr\u00fcn \n"})"},
       {"rtf",
        R"({\rtf1\ansi\ansicpg1251{\fonttbl{\f0 Arial;}}{\info{\title Plan}{\author Ana}})"
        R"({\*\generator no;}The {\b har}bour\'cf \u8364?5 \u55357?\u56832?\par{\pict 01ab}\{x\}\tab y})",
        R"({"KAVOMDTextContent":"The harbour\u041f \u20ac5 \ud83d\ude00\n{x}\ty","KAVOMDTitle":"Plan",)"
        R"("KAVOMDAuthors":"Ana","KAVOMDContentError":null})"},
+      {"rtf with fonts of many encodings, and a text box",
+       R"({\rtf1\pca\deff3{\info{\title\'94}}{\fonttbl{\f0\fcharset0 A;}{\f1\fcharset204 B;})"
+       R"({\f2\fcharset128 C;}{\f3\fcharset238 D;}}\'9c\f0\'94{\f1\'cf\f2\'8d\'60}\'94\plain\'9c)"
+       R"({\shp{\*\shpinst no{\shptxt box\par}}{\shprslt no}}\f1\'cf})",
+       R"({"KAVOMDTextContent":"\u015b\u00f6\u041f\u6e2f\u00f6\u015b\nbox\n\u041f","KAVOMDTitle":"\u00f6"})"},
       {"cut rtf", R"({\rtf1 some {\b text)",
        R"({"KAVOMDTextContent":"some text","KAVOMDContentError":"damaged: the RTF ends within a group"})"},
       {"photo", Data("photo.jpg"),

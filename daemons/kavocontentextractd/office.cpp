@@ -33,7 +33,8 @@ constexpr std::string_view kOpenDocument = "application/vnd.oasis.opendocument."
 constexpr std::string_view kEpub = "application/epub+zip";
 
 // The text of office documents. OOXML has it in elements "t" ("w:t", "a:t", "t" of sheets), the
-// cells' numbers in "v"; OpenDocument has it everywhere below "body".
+// cells' numbers in "v"; OpenDocument has it everywhere below "body". Notes, comments and text
+// boxes stand within the paragraph, and often behind a word without white space.
 class TextHandler : public XmlHandler {
  public:
   TextHandler(bool is_open_document, Text& text)
@@ -42,6 +43,8 @@ class TextHandler : public XmlHandler {
   void Start(std::string_view name, const Attributes& attributes) override {
     if (is_open_document_) {
       StartOpenDocument(name);
+    } else if (name == "p") {
+      text_.EndLine();
     } else if (name == "t") {
       is_text_ = true;
     } else if (name == "c") {
@@ -60,6 +63,8 @@ class TextHandler : public XmlHandler {
     if (is_open_document_) {
       if (name == "p" || name == "h") {
         text_.EndLine();
+      } else if (StandsApart(name)) {
+        text_.EndWord();
       } else if (name == "body") {
         is_text_ = false;
       }
@@ -83,9 +88,20 @@ class TextHandler : public XmlHandler {
   }
 
  private:
+  // Whether the element is a text of its own in the midst of a paragraph: a note's number, a
+  // comment's author and date, what a picture shows.
+  static bool StandsApart(std::string_view name) {
+    constexpr std::string_view kNames[] = {"note-citation", "creator", "date", "title", "desc"};
+    return std::find(std::begin(kNames), std::end(kNames), name) != std::end(kNames);
+  }
+
   void StartOpenDocument(std::string_view name) {
     if (name == "body") {
       is_text_ = true;
+    } else if (name == "p" || name == "h") {
+      text_.EndLine();
+    } else if (StandsApart(name)) {
+      text_.EndWord();
     } else if (name == "s") {
       text_.Append(" ");
     } else if (name == "tab") {

@@ -53,6 +53,10 @@ inline std::vector<Sample> Samples() {
        R"({"KAVOMDTextContent":"The harbour\na\tb\nc & d\n","KAVOMDTitle":"Plan","KAVOMDAuthors":["Ana"],)"
        R"("KAVOMDContentCreationDate":1717156800,"KAVOMDContentError":null,"KAVOMDContentType":)"
        R"("application/vnd.openxmlformats-officedocument.wordprocessingml.document"})"},
+      {"text box in docx",
+       Docx(
+           "<w:p><w:t>before</w:t><w:pict><w:p><w:t>in</w:t></w:p></w:pict><w:t>after</w:t></w:p>"),
+       R"({"KAVOMDTextContent":"before\nin\nafter\n"})"},
       {"xlsx",
        Zip({{"[Content_Types].xml", "<Types/>"},
             {"xl/workbook.xml", "<workbook/>"},
@@ -72,6 +76,11 @@ inline std::vector<Sample> Samples() {
       {"odt", Odt("<t:h>One<t:s/>two</t:h><t:p>three<t:line-break/>four</t:p>"),
        R"({"KAVOMDTextContent":"One two\nthree\nfour\n","KAVOMDTitle":"Plan","KAVOMDPageCount":3,)"
        R"("KAVOMDWordCount":99,"KAVOMDContentError":null})"},
+      {"notes in odt",
+       Odt("<t:p>harbour<t:note><t:note-citation>1</t:note-citation><t:note-body><t:p>note</t:p>"
+           "</t:note-body></t:note> sea<o:annotation><creator>Ana</creator><date>2024</date>"
+           "<t:p>why</t:p></o:annotation>.</t:p><t:p>A<title>Map</title><desc>of</desc>B</t:p>"),
+       R"({"KAVOMDTextContent":"harbour 1 \nnote\n sea Ana 2024 \nwhy\n.\nA Map of B\n"})"},
       {"locked odt", Odt("", "<m><encryption-data/></m>"),
        R"({"KAVOMDContentError":"encrypted: the document wants a password"})"},
       {"epub",

@@ -3,6 +3,7 @@
 #include <magic.h>
 
 #include <algorithm>
+#include <clocale>
 #include <exception>
 #include <iterator>
 #include <new>
@@ -138,6 +139,11 @@ Extractor::Extractor()
              magic_close) {
   if (types_ == nullptr || magic_load(types_.get(), nullptr) != 0) {
     throw std::runtime_error("the table of file types cannot be loaded");
+  }
+  // Names in archives come in the locale's encoding, and those that it has no letters for not at
+  // all. NOLINTNEXTLINE(concurrency-mt-unsafe): there is one thread.
+  if (setlocale(LC_CTYPE, "C.UTF-8") == nullptr) {
+    throw std::runtime_error("the locale C.UTF-8 cannot be loaded");
   }
 }
 

@@ -162,7 +162,7 @@ void SetProperty(std::string_view name, const std::string& value, Document& docu
   }
   switch (property->kind) {
     case Kind::kText:
-      document.SetText(property->field, value);
+      document.SetFirstText(property->field, value);
       break;
     case Kind::kList:
       document.AddText(property->field, value);
@@ -227,7 +227,7 @@ class Archive {
     }
   }
 
-  // The name of the next entry; nothing at the end.
+  // The name of the next entry, "" for one that cannot be read; nothing at the end.
   std::optional<std::string> Next() {
     struct archive_entry* entry = nullptr;
     const int result = archive_read_next_header(archive_.get(), &entry);
@@ -418,6 +418,9 @@ void ReadOffice(const Source& source, const std::string& type, Document& documen
     Archive archive(source);
     while (const std::optional<std::string> name = archive.Next()) {
       try {
+        if (name->empty()) {
+          throw Fault(reason::kDamaged, "the name of a part cannot be read");
+        }
         parts.Read(*name, archive);
       } catch (const Fault& thrown) {
         if (thrown.Reason() != reason::kDamaged) {

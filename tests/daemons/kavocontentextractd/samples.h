@@ -2,6 +2,7 @@
 #ifndef DAEMONS_KAVOCONTENTEXTRACTD_SAMPLES_H_
 #define DAEMONS_KAVOCONTENTEXTRACTD_SAMPLES_H_
 
+#include <clocale>
 #include <string>
 #include <vector>
 
@@ -9,6 +10,15 @@
 #include "support/temp_folder.h"
 
 using fuzz::Zip;
+
+// An archive that says of its names that they are UTF-8, which is written in such a locale alone.
+inline std::string Utf8Zip(const fuzz::Parts& parts) {
+  const std::string before = setlocale(LC_CTYPE, nullptr);  // NOLINT(concurrency-mt-unsafe)
+  setlocale(LC_CTYPE, "C.UTF-8");                           // NOLINT(concurrency-mt-unsafe)
+  std::string bytes = Zip(parts);
+  setlocale(LC_CTYPE, before.c_str());  // NOLINT(concurrency-mt-unsafe)
+  return bytes;
+}
 
 inline std::string Docx(const std::string& body) {
   return Zip(
@@ -84,12 +94,16 @@ inline std::vector<Sample> Samples() {
       {"locked odt", Odt("", "<m><encryption-data/></m>"),
        R"({"KAVOMDContentError":"encrypted: the document wants a password"})"},
       {"epub",
-       Zip({{"mimetype", "application/epub+zip"},
-            {"O/c.opf",
-             "<p xmlns:dc='d'><dc:title>Novel</dc:title><dc:creator>Ana</dc:creator></p>"},
-            {"O/1.xhtml",
-             "<html><head><style>x</style></head><body><p>a&nbsp;b</p><p>c</p></body></html>"}}),
-       R"({"KAVOMDTextContent":"a\u00a0b\nc\n","KAVOMDTitle":"Novel","KAVOMDAuthors":["Ana"],)"
+       Utf8Zip({{"mimetype", "application/epub+zip"},
+                {"O/c.opf",
+                 "<p xmlns:dc='d'><dc:title>Novel</dc:title><dc:creator>Ana</dc:creator>"
+                 "<dc:title>Subtitle</dc:title></p>"},
+                {"O/1.xhtml",
+                 "<html><head><style>x</style></head><body><p>a&nbsp;b</p><p>c</p></body></html>"},
+                {"O/\xC3\x9C"
+                 "bung.xhtml",
+                 "<html><body><p>d</p></body></html>"}}),
+       R"({"KAVOMDTextContent":"a\u00a0b\nc\nd\n","KAVOMDTitle":"Novel","KAVOMDAuthors":["Ana"],)"
        R"("KAVOMDContentError":null})"},
       {"zip", Zip({{"a.txt", "text"}, {"content.xml", "<broken"}}),
        R"({"KAVOMDContentType":"application/zip","KAVOMDTextContent":null,"KAVOMDContentError":null})"},

@@ -10,6 +10,7 @@
 #include <optional>
 #include <utility>
 
+#include "common/string.h"
 #include "daemons/kavocontentextractd/fault.h"
 #include "daemons/kavocontentextractd/formats.h"
 #include "daemons/kavocontentextractd/xml.h"
@@ -32,6 +33,28 @@ constexpr size_t kMostPageBytes = size_t{16} << 20;
 constexpr std::string_view kOpenDocument = "application/vnd.oasis.opendocument.";
 constexpr std::string_view kEpub = "application/epub+zip";
 
+// The header or footer of a sheet without its codes: "&CPlan &P" is "Plan ", "&&" is "&".
+std::string WithoutCodes(std::string_view text) {
+  std::string plain;
+  for (size_t i = 0; i < text.size(); ++i) {
+    if (text[i] != '&') {
+      plain += text[i];
+    } else if (const char code = ++i < text.size() ? text[i] : '\0'; code == '&') {
+      plain += '&';
+    } else if (code == '"') {  // A font.
+      i = std::min(text.find('"', i + 1), text.size());
+    } else if (code == 'K') {  // A colour.
+      constexpr size_t kDigits = 6;
+      i += kDigits;
+    } else if (code >= '0' && code <= '9') {  // A size.
+      i = std::min(text.find_first_not_of("0123456789", i), text.size()) - 1;
+    } else {
+      plain += ' ';  // A place, a style, or what is put in.
+    }
+  }
+  return plain;
+}
+
 // The text of office documents. OOXML has it in elements "t" ("w:t", "a:t", "t" of sheets), the
 // cells' numbers in "v"; OpenDocument has it everywhere below "body". Notes, comments and text
 // boxes stand within the paragraph, and often behind a word without white space.
@@ -45,8 +68,10 @@ class TextHandler : public XmlHandler {
       StartOpenDocument(name);
     } else if (name == "p") {
       text_.EndLine();
-    } else if (name == "t") {
+    } else if (name == "t" || name == "text") {  // "text" is that of a slide's comment.
       is_text_ = true;
+    } else if (IsSheetHeader(name)) {
+      is_header_ = true;
     } else if (name == "c") {
       const std::string_view type = attributes.Get("t");
       is_value_ = type.empty() || type == "n" || type == "str";
@@ -70,12 +95,17 @@ class TextHandler : public XmlHandler {
       }
       return;
     }
-    if (name == "t" || name == "v") {
+    if (name == "t" || name == "v" || name == "text") {
       is_text_ = false;
     }
-    // Paragraphs, strings of sheets, rows; cells end as words do.
-    if (name == "p" || name == "si" || name == "row" || name == "is") {
+    // Paragraphs, strings of sheets, rows, comments; cells end as words do.
+    if (name == "p" || name == "si" || name == "row" || name == "is" || name == "text") {
       text_.EndLine();
+    } else if (IsSheetHeader(name)) {
+      text_.Append(WithoutCodes(header_));
+      text_.EndLine();
+      header_.clear();
+      is_header_ = false;
     } else if (name == "v") {
       text_.EndWord();
     }
@@ -84,6 +114,9 @@ class TextHandler : public XmlHandler {
   void Characters(std::string_view text) override {
     if (is_text_) {
       text_.Append(text);
+    } else if (is_header_) {
+      constexpr size_t kMost = 4096;  // Sixteen times what programs allow.
+      header_ += text.substr(0, kMost - std::min(kMost, header_.size()));
     }
   }
 
@@ -93,6 +126,11 @@ class TextHandler : public XmlHandler {
   static bool StandsApart(std::string_view name) {
     constexpr std::string_view kNames[] = {"note-citation", "creator", "date", "title", "desc"};
     return std::find(std::begin(kNames), std::end(kNames), name) != std::end(kNames);
+  }
+
+  // "oddHeader", "firstFooter" and the like.
+  static bool IsSheetHeader(std::string_view name) {
+    return (name.ends_with("Header") || name.ends_with("Footer")) && name != "headerFooter";
   }
 
   void StartOpenDocument(std::string_view name) {
@@ -115,6 +153,8 @@ class TextHandler : public XmlHandler {
   Text& text_;
   bool is_text_ = false;
   bool is_value_ = false;
+  bool is_header_ = false;
+  std::string header_;
 };
 
 enum class Kind { kText, kList, kNumber, kDate };
@@ -288,37 +328,51 @@ void ReadXml(Archive& archive, XmlHandler& handler, const Text* text) {
   });
 }
 
-bool HasNumberBetween(std::string_view name, std::string_view before, std::string_view behind) {
-  return name.size() > before.size() + behind.size() && name.starts_with(before) &&
-         name.ends_with(behind) &&
-         name.substr(before.size(), name.size() - before.size() - behind.size())
+// Whether the name is `before`, digits if any, and ".xml".
+bool IsNumbered(std::string_view name, std::string_view before) {
+  constexpr std::string_view kBehind = ".xml";
+  return name.size() >= before.size() + kBehind.size() && name.starts_with(before) &&
+         name.ends_with(kBehind) &&
+         name.substr(before.size(), name.size() - before.size() - kBehind.size())
                  .find_first_not_of("0123456789") == std::string_view::npos;
 }
 
-// The parts of OOXML that hold text.
+// The parts of OOXML that hold text, by their names in lower case: it does not count, and whether
+// there is a number is for each program to choose.
 bool IsTextPart(std::string_view name) {
-  constexpr std::string_view kNames[] = {"word/document.xml", "word/footnotes.xml",
-                                         "word/endnotes.xml", "word/comments.xml",
-                                         "xl/sharedStrings.xml"};
-  constexpr std::string_view kNumbered[] = {"word/header", "word/footer", "xl/worksheets/sheet",
-                                            "ppt/slides/slide", "ppt/notesSlides/notesSlide"};
-  return std::find(std::begin(kNames), std::end(kNames), name) != std::end(kNames) ||
-         std::any_of(std::begin(kNumbered), std::end(kNumbered), [name](std::string_view before) {
-           return HasNumberBetween(name, before, ".xml");
-         });
+  constexpr std::string_view kParts[] = {"word/document",
+                                         "word/footnotes",
+                                         "word/endnotes",
+                                         "word/comments",
+                                         "word/header",
+                                         "word/footer",
+                                         "xl/sharedstrings",
+                                         "xl/worksheets/sheet",
+                                         "xl/comments",
+                                         "xl/comments/comment",
+                                         "xl/drawings/drawing",
+                                         "ppt/slides/slide",
+                                         "ppt/notesslides/notesslide",
+                                         "ppt/diagrams/data"};
+  return std::any_of(std::begin(kParts), std::end(kParts),
+                     [name](std::string_view part) { return IsNumbered(name, part); }) ||
+         (name.starts_with("ppt/comments/") && name.ends_with(".xml"));
 }
 
+// The part without which there is no document of the type.
 struct Main {
-  std::string_view part;
+  std::string_view part;  // Followed by a number, if any, and ".xml".
   const char* type;
 };
 constexpr Main kMains[] = {
-    {"word/document.xml",
-     "application/vnd.openxmlformats-officedocument.wordprocessingml.document"},
-    {"xl/workbook.xml", "application/vnd.openxmlformats-officedocument.spreadsheetml.sheet"},
-    {"ppt/presentation.xml",
+    {"word/document", "application/vnd.openxmlformats-officedocument.wordprocessingml.document"},
+    {"xl/workbook", "application/vnd.openxmlformats-officedocument.spreadsheetml.sheet"},
+    {"ppt/presentation",
      "application/vnd.openxmlformats-officedocument.presentationml.presentation"},
 };
+// Of a workbook whose parts are not XML the properties are read, and its type is all besides.
+constexpr std::string_view kBinaryWorkbook = "xl/workbook.bin";
+constexpr char kBinaryWorkbookType[] = "application/vnd.ms-excel.sheet.binary.macroEnabled.12";
 
 bool IsPage(std::string_view name) {
   return name.ends_with(".xhtml") || name.ends_with(".html") || name.ends_with(".htm");
@@ -343,22 +397,9 @@ class PartReader {
         ReadText(/*is_open_document=*/true, archive);
       }
     } else if (type_ == kEpub) {
-      if (name.ends_with(".opf")) {
-        ReadXml(archive, properties, nullptr);
-        has_text_ = true;
-      } else if (IsPage(name) && !document_.text.IsFull()) {
-        ReadPage(archive);
-      }
-    } else if (name == "docProps/core.xml" || name == "docProps/app.xml") {
-      ReadXml(archive, properties, nullptr);
-    } else if (IsTextPart(name)) {
-      ReadText(/*is_open_document=*/false, archive);
-    }
-    for (const Main& row : kMains) {
-      if (name == row.part) {
-        document_.SetText(field::KAVOMDContentType, row.type);
-        is_document_ = has_text_ = true;
-      }
+      ReadBookPart(ToLower(name), archive, properties);
+    } else {
+      ReadOpenXmlPart(ToLower(name), archive, properties);
     }
   }
 
@@ -381,6 +422,36 @@ class PartReader {
       is_document_ = true;
       document_.SetText(field::KAVOMDContentType, type);
     }
+  }
+
+  // The names in lower case.
+  void ReadBookPart(const std::string& name, Archive& archive, PropertyHandler& properties) {
+    if (name.ends_with(".opf")) {
+      ReadXml(archive, properties, nullptr);
+      has_text_ = true;
+    } else if (IsPage(name) && !document_.text.IsFull()) {
+      ReadPage(archive);
+    }
+  }
+
+  void ReadOpenXmlPart(const std::string& name, Archive& archive, PropertyHandler& properties) {
+    for (const Main& row : kMains) {
+      if (IsNumbered(name, row.part)) {
+        SetType(row.type);
+      }
+    }
+    if (name == kBinaryWorkbook) {
+      SetType(kBinaryWorkbookType);
+    } else if (name == "docprops/core.xml" || name == "docprops/app.xml") {
+      ReadXml(archive, properties, nullptr);
+    } else if (IsTextPart(name)) {
+      ReadText(/*is_open_document=*/false, archive);
+    }
+  }
+
+  void SetType(const char* type) {
+    document_.SetText(field::KAVOMDContentType, type);
+    is_document_ = has_text_ = true;
   }
 
   void ReadText(bool is_open_document, Archive& archive) {

@@ -72,17 +72,29 @@ inline std::vector<Sample> Samples() {
             {"xl/workbook.xml", "<workbook/>"},
             {"xl/sharedStrings.xml", "<sst><si><t>harbour</t></si><si><t>sea</t></si></sst>"},
             {"xl/worksheets/sheet1.xml",
-             "<s><row><c t='s'><v>0</v></c><c><v>4711</v></c><c "
-             "t='str'><v>sum</v></c></row></s>"}}),
-       R"({"KAVOMDTextContent":"harbour\nsea\n4711 sum \n","KAVOMDContentError":null})"},
+             "<s><row><c t='s'><v>0</v></c><c><v>4711</v></c><c t='str'><v>sum</v></c></row>"
+             "<oddHeader>&amp;C&amp;\"Arial\"&amp;14&amp;K01a2b3R&amp;&amp;D "
+             "&amp;P</oddHeader></s>"},
+            {"xl/comments1.xml", "<s><comment><text><r><t>why</t></r></text></comment></s>"}}),
+       R"({"KAVOMDTextContent":"harbour\nsea\n4711 sum \n R&D  \nwhy\n","KAVOMDContentError":null})"},
+      {"parts by other names",
+       Zip({{"[Content_Types].xml", "<Types/>"},
+            {"word/document2.xml", "<w><p><t>two</t></p></w>"},
+            {"Word/Header.xml", "<w><p><t>head</t></p></w>"}}),
+       R"({"KAVOMDTextContent":"two\nhead\n","KAVOMDContentError":null,"KAVOMDContentType":)"
+       R"("application/vnd.openxmlformats-officedocument.wordprocessingml.document"})"},
+      {"xlsb", Zip({{"[Content_Types].xml", "<Types/>"}, {"xl/workbook.bin", "\1"}}),
+       R"({"KAVOMDContentType":"application/vnd.ms-excel.sheet.binary.macroEnabled.12",)"
+       R"("KAVOMDContentError":null})"},
       {"pptx",
        Zip({{"[Content_Types].xml", "<Types/>"},
             {"ppt/presentation.xml", "<p/>"},
             {"ppt/slides/slide10.xml", "<a:s xmlns:a='a'><a:p><a:t>ten</a:t></a:p></a:s>"},
             {"ppt/slides/_rels/slide10.xml.rels", "<r><t>no</t></r>"},
             {"ppt/notesSlides/notesSlide1.xml",
-             "<a:s xmlns:a='a'><a:p><a:t>note</a:t></a:p></a:s>"}}),
-       R"({"KAVOMDTextContent":"ten\nnote\n","KAVOMDContentError":null})"},
+             "<a:s xmlns:a='a'><a:p><a:t>note</a:t></a:p></a:s>"},
+            {"ppt/comments/comment1.xml", "<p:cm xmlns:p='p'><p:text>why</p:text></p:cm>"}}),
+       R"({"KAVOMDTextContent":"ten\nnote\nwhy\n","KAVOMDContentError":null})"},
       {"odt", Odt("<t:h>One<t:s/>two</t:h><t:p>three<t:line-break/>four</t:p>"),
        R"({"KAVOMDTextContent":"One two\nthree\nfour\n","KAVOMDTitle":"Plan","KAVOMDPageCount":3,)"
        R"("KAVOMDWordCount":99,"KAVOMDContentError":null})"},

@@ -60,8 +60,9 @@ std::string WithoutCodes(std::string_view text) {
 // boxes stand within the paragraph, and often behind a word without white space.
 class TextHandler : public XmlHandler {
  public:
-  TextHandler(bool is_open_document, Text& text)
-      : is_open_document_(is_open_document), text_(text) {}
+  // The numbers go to `numbers`.
+  TextHandler(bool is_open_document, Text& text, Text& numbers)
+      : is_open_document_(is_open_document), text_(text), numbers_(numbers) {}
 
   void Start(std::string_view name, const Attributes& attributes) override {
     if (is_open_document_) {
@@ -69,14 +70,15 @@ class TextHandler : public XmlHandler {
     } else if (name == "p") {
       text_.EndLine();
     } else if (name == "t" || name == "text") {  // "text" is that of a slide's comment.
-      is_text_ = true;
+      taker_ = &text_;
     } else if (IsSheetHeader(name)) {
       is_header_ = true;
     } else if (name == "c") {
       const std::string_view type = attributes.Get("t");
-      is_value_ = type.empty() || type == "n" || type == "str";
+      const bool is_number = type.empty() || type == "n";
+      cell_ = is_number ? &numbers_ : type == "str" ? &text_ : nullptr;
     } else if (name == "v") {
-      is_text_ = is_value_;
+      taker_ = cell_;
     } else if (name == "tab") {
       text_.Append("\t");
     } else if (name == "br" || name == "cr") {
@@ -91,29 +93,32 @@ class TextHandler : public XmlHandler {
       } else if (StandsApart(name)) {
         text_.EndWord();
       } else if (name == "body") {
-        is_text_ = false;
+        taker_ = nullptr;
       }
       return;
     }
     if (name == "t" || name == "v" || name == "text") {
-      is_text_ = false;
+      taker_ = nullptr;
     }
     // Paragraphs, strings of sheets, rows, comments; cells end as words do.
     if (name == "p" || name == "si" || name == "row" || name == "is" || name == "text") {
       text_.EndLine();
+      if (name == "row") {
+        numbers_.EndLine();
+      }
     } else if (IsSheetHeader(name)) {
       text_.Append(WithoutCodes(header_));
       text_.EndLine();
       header_.clear();
       is_header_ = false;
-    } else if (name == "v") {
-      text_.EndWord();
+    } else if (name == "v" && cell_ != nullptr) {
+      cell_->EndWord();
     }
   }
 
   void Characters(std::string_view text) override {
-    if (is_text_) {
-      text_.Append(text);
+    if (taker_ != nullptr) {
+      taker_->Append(text);
     } else if (is_header_) {
       constexpr size_t kMost = 4096;  // Sixteen times what programs allow.
       header_ += text.substr(0, kMost - std::min(kMost, header_.size()));
@@ -135,7 +140,7 @@ class TextHandler : public XmlHandler {
 
   void StartOpenDocument(std::string_view name) {
     if (name == "body") {
-      is_text_ = true;
+      taker_ = &text_;
     } else if (name == "p" || name == "h") {
       text_.EndLine();
     } else if (StandsApart(name)) {
@@ -151,8 +156,9 @@ class TextHandler : public XmlHandler {
 
   const bool is_open_document_;
   Text& text_;
-  bool is_text_ = false;
-  bool is_value_ = false;
+  Text& numbers_;
+  Text* taker_ = nullptr;  // Of the characters to come.
+  Text* cell_ = nullptr;   // Of the value of the cell.
   bool is_header_ = false;
   std::string header_;
 };
@@ -403,6 +409,18 @@ class PartReader {
     }
   }
 
+  // Puts the numbers of sheets behind the words of all parts: a large table would leave no room for
+  // the words, which stand in a part behind it.
+  void AppendNumbers() {
+    if (!numbers_.Get().empty()) {
+      document_.text.EndLine();
+      document_.text.Append(numbers_.Get());
+    }
+    if (numbers_.IsFull()) {
+      document_.text.SetTruncated();
+    }
+  }
+
   // Whether a part was there that only documents have.
   bool IsDocument() const { return is_document_; }
   // Whether the part was there that the text is in.
@@ -457,7 +475,7 @@ class PartReader {
   void ReadText(bool is_open_document, Archive& archive) {
     is_document_ = has_text_ = true;
     if (!document_.text.IsFull()) {
-      TextHandler handler(is_open_document, document_.text);
+      TextHandler handler(is_open_document, document_.text, numbers_);
       ReadXml(archive, handler, &document_.text);
       document_.text.EndLine();
     }
@@ -474,6 +492,7 @@ class PartReader {
 
   std::string type_;
   Document& document_;
+  Text numbers_;
   bool is_document_ = false;
   bool has_text_ = false;
 };
@@ -503,6 +522,7 @@ void ReadOffice(const Source& source, const std::string& type, Document& documen
   } catch (const Fault& thrown) {
     fault = thrown;
   }
+  parts.AppendNumbers();
   if (is_plain_archive && !parts.IsDocument()) {
     return;  // What is in archives is not looked at, so nothing is missing.
   }

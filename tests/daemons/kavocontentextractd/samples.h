@@ -70,13 +70,13 @@ inline std::vector<Sample> Samples() {
       {"xlsx",
        Zip({{"[Content_Types].xml", "<Types/>"},
             {"xl/workbook.xml", "<workbook/>"},
-            {"xl/sharedStrings.xml", "<sst><si><t>harbour</t></si><si><t>sea</t></si></sst>"},
             {"xl/worksheets/sheet1.xml",
              "<s><row><c t='s'><v>0</v></c><c><v>4711</v></c><c t='str'><v>sum</v></c></row>"
              "<oddHeader>&amp;C&amp;\"Arial\"&amp;14&amp;K01a2b3R&amp;&amp;D "
              "&amp;P</oddHeader></s>"},
+            {"xl/sharedStrings.xml", "<sst><si><t>harbour</t></si><si><t>sea</t></si></sst>"},
             {"xl/comments1.xml", "<s><comment><text><r><t>why</t></r></text></comment></s>"}}),
-       R"({"KAVOMDTextContent":"harbour\nsea\n4711 sum \n R&D  \nwhy\n","KAVOMDContentError":null})"},
+       R"({"KAVOMDTextContent":"sum \n R&D  \nharbour\nsea\nwhy\n4711 \n","KAVOMDContentError":null})"},
       {"parts by other names",
        Zip({{"[Content_Types].xml", "<Types/>"},
             {"word/document2.xml", "<w><p><t>two</t></p></w>"},

@@ -260,6 +260,27 @@ class ManifestHandler : public XmlHandler {
   void Characters(std::string_view /*text*/) override {}
 };
 
+bool IsPage(std::string_view name) {
+  return name.ends_with(".xhtml") || name.ends_with(".html") || name.ends_with(".htm");
+}
+
+// Looks for pages in META-INF/encryption.xml of an e-book; mostly it names fonts alone, which hide
+// nothing.
+class BookEncryptionHandler : public XmlHandler {
+ public:
+  void Start(std::string_view name, const Attributes& attributes) override {
+    has_pages_ = has_pages_ ||
+                 (name == "CipherReference" && IsPage(ToLower(std::string(attributes.Get("URI")))));
+  }
+  void End(std::string_view /*name*/) override {}
+  void Characters(std::string_view /*text*/) override {}
+
+  bool HasPages() const { return has_pages_; }
+
+ private:
+  bool has_pages_ = false;
+};
+
 class Archive {
  public:
   explicit Archive(const Source& source) : archive_(archive_read_new(), archive_read_free) {
@@ -380,10 +401,6 @@ constexpr Main kMains[] = {
 constexpr std::string_view kBinaryWorkbook = "xl/workbook.bin";
 constexpr char kBinaryWorkbookType[] = "application/vnd.ms-excel.sheet.binary.macroEnabled.12";
 
-bool IsPage(std::string_view name) {
-  return name.ends_with(".xhtml") || name.ends_with(".html") || name.ends_with(".htm");
-}
-
 class PartReader {
  public:
   PartReader(std::string type, Document& document) : type_(std::move(type)), document_(document) {}
@@ -406,6 +423,15 @@ class PartReader {
       ReadBookPart(ToLower(name), archive, properties);
     } else {
       ReadOpenXmlPart(ToLower(name), archive, properties);
+    }
+  }
+
+  // For the end of the archive. Of a book with encrypted pages its properties remain: what was read
+  // of pages before that was known is noise.
+  void CheckEncryption() {
+    if (is_encrypted_) {
+      document_.text = Text();
+      throw Fault(reason::kEncrypted, "the pages of the book are encrypted");
     }
   }
 
@@ -447,7 +473,11 @@ class PartReader {
     if (name.ends_with(".opf")) {
       ReadXml(archive, properties, nullptr);
       has_text_ = true;
-    } else if (IsPage(name) && !document_.text.IsFull()) {
+    } else if (name == "meta-inf/encryption.xml") {
+      BookEncryptionHandler encryption;
+      ReadXml(archive, encryption, nullptr);
+      is_encrypted_ = encryption.HasPages();
+    } else if (IsPage(name) && !is_encrypted_ && !document_.text.IsFull()) {
       ReadPage(archive);
     }
   }
@@ -493,6 +523,7 @@ class PartReader {
   std::string type_;
   Document& document_;
   Text numbers_;
+  bool is_encrypted_ = false;
   bool is_document_ = false;
   bool has_text_ = false;
 };
@@ -519,6 +550,7 @@ void ReadOffice(const Source& source, const std::string& type, Document& documen
         fault = fault ? fault : std::optional(thrown);
       }
     }
+    parts.CheckEncryption();
   } catch (const Fault& thrown) {
     fault = thrown;
   }

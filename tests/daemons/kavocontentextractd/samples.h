@@ -117,6 +117,13 @@ inline std::vector<Sample> Samples() {
                  "<html><body><p>d</p></body></html>"}}),
        R"({"KAVOMDTextContent":"a\u00a0b\nc\nd\n","KAVOMDTitle":"Novel","KAVOMDAuthors":["Ana"],)"
        R"("KAVOMDContentError":null})"},
+      {"locked epub",
+       Zip({{"mimetype", "application/epub+zip"},
+            {"O/1.xhtml", "<p>noise"},
+            {"META-INF/encryption.xml", "<e><CipherReference URI='O/1.xhtml'/></e>"},
+            {"O/c.opf", "<p xmlns:dc='d'><dc:title>Novel</dc:title></p>"}}),
+       R"({"KAVOMDTextContent":null,"KAVOMDTitle":"Novel",)"
+       R"("KAVOMDContentError":"encrypted: the pages of the book are encrypted"})"},
       {"zip", Zip({{"a.txt", "text"}, {"content.xml", "<broken"}}),
        R"({"KAVOMDContentType":"application/zip","KAVOMDTextContent":null,"KAVOMDContentError":null})"},
       {"entities.docx",

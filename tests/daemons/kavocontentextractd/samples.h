@@ -156,6 +156,9 @@ inline std::vector<Sample> Samples() {
        R"("KAVOMDDescription":"Harbour bridge","KAVOMDKeywords":["bridge","sea"],)"
        R"("KAVOMDExposureTimeString":"1/125 s","KAVOMDStarRating":"4","KAVOMDTitle":"Br\u00fccke",)"
        R"("KAVOMDLatitude":-33.86,"KAVOMDLongitude":151.2,"KAVOMDContentError":null})"},
+      {"photo with a zone, no place and no UTF-8", Data("old_camera.jpg"),
+       R"({"KAVOMDDescription":"Br\u00fccke","KAVOMDKeywords":["Stra\u00dfe"],"KAVOMDComment":"hello",)"
+       R"("KAVOMDCity":"K\u00f6ln","KAVOMDContentCreationDate":1717156800,"KAVOMDLatitude":null})"},
       {"mp3", Data("sound.mp3"), "{\"KAVOMDComment\":\"quiet\"," + tags + "}"},
       {"ogg", Data("sound.ogg"), "{\"KAVOMDDurationSecond\":0.2," + tags + "}"},
       {"m4a", Data("sound.m4a"), "{\"KAVOMDComment\":\"quiet\"," + tags + "}"},

@@ -42,6 +42,18 @@ inline std::string Odt(const std::string& body, const std::string& manifest = "<
 inline std::string Data(const std::string& name) { return ReadText(TEST_DATA "/" + name); }
 inline std::string Pdf() { return Data("../fuzz/seeds/pdf/plan.pdf"); }
 
+// A recording whose length was not known when its beginning was written.
+inline std::string Flac() {
+  constexpr size_t kSamplesAt = 22;  // 32 bits of 36; the others are 0.
+  return Data("sound.flac").replace(kSamplesAt, 4, 4, '\0');
+}
+// 8 samples of a recording that says to have so many bytes.
+inline std::string Wav(const std::string& size) {
+  return "RIFF" + size + "WAVEfmt " +
+         std::string("\x10\0\0\0\1\0\1\0\x40\x1F\0\0\x80\x3E\0\0\2\0\x10\0", 20) + "data" + size +
+         std::string(16, '\1');
+}
+
 struct Sample {
   std::string name;  // Its extension tells little: types are found in the content.
   std::string bytes;
@@ -162,6 +174,15 @@ inline std::vector<Sample> Samples() {
       {"mp3", Data("sound.mp3"), "{\"KAVOMDComment\":\"quiet\"," + tags + "}"},
       {"ogg", Data("sound.ogg"), "{\"KAVOMDDurationSecond\":0.2," + tags + "}"},
       {"m4a", Data("sound.m4a"), "{\"KAVOMDComment\":\"quiet\"," + tags + "}"},
+      {"flac from a pipe", Flac(),
+       R"({"KAVOMDAudioSampleRate":8000,"KAVOMDDurationSecond":null,"KAVOMDContentError":null})"},
+      {"wav from a pipe", Wav("\xFF\xFF\xFF\xFF"),
+       R"({"KAVOMDAudioSampleRate":8000,"KAVOMDContentError":null})"},
+      {"cut wav", Wav({"\0\1\0\0", 4}),
+       R"({"KAVOMDContentError":"damaged: the sound cannot be found in the file"})"},
+      {"soundfont",
+       {"RIFF\4\0\0\0sfbk", 12},
+       R"({"KAVOMDContentType":"audio/x-sfbk","KAVOMDContentError":null})"},
       {"mp4", Data("film.mp4"),
        film + R"("KAVOMDCodecs":["MPEG-4 Visual","AAC"],"KAVOMDDurationSecond":1.0,)"
               R"("KAVOMDContentCreationDate":1717156800})"},

@@ -155,6 +155,19 @@ void Quarantine::Add(const ContentKey& key, const Fault& fault, const std::strin
   Save();
 }
 
+unsigned Quarantine::CountKill(const ContentKey& key) {
+  const kavo::local::MutexLock lock(mutex_);
+  if (kills_.size() >= most_ && !kills_.contains(key)) {
+    kills_.clear();
+  }
+  return ++kills_[key];
+}
+
+void Quarantine::ForgetKills(const ContentKey& key) {
+  const kavo::local::MutexLock lock(mutex_);
+  kills_.erase(key);
+}
+
 size_t Quarantine::Size() {
   const kavo::local::MutexLock lock(mutex_);
   return entries_.size();

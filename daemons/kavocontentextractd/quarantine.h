@@ -4,6 +4,7 @@
 
 #include <sys/stat.h>
 
+#include <compare>
 #include <cstddef>
 #include <cstdint>
 #include <list>
@@ -25,7 +26,7 @@ struct ContentKey {
   int64_t modified = 0;  // Nanoseconds since the epoch.
   int64_t changed = 0;   // The same, of its attributes.
 
-  bool operator==(const ContentKey&) const = default;
+  auto operator<=>(const ContentKey&) const = default;
 };
 ContentKey KeyOf(const struct stat& info);
 
@@ -46,6 +47,11 @@ class Quarantine {
 
   size_t Size();
 
+  // Counts that a process was killed while it read the content, which may be the content's fault or
+  // not. How often that was since ForgetKills(); neither is on disk.
+  unsigned CountKill(const ContentKey& key);
+  void ForgetKills(const ContentKey& key);
+
  private:
   struct Entry {
     ContentKey key;
@@ -65,6 +71,7 @@ class Quarantine {
   kavo::local::Mutex mutex_;
   std::list<Entry> entries_ KAVO_GUARDED_BY(mutex_);  // The oldest first.
   std::map<FileId, std::list<Entry>::iterator> by_file_ KAVO_GUARDED_BY(mutex_);
+  std::map<ContentKey, unsigned> kills_ KAVO_GUARDED_BY(mutex_);
 };
 
 }  // namespace vexlo::extractd

@@ -286,8 +286,8 @@ TEST_F(ExtractdTest, ReplacesAWorkerThatHangs) {
 TEST_F(ExtractdTest, QuarantinesWhatKillsTwoWorkersUntilItChanges) {
   Start();
   const std::string path = Write("slow.docx", SlowDocument());
-  const std::string crash = "crash: the worker ended by signal 9 while it read the file";
-  EXPECT_EQ(ErrorUnder(SIGKILL, path), crash);
+  const std::string crash = "crash: the worker ended by signal 6 while it read the file";
+  EXPECT_EQ(ErrorUnder(SIGABRT, path), crash);
   EXPECT_EQ(Stats()["deaths"], 2);
   EXPECT_EQ(Stats()["quarantined"], 1);
   EXPECT_EQ(ErrorOf(path), crash) << "answered from the list";
@@ -300,6 +300,27 @@ TEST_F(ExtractdTest, QuarantinesWhatKillsTwoWorkersUntilItChanges) {
   ASSERT_EQ(utimensat(AT_FDCWD, path.c_str(), nullptr, 0), 0);
   EXPECT_EQ(Parse(path)["KAVOMDTextContent"], "end\n");
   EXPECT_EQ(Stats()["quarantined"], 0);
+}
+
+TEST_F(ExtractdTest, QuarantinesWhoseWorkersAreKilledThreeTimesInARow) {
+  Start();
+  const std::string path = Write("slow.docx", SlowDocument());
+  const std::string killed = ": the worker ended by signal 9 while it read the file";
+  const struct {
+    int signal;  // 0 harms nobody.
+    std::string error;
+  } rows[] = {{SIGKILL, "unavailable" + killed},
+              {SIGKILL, "unavailable" + killed},
+              {0, ""},
+              {SIGKILL, "unavailable" + killed},
+              {SIGKILL, "unavailable" + killed},
+              {SIGKILL, "crash" + killed},
+              {0, "crash" + killed}};
+  for (const auto& row : rows) {
+    EXPECT_EQ(ErrorUnder(row.signal, path), row.error) << "row " << &row - rows;
+  }
+  EXPECT_EQ(Stats()["deaths"], 5);
+  EXPECT_EQ(Stats()["quarantined"], 1);
 }
 
 TEST_F(ExtractdTest, QuarantinesWhatTakesTooLongOrTooMuch) {

@@ -146,6 +146,16 @@ inline std::vector<Sample> Samples() {
        R"({"KAVOMDTextContent":"The harbour plan\n","KAVOMDTitle":"Plan","KAVOMDAuthors":"Ana",)"
        R"("KAVOMDNumberOfPages":1,"KAVOMDPageWidth":300.0,"KAVOMDContentCreationDate":1717156800,)"
        R"("KAVOMDContentError":null})"},
+      {"pdf with an encoding of poppler-data",
+       "%PDF-1.5\n1 0 obj<</Type/Catalog/Pages 2 0 R>>endobj\n"
+       "2 0 obj<</Type/Pages/Count 1/Kids[3 0 R]>>endobj\n"
+       "3 0 obj<</Type/Page/Parent 2 0 R/MediaBox[0 0 300 400]/Contents 6 0 R/Resources<</Font<<"
+       "/F 4 0 R>>>>>>endobj\n4 0 obj<</Type/Font/Subtype/Type0/BaseFont/S/Encoding/GBK-EUC-H"
+       "/DescendantFonts[5 0 R]>>endobj\n5 0 obj<</Type/Font/Subtype/CIDFontType0/BaseFont/S"
+       "/CIDSystemInfo<</Registry(Adobe)/Ordering(GB1)/Supplement 2>>/DW 1000>>endobj\n"
+       "6 0 obj<</Length 38>>stream\nBT /F 12 Tf 20 300 Td <b8dbbfda> Tj ET\nendstream endobj\n"
+       "trailer<</Root 1 0 R>>",
+       R"({"KAVOMDTextContent":"\u6e2f\u53e3\n","KAVOMDContentError":null})"},
       {"locked pdf", Data("locked.pdf"),
        R"({"KAVOMDContentError":"encrypted: the PDF wants a password","KAVOMDTextContent":null})"},
       {"html",

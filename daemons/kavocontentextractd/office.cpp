@@ -81,6 +81,8 @@ class TextHandler : public XmlHandler {
       taker_ = cell_;
     } else if (name == "tab") {
       text_.Append("\t");
+    } else if (name == "noBreakHyphen") {
+      text_.Append("-");
     } else if (name == "br" || name == "cr") {
       text_.EndLine();
     }

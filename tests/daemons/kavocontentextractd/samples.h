@@ -71,8 +71,9 @@ inline std::vector<Sample> Samples() {
   return {
       {"docx",
        Docx("<w:p><w:r><w:t>The har</w:t></w:r><w:t>bour</w:t></w:p><w:p><w:t>a</w:t><w:tab/>"
-            "<w:t>b</w:t><w:br/><w:t>c &amp; d</w:t></w:p><w:instrText>PAGE</w:instrText>"),
-       R"({"KAVOMDTextContent":"The harbour\na\tb\nc & d\n","KAVOMDTitle":"Plan","KAVOMDAuthors":["Ana"],)"
+            "<w:t>b</w:t><w:br/><w:t>c &amp; "
+            "d</w:t><w:noBreakHyphen/><w:t>e</w:t></w:p><w:instrText>PAGE</w:instrText>"),
+       R"({"KAVOMDTextContent":"The harbour\na\tb\nc & d-e\n","KAVOMDTitle":"Plan","KAVOMDAuthors":["Ana"],)"
        R"("KAVOMDContentCreationDate":1717156800,"KAVOMDContentError":null,"KAVOMDContentType":)"
        R"("application/vnd.openxmlformats-officedocument.wordprocessingml.document"})"},
       {"text box in docx",

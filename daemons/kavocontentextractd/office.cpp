@@ -67,7 +67,7 @@ class TextHandler : public XmlHandler {
   void Start(std::string_view name, const Attributes& attributes) override {
     if (is_open_document_) {
       StartOpenDocument(name);
-    } else if (name == "p") {
+    } else if (name == "p" || name == "br" || name == "cr") {
       text_.EndLine();
     } else if (name == "t" || name == "text") {  // "text" is that of a slide's comment.
       taker_ = &text_;
@@ -83,8 +83,6 @@ class TextHandler : public XmlHandler {
       text_.Append("\t");
     } else if (name == "noBreakHyphen") {
       text_.Append("-");
-    } else if (name == "br" || name == "cr") {
-      text_.EndLine();
     }
   }
 
@@ -143,7 +141,7 @@ class TextHandler : public XmlHandler {
   void StartOpenDocument(std::string_view name) {
     if (name == "body") {
       taker_ = &text_;
-    } else if (name == "p" || name == "h") {
+    } else if (name == "p" || name == "h" || name == "line-break") {
       text_.EndLine();
     } else if (StandsApart(name)) {
       text_.EndWord();
@@ -151,8 +149,6 @@ class TextHandler : public XmlHandler {
       text_.Append(" ");
     } else if (name == "tab") {
       text_.Append("\t");
-    } else if (name == "line-break") {
-      text_.EndLine();
     }
   }
 

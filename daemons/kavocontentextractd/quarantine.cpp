@@ -156,16 +156,20 @@ void Quarantine::Add(const ContentKey& key, const Fault& fault, const std::strin
 }
 
 unsigned Quarantine::CountKill(const ContentKey& key) {
+  const FileId id(key.device, key.inode);
   const kavo::local::MutexLock lock(mutex_);
-  if (kills_.size() >= most_ && !kills_.contains(key)) {
+  if (kills_.size() >= most_ && !kills_.contains(id)) {
     kills_.clear();
   }
-  return ++kills_[key];
+  auto& [content, kills] = kills_[id];
+  kills = content == key ? kills + 1 : 1;
+  content = key;
+  return kills;
 }
 
 void Quarantine::ForgetKills(const ContentKey& key) {
   const kavo::local::MutexLock lock(mutex_);
-  kills_.erase(key);
+  kills_.erase({key.device, key.inode});
 }
 
 size_t Quarantine::Size() {

@@ -4,7 +4,6 @@
 
 #include <sys/stat.h>
 
-#include <compare>
 #include <cstddef>
 #include <cstdint>
 #include <list>
@@ -26,7 +25,7 @@ struct ContentKey {
   int64_t modified = 0;  // Nanoseconds since the epoch.
   int64_t changed = 0;   // The same, of its attributes.
 
-  auto operator<=>(const ContentKey&) const = default;
+  bool operator==(const ContentKey&) const = default;
 };
 ContentKey KeyOf(const struct stat& info);
 
@@ -71,7 +70,7 @@ class Quarantine {
   kavo::local::Mutex mutex_;
   std::list<Entry> entries_ KAVO_GUARDED_BY(mutex_);  // The oldest first.
   std::map<FileId, std::list<Entry>::iterator> by_file_ KAVO_GUARDED_BY(mutex_);
-  std::map<ContentKey, unsigned> kills_ KAVO_GUARDED_BY(mutex_);
+  std::map<FileId, std::pair<ContentKey, unsigned>> kills_ KAVO_GUARDED_BY(mutex_);
 };
 
 }  // namespace vexlo::extractd

@@ -332,6 +332,9 @@ class Archive {
     }
   }
 
+  // The bytes that were read of all parts.
+  uint64_t Unpacked() const { return unpacked_; }
+
  private:
   [[noreturn]] void Fail() {
     const char* const text = archive_error_string(archive_.get());
@@ -345,11 +348,14 @@ class Archive {
   bool is_encrypted_ = false;
 };
 
-void ReadXml(Archive& archive, XmlHandler& handler, const Text* text) {
+bool NeverEnough() { return false; }
+
+void ReadXml(Archive& archive, XmlHandler& handler,
+             const std::function<bool()>& is_enough = NeverEnough) {
   XmlReader reader(handler);
   archive.Read([&](std::string_view part, bool is_last) {
     reader.Feed(part, is_last);
-    return text == nullptr || !text->IsFull();
+    return !is_enough();
   });
 }
 
@@ -411,9 +417,9 @@ class PartReader {
     if (type_.starts_with(kOpenDocument)) {
       if (name == "META-INF/manifest.xml") {
         ManifestHandler manifest;
-        ReadXml(archive, manifest, nullptr);
+        ReadXml(archive, manifest);
       } else if (name == "meta.xml") {
-        ReadXml(archive, properties, nullptr);
+        ReadXml(archive, properties);
       } else if (name == "content.xml") {
         ReadText(/*is_open_document=*/true, archive);
       }
@@ -469,11 +475,11 @@ class PartReader {
   // The names in lower case.
   void ReadBookPart(const std::string& name, Archive& archive, PropertyHandler& properties) {
     if (name.ends_with(".opf")) {
-      ReadXml(archive, properties, nullptr);
+      ReadXml(archive, properties);
       has_text_ = true;
     } else if (name == "meta-inf/encryption.xml") {
       BookEncryptionHandler encryption;
-      ReadXml(archive, encryption, nullptr);
+      ReadXml(archive, encryption);
       is_encrypted_ = encryption.HasPages();
     } else if (IsPage(name) && !is_encrypted_ && !document_.text.IsFull()) {
       ReadPage(archive);
@@ -489,9 +495,9 @@ class PartReader {
     if (name == kBinaryWorkbook) {
       SetType(kBinaryWorkbookType);
     } else if (name == "docprops/core.xml" || name == "docprops/app.xml") {
-      ReadXml(archive, properties, nullptr);
+      ReadXml(archive, properties);
     } else if (IsTextPart(name)) {
-      ReadText(/*is_open_document=*/false, archive);
+      ReadText(/*is_open_document=*/false, archive, name.starts_with("xl/worksheets/"));
     }
   }
 
@@ -500,11 +506,15 @@ class PartReader {
     is_document_ = has_text_ = true;
   }
 
-  void ReadText(bool is_open_document, Archive& archive) {
+  // A sheet is left, when there is no room for its numbers, in time for the parts behind it.
+  void ReadText(bool is_open_document, Archive& archive, bool is_sheet = false) {
     is_document_ = has_text_ = true;
     if (!document_.text.IsFull()) {
       TextHandler handler(is_open_document, document_.text, numbers_);
-      ReadXml(archive, handler, &document_.text);
+      ReadXml(archive, handler, [&] {
+        return document_.text.IsFull() ||
+               (is_sheet && numbers_.IsFull() && archive.Unpacked() > kMostUnpacked / 2);
+      });
       document_.text.EndLine();
     }
   }

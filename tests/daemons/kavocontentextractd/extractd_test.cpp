@@ -199,6 +199,15 @@ TEST_F(ExtractdTest, StopsAtLimits) {
       Parse(Write("b.docx", Docx("<w:t>begin</w:t><w:p/>" + std::string(size_t{129} << 20, ' '))));
   EXPECT_EQ(bomb["KAVOMDContentError"], "oversized: it unpacks to over 128 MiB");
   EXPECT_EQ(bomb["KAVOMDTextContent"], "begin\n");
+
+  const Json::Value table = Parse(
+      Write("c.xlsx", Zip({{"[Content_Types].xml", "<Types/>"},
+                           {"xl/workbook.xml", "<w/>"},
+                           {"xl/worksheets/sheet1.xml",
+                            "<s><c><v>" + mib + "mm</v></c>" + std::string(size_t{129} << 20, ' ')},
+                           {"xl/sharedStrings.xml", "<s><si><t>word</t></si></s>"}})));
+  EXPECT_TRUE(table["KAVOMDTextContent"].asString().starts_with("word\nmmm"));
+  EXPECT_FALSE(table.isMember("KAVOMDContentError")) << table["KAVOMDContentError"];
   EXPECT_EQ(Stats()["deaths"], 0);
 }
 

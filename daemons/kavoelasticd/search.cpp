@@ -390,8 +390,8 @@ void Show(Session& session, const SearchRequest& request, const Selection& selec
     return;
   }
   hit->path = document->path;
-  const bool shows_text = !is_judged || IsOfFile(session, *document, hit->changed);
-  hit->shown = shows_text ? session.Fields(&*document, selection) : Json::Value(Json::objectValue);
+  const bool is_told = !is_judged || IsOfFile(session, *document, hit->changed);
+  hit->shown = is_told ? session.Fields(&*document, selection) : Json::Value(Json::objectValue);
   hit->shown["path"] = document->path;
   if (!is_judged) {  // How often a word stands in others' files shows in it.
     hit->shown["score"] = hit->score;
@@ -402,10 +402,12 @@ void Show(Session& session, const SearchRequest& request, const Selection& selec
     return item != nullptr ? JsonOf(*item, document->path) : Json::Value();
   };
   hit->shown["name"] = Basename(document->path);
-  hit->shown["size"] = number(kSizeField);
-  hit->shown["modified"] = number(kModifiedField);
+  if (is_told) {
+    hit->shown["size"] = number(kSizeField);
+    hit->shown["modified"] = number(kModifiedField);
+  }
   hit->shown["is_dir"] = number(kIsDirField).isBool() && number(kIsDirField).asBool();
-  if (request.snippet && shows_text) {
+  if (request.snippet && is_told) {
     hit->shown["snippet"] = SnippetOf(session, &*document, wanted);
   }
 }
@@ -485,8 +487,9 @@ SearchPage Search(Session& session, const SearchRequest& request, size_t shown_f
   SearchPage page;
   page.hits = FindHits(session, request);
   page.total = page.hits.size();
+  const std::vector<Wanted> wanted = WantedOf(session, request);
   if (judge) {
-    KeepReadable(session, request, judge, &page);
+    KeepReadable(session, request, wanted, judge, &page);
   }
   const size_t count = std::min(page.hits.size(), request.from + request.count);
   std::partial_sort(
@@ -497,7 +500,6 @@ SearchPage Search(Session& session, const SearchRequest& request, size_t shown_f
   if (request.load_fields.empty()) {
     selection = {/*key=*/false, /*all=*/false};
   }
-  const std::vector<Wanted> wanted = WantedOf(session, request);
   for (size_t i = shown_from; i < count; ++i) {
     Show(session, request, selection, wanted, /*is_judged=*/judge != nullptr, &page.hits[i]);
   }

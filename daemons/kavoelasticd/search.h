@@ -66,7 +66,8 @@ SearchRequest ParseSearch(const Json::Value& data);
 
 // Searches one index. `shown` is filled from the hit number `shown_from` on. The session is to be
 // in a transaction, or parts of the answer may be of different moments. With a judge only what may
-// be read is found, and nothing of its text is shown when the file at its path is another by now.
+// be read is found; of a document whose file is another by now, only its path is looked at and
+// shown.
 SearchPage Search(Session& session, const SearchRequest& request, size_t shown_from,
                   const JudgePaths& judge = nullptr);
 

@@ -481,11 +481,10 @@ Json::Value Engine::Search(const Json::Value& data, const JudgePaths& judge,
                            Connection::Deadline deadline) {
   const SearchRequest request = ParseSearch(data);
   std::vector<std::string> ids;
-  for (const Json::Value& id : data["ids"]) {
-    if (!id.isString()) {
-      throw Failure(Code::kBadRequest, "ids holds something else than texts");
+  for (const std::string& id : request.ids) {
+    if (std::find(ids.begin(), ids.end(), id) == ids.end()) {
+      ids.push_back(id);
     }
-    ids.push_back(id.asString());
   }
   const bool named = !ids.empty();
   if (!named) {
@@ -499,14 +498,15 @@ Json::Value Engine::Search(const Json::Value& data, const JudgePaths& judge,
   std::vector<std::pair<SearchHit, const std::string*>> hits;
   size_t total = 0;
   bool is_least = false;
-  const size_t shown_from = ids.size() == 1 ? request.from : 0;
+  const Merge merge = ids.size() == 1 ? Merge::kOne : Merge::kSeveral;
+  const size_t shown_from = merge == Merge::kOne ? request.from : 0;
   for (const std::string& id : ids) {
     SearchPage page;
     try {
       WithStore(id, [&](Store& store) {
         store.ReadCommitted([&](Session& session) {
           const TimeLimit limit(session.db, deadline);
-          page = elasticd::Search(session, request, shown_from, judge);
+          page = elasticd::Search(session, request, merge, shown_from, judge);
         });
       });
     } catch (const Failure& failure) {

@@ -11,16 +11,6 @@
 namespace vexlo::elasticd {
 namespace {
 
-// Some orders do without the paths.
-void AddPath(Session& session, SearchHit* hit) {
-  if (hit->path.empty()) {
-    Sql row(session.db, "SELECT path FROM docs WHERE id = ?");
-    if (row.Int(hit->id).Row()) {
-      hit->path = row.BytesAt(0);
-    }
-  }
-}
-
 bool StandsInName(Session& session, const StoredDocument& document, const Wanted& term) {
   const std::vector<Item>& items = document.record.Items();
   return std::any_of(items.begin(), items.end(), [&](const Item& item) {

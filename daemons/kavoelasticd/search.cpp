@@ -436,6 +436,24 @@ void Show(Session& session, const SearchRequest& request, const Selection& selec
   }
 }
 
+// Which of the hits that fit equally well are among the first `count` is the same for every page of
+// several indexes when their paths decide, as they do between the indexes.
+void AddPathsAtCut(Session& session, const SearchRequest& request, size_t count,
+                   std::vector<SearchHit>* hits) {
+  if (request.order != Order::kRelevance || count == 0 || count >= hits->size()) {
+    return;
+  }
+  const auto last = hits->begin() + static_cast<std::ptrdiff_t>(count - 1);
+  std::nth_element(hits->begin(), last, hits->end(),
+                   [](const SearchHit& a, const SearchHit& b) { return a.score > b.score; });
+  const double score = last->score;
+  for (SearchHit& hit : *hits) {
+    if (hit.score == score) {
+      AddPath(session, &hit);
+    }
+  }
+}
+
 template <typename T>
 int Compare(const T& a, const T& b) {
   return a < b ? -1 : b < a ? 1 : 0;
@@ -457,6 +475,7 @@ size_t PageNumber(const Json::Value& object, const char* name, size_t otherwise)
 
 SearchRequest ParseSearch(const Json::Value& data) {
   SearchRequest request;
+  request.ids = ListMember(data, "ids");
   const std::string words = TextMember(data, "words");
   request.terms = TermsOf(words);
   request.only_noise = request.terms.empty() && !Trim(words).empty();
@@ -497,7 +516,16 @@ bool ComesBefore(const SearchRequest& request, const SearchHit& a, const SearchH
   return request.descending && request.order != Order::kRelevance ? order > 0 : order < 0;
 }
 
-SearchPage Search(Session& session, const SearchRequest& request, size_t shown_from,
+void AddPath(Session& session, SearchHit* hit) {
+  if (hit->path.empty()) {
+    Sql row(session.db, "SELECT path FROM docs WHERE id = ?");
+    if (row.Int(hit->id).Row()) {
+      hit->path = row.BytesAt(0);
+    }
+  }
+}
+
+SearchPage Search(Session& session, const SearchRequest& request, Merge merge, size_t shown_from,
                   const JudgePaths& judge) {
   if (request.only_noise) {
     return {};
@@ -510,6 +538,9 @@ SearchPage Search(Session& session, const SearchRequest& request, size_t shown_f
     KeepReadable(session, request, wanted, judge, &page);
   }
   const size_t count = std::min(page.hits.size(), request.from + request.count);
+  if (merge == Merge::kSeveral) {
+    AddPathsAtCut(session, request, count, &page.hits);
+  }
   std::partial_sort(
       page.hits.begin(), page.hits.begin() + static_cast<std::ptrdiff_t>(count), page.hits.end(),
       [&](const SearchHit& a, const SearchHit& b) { return ComesBefore(request, a, b); });

@@ -75,6 +75,7 @@ TEST(Search, FindsWordsNamesAndWhatTheFiltersLeave) {
       {"From", R"({"from":1e30})", "2000"},
       {"Below", R"({"below":{}})", "2000"},
       {"Ids", R"({"ids":["nowhere"]})", "2002"},
+      {"IdsAsText", R"({"ids":"i"})", "2000"},
       {"Words", R"({"words":")" + Numbers(65) + "\"}", "2000"},
       {"WordsOfAPhrase", R"({"words":"\")" + Again("fox ", 1001) + R"(\""})", "2000"},
   };
@@ -125,9 +126,22 @@ TEST(Search, MergesThePagesOfSeveralIndexes) {
                                               i % 3 == 0 ? "i" : "j"))),
               "ok");
   }
+  // They fit equally well, and their paths are in the other order than their numbers.
+  for (int i = 40; i-- > 20;) {
+    const std::string path = "/w/" + std::to_string(i);
+    engine.Send(WriteRequest("document_upsert_by_id", path,
+                             MakeDocument(path, R"({"KAVOMDTextContent":"quarterly report"})"),
+                             i % 2 == 0 ? "i" : "j"));
+  }
   EXPECT_EQ(engine.Do("commit", "{}", "j"), "ok");
+  std::string pages;
+  for (int from = 0; from < 20; from += 4) {
+    pages += from == 0 ? "" : " ";
+    pages += engine.Search(R"({"words":"quarterly","size":4,"from":)" + std::to_string(from) + "}");
+  }
+  EXPECT_EQ(pages, engine.Search(R"({"words":"quarterly","size":20})"));
   EXPECT_EQ(engine.Search(R"({"sort":"path","from":2,"size":4})"), "/v/2 /v/3 /v/4 /v/5");
-  EXPECT_EQ(engine.Search(R"({"ids":["j"],"sort":"path","from":2,"size":2})"), "/v/4 /v/5");
+  EXPECT_EQ(engine.Search(R"({"ids":["j","j"],"sort":"path","from":2,"size":2})"), "/v/4 /v/5");
 }
 
 TEST(Search, EndsAtItsDeadline) {

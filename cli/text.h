@@ -17,7 +17,8 @@ std::string Grouped(uint64_t number);
 // "1 line", "2,000 lines".
 std::string Counted(uint64_t number, std::string_view noun);
 
-// Control characters as "\012", so that a file name cannot drive the terminal; the rest as it is.
+// Control characters and those that turn the direction of writing byte by byte as "\012", so that a
+// file name can neither drive the terminal nor look like another; the rest as it is.
 std::string ForTerminal(std::string_view text);
 
 // What a library reason says of the system's error: the text behind its last "reason=", or all.

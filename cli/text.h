@@ -19,7 +19,8 @@ std::string Grouped(uint64_t number);
 // "1 line", "2,000 lines".
 std::string Counted(uint64_t number, std::string_view noun);
 
-// Control characters as "\012", so that a file name cannot drive the terminal; the rest as it is.
+// Control characters and those that turn the direction of writing byte by byte as "\012", so that a
+// file name can neither drive the terminal nor look like another; the rest as it is.
 std::string ForTerminal(std::string_view text);
 
 // A word as a shell takes it: as it is, or in single quotes where that is wanted.

@@ -191,6 +191,11 @@ void Watcher::Poll(TimePoint now) {
   if (drained_ && changes_.empty() && !unsettled_.empty()) {
     Settle();
   }
+  // What a root's end was told of may have been made anew long since, and even with its inode: who
+  // looked before the end was read took the new folder for the old one.
+  if (drained_ && changes_.empty() && std::exchange(root_ended_, false)) {
+    CheckRoots();
+  }
   if (now >= next_rescan_) {
     next_rescan_ = now + options_.rescan_interval;
     CheckMounts();
@@ -720,6 +725,7 @@ Watcher::Root* Watcher::RootOf(FolderId folder) {
 }
 
 void Watcher::RootGone(Root& root) {
+  root_ended_ = true;
   Emit(kMaskDelete, true, root.path);
   Drop(std::exchange(root.folder, kNoFolder));
 }

@@ -194,6 +194,7 @@ class Watcher {
   ChangeQueue changes_;
   FolderTree tree_;
   std::vector<Root> roots_;
+  bool root_ended_ = false;  // Since the last look, and its path may hold a folder again.
   // Watches that we removed and whose last event is still to come: until then their numbers mean
   // the old folder, even if the kernel gives them out anew.
   std::unordered_set<int> leaving_;

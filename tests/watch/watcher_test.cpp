@@ -205,6 +205,27 @@ TEST_F(WatcherTest, RootThatGoesAndComesBack) {
   EXPECT_EQ(Text(Take()).substr(0, 14), "create r/e/new");
 }
 
+// As far as a look at it goes, the new folder is the old one.
+TEST_F(WatcherTest, ARootThatIsMadeAnewWithItsInodeIsFoundAtOnce) {
+  Do("mkdir r");
+  Start({in_ + "/r"}, {.polls_roots = false});
+  struct stat before {};
+  struct stat after {};
+  ASSERT_EQ(stat((in_ + "/r").c_str(), &before), 0);
+  for (int i = 0; i < 100 && after.st_ino != before.st_ino; ++i) {
+    Do("rmdir r; mkdir r");
+    ASSERT_EQ(stat((in_ + "/r").c_str(), &after), 0);
+  }
+  if (after.st_ino != before.st_ino) {
+    GTEST_SKIP() << "this file system gives no inode out again";
+  }
+  watcher_->CheckRoots(now_);
+  EXPECT_EQ(Text(Take()), "delete r/, create r/");
+  EXPECT_TRUE(watcher_->State().gone.empty());
+  Do("> r/f");
+  EXPECT_EQ(Text(Take()), "create r/f, write r/f");
+}
+
 TEST_F(WatcherTest, RootsComeAndGoWithoutAGapForTheOthers) {
   Do("mkdir -p a b/bin b/c");
   Start({in_ + "/a"}, {.ignored_names = {"bin"}, .takes_missing_roots = true});

@@ -267,8 +267,9 @@ class FailureNotes {
         said_[name] = error;
         Json::Value fields;
         fields["share"] = name;
-        voice_.Say("failing", TimeOfDay() + "  " + name + ": fails, and is tried again: " + error,
-                   fields);
+        std::string text = TimeOfDay();
+        text.append("  ").append(name).append(": fails, and is tried again: ").append(error);
+        voice_.Say("failing", text, fields);
       }
     }
   }

@@ -167,7 +167,7 @@ inline std::vector<Sample> Samples() {
       {"Latin-2 html", "<html><head><meta charset=iso-8859-2></head><body>\xB1\xEA</body></html>",
        R"({"KAVOMDTextContent":"\u0105\u0119\n"})"},
       {"Shift_JIS html with letters of one maker, and bytes that are none",
-       "<html><!-- <meta charset=koi8-r> --><META content='text/html; CHARSET = \"Shift_JIS\"'>"
+       "<html><!-- > <meta charset=koi8-r> --><META content='text/html; CHARSET = \"Shift_JIS\"'>"
        "<body>\x8D\x60\x87\x40\xFB\xFC \xFC\xFC \x8D\x60</body></html>",
        R"({"KAVOMDTextContent":"\u6e2f\u2460\u9ad9 \ufffd \u6e2f\n"})"},
       {"Latin-1 html as it is written", "<html><meta charset=iso-8859-1><p>\x93\xE4\x94 \x80</p>",
@@ -177,7 +177,8 @@ inline std::vector<Sample> Samples() {
       {"UTF-8 html with a byte that is none",
        "<html><meta charset=utf-8><p>\xE6\xB8\xAF\xE6\xB8\xAF \xE9 \xE6\xB8\xAF</p></html>",
        R"({"KAVOMDTextContent":"\u6e2f\u6e2f \ufffd \u6e2f\n"})"},
-      {"Latin-1 html that says to be UTF-16", "<html><meta charset=utf-16><p>gr\xFCn",
+      {"Latin-1 html that says to be what it cannot be",
+       "<html><meta charset=utf-8><meta charset=iso-10646-ucs-2><p>gr\xFCn",
        R"({"KAVOMDTextContent":"gr\u00fcn\n"})"},
       {"html with a byte-order mark", "\xEF\xBB\xBF<html><title>a</title>b",
        R"({"KAVOMDTextContent":"a\nb\n","KAVOMDTitle":"a"})"},
@@ -203,8 +204,8 @@ inline std::vector<Sample> Samples() {
        R"({"KAVOMDTextContent":"The harbour\u041f \u20ac5 \ud83d\ude00\n{x}\ty","KAVOMDTitle":"Plan",)"
        R"("KAVOMDAuthors":"Ana","KAVOMDContentError":null})"},
       {"rtf with fonts of many encodings, and a text box",
-       R"({\rtf1\pca\deff3{\info{\title\'94}}{\fonttbl{\f0\fcharset0 A;}{\f1\fcharset204 B;})"
-       R"({\f2\fcharset128 C;}{\f3\fcharset238 D;}}\'9c\f0\'94{\f1\'cf\f2\'8d\'60}\'94\plain\'9c)"
+       R"({\rtf1\pca\deff3{\fonttbl{\f0\fcharset0 A;}{\f1\fcharset204 B;}{\f2\fcharset128 C;})"
+       R"({\f3\fcharset238 D;}}{\info{\title\'94}}\'9c\f0\'94{\f1\'cf\f2\'8d\'60}\'94\plain\'9c)"
        R"({\shp{\*\shpinst no{\shptxt box\par}}{\shprslt no}}\f1\'cf})",
        R"({"KAVOMDTextContent":"\u015b\u00f6\u041f\u6e2f\u00f6\u015b\nbox\n\u041f","KAVOMDTitle":"\u00f6"})"},
       {"cut rtf", R"({\rtf1 some {\b text)",

@@ -87,11 +87,15 @@ Verdict JudgePath(Folders& folders, const std::string& path) {
     return {};
   }
   const int folder = folders.Find(path.substr(0, std::max<size_t>(slash, 1)));
+  if (folder < 0) {
+    return {};
+  }
+  // Held, so that the right and the time are of one file while somebody exchanges two.
+  const daemon::UniqueFd file(openat(folder, name.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
   struct stat info {};
   // A link is not read, but what it leads to: nothing that is indexed is one.
-  if (folder < 0 ||
-      syscall(SYS_faccessat2, folder, name.c_str(), R_OK, AT_EACCESS | AT_SYMLINK_NOFOLLOW) != 0 ||
-      fstatat(folder, name.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0 || S_ISLNK(info.st_mode)) {
+  if (file.Get() < 0 || fstat(file.Get(), &info) != 0 || S_ISLNK(info.st_mode) ||
+      syscall(SYS_faccessat2, file.Get(), "", R_OK, AT_EACCESS | AT_EMPTY_PATH) != 0) {
     return {};
   }
   return {true, static_cast<int64_t>(info.st_ctim.tv_sec) * 1000000000 + info.st_ctim.tv_nsec};

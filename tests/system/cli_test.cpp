@@ -35,7 +35,8 @@ const CliCase kCases[] = {
     {"PendingInSnapshot", "queue pending /v/t --queue old", 0, "*pending", ""},
     {"NoReindexAbove", "queue has-reindex /v/s --queue queue", 1, "*no ", ""},
     {"Reindex", "queue has-reindex /v/s/photo/a/ --queue queue", 0, "*pending: /v/s/photo/a", ""},
-    {"BadLine", "queue pending /w --queue bad", 3, "", "Malformed event_raw: \\033["},
+    {"BadLine", "queue pending /w --queue bad", 3, "",
+     "Malformed event_raw: \\033[ caf\xe9 \u017b\u2019 \\302\\2332J \\342\\200\\256gpj \\300\\233"},
     {"NoShares", "share list", 1, "", "there are no shares in '"},
     {"AddShare", "share add vol/photo --recycle --ftp-privilege 7", 0, "*added: photo (/", ""},
     {"AddShareByLink", "share add link", 0, "*added: films (/", ""},
@@ -198,7 +199,9 @@ TEST_F(Cli, AnswersEveryCommandLine) {
 {"event":65536,"path":"/v/s/photo"})");
   WriteText(files_ / "bytes", "{\"event\":131072,\"path\":\"/\xE9 \\\"\\n\xE6\"}");
   WriteText(files_ / "crashed", R"({"event":512,"path":"/v/s"})");
-  WriteText(files_ / "bad", "\033[1m\n");
+  WriteText(files_ / "bad",
+            "\033[ caf\xe9 \u017b\u2019 \xc2\x9b"
+            "2J \u202egpj \xc0\x9b\n");
   WriteText(files_ / "old.tmp", R"({"event":8,"path":"/v/t/x"})");
   const std::string etc = files_ / "root/var/packages/Vexlo/etc";
   MakeFolders({"vol/photo/.git", "films", "root/tmp", "root/var/packages/Vexlo/etc",

@@ -1,8 +1,12 @@
 #include "daemons/kavoelasticd/tokens.h"
 
 #include <gtest/gtest.h>
+#include <unicode/normalizer2.h>
+#include <unicode/unistr.h>
 
+#include <chrono>
 #include <string>
+#include <string_view>
 
 #include "daemons/kavoelasticd/fold.h"
 
@@ -29,6 +33,40 @@ TEST(Fold, OneSpellingForOneText) {
   };
   for (const Case& c : cases) {
     EXPECT_EQ(Fold(c.text), c.want) << c.name;
+  }
+}
+
+// The same with ICU alone, for a text without strokes.
+std::string FoldByInsertion(const std::string& text) {
+  UErrorCode status = U_ZERO_ERROR;
+  icu::UnicodeString folded;
+  icu::Normalizer2::getNFKCCasefoldInstance(status)->normalize(icu::UnicodeString::fromUTF8(text),
+                                                               folded, status);
+  std::string ordered;
+  folded.toUTF8String(ordered);
+  return Fold(ordered);
+}
+
+std::string Repeat(const std::string& text, size_t bytes) {
+  std::string repeated;
+  while (repeated.size() < bytes) {
+    repeated += text;
+  }
+  return repeated;
+}
+
+// What is not in order as it stands: marks of two classes, those that only come apart to marks, and
+// those that only meet when what stands between them is gone.
+TEST(Fold, AnyNumberOfMarksIsFoldedAtOnceAndAlike) {
+  for (const char* const marks : {"\u0301\u0316", "\u0f73\u0f71", "\u0301\u034f\u0316\u034f",
+                                  "\u3099\U0001d165", "\uff9e\u0334\uff9f"}) {
+    for (const size_t count : {1, 10, 40}) {
+      const std::string run = Repeat(marks, std::string_view(marks).size() * count);
+      EXPECT_EQ(Fold("\u00e9" + run), FoldByInsertion("\u00e9" + run)) << marks << count;
+    }
+    const auto start = std::chrono::steady_clock::now();
+    Fold("z" + Repeat(marks, size_t{1} << 20));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(2)) << marks;
   }
 }
 

@@ -110,8 +110,10 @@ void Store::OpenWriter(const std::string& token) {
       language_ = LanguageOf(JsonMeta(db, "settings"));
     }
     write_session_ = std::make_unique<Session>(file, Connection::Use::kWrite, *schema_, language_);
+    // A copy made by VACUUM INTO has no log; in one that has, the first statement changes nothing.
     write_session_->db.Run(
-        "PRAGMA synchronous=FULL; PRAGMA cache_size=-32768; PRAGMA wal_autocheckpoint=4000;"
+        "PRAGMA journal_mode=WAL; PRAGMA synchronous=FULL; PRAGMA cache_size=-32768; PRAGMA "
+        "wal_autocheckpoint=4000;"
         "PRAGMA journal_size_limit=67108864");
     if (lacks_folder_sums_) {
       write_session_->AddFolderSums();

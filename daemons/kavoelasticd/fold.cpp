@@ -93,6 +93,21 @@ icu::UnicodeString LongRunsInOrder(const icu::Normalizer2& form, const icu::Unic
   return ordered;
 }
 
+// Letters with a stroke through them are accented to whoever has no key for them, but Unicode takes
+// none of them apart.
+UChar32 WithoutStroke(UChar32 c) {
+  switch (c) {
+    case 0x00F8:
+      return 'o';
+    case 0x0111:
+      return 'd';
+    case 0x0142:
+      return 'l';
+    default:
+      return c;
+  }
+}
+
 void FoldUnicode(std::string_view text, std::string* out) {
   static const Normalizers normalizers;
   UErrorCode status = U_ZERO_ERROR;
@@ -106,7 +121,7 @@ void FoldUnicode(std::string_view text, std::string* out) {
   icu::UnicodeString bare;
   for (int32_t i = 0; i < apart.length(); i = apart.moveIndex32(i, 1)) {
     if (const UChar32 c = apart.char32At(i); !IsAccent(c)) {
-      bare.append(c);
+      bare.append(WithoutStroke(c));
     }
   }
   const icu::UnicodeString whole = normalizers.compose->normalize(bare, status);

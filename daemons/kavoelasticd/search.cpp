@@ -435,7 +435,7 @@ SearchRequest ParseSearch(const Json::Value& data) {
   WordCutter cutter("none");
   for (SearchRequest::Term& term : ParseWords(words)) {
     if (!cutter.QueryTokens(term.text, Cut::kPrefixQuery).empty()) {
-      term.prefix = term.prefix || IsSingleIdeograph(term.text);
+      term.prefix = term.prefix || EndsInSingleIdeograph(term.text);
       request.terms.push_back(std::move(term));
     }
   }

@@ -29,6 +29,7 @@ TEST(Fold, OneSpellingForOneText) {
       {"HalfWidthVoicedKana", "\uff76\uff9e", "\u30ac"},
       {"DecomposedHangul", "\u1112\u1161\u11ab", "\ud55c"},
       {"VowelSignsStay", "\u0915\u0941", "\u0915\u0941"},
+      {"Strokes", "\u0141\u00f3d\u017a \u0110\u00d8 \u01ff", "lodz do o"},
       {"BadBytesStay", "A\xff\xc3Z", "a\xff\xc3z"},
   };
   for (const Case& c : cases) {
@@ -104,6 +105,14 @@ TEST(WordCutter, CutsDocumentsAndQueries) {
        "a\u6771\u4eac"
        "b",
        "a \u6771\u4eac/\u4eac b", "a \u6771\u4eac b", "a \u6771\u4eac b"},
+      {"ThaiInPairsOfClusters", "\u0e19\u0e49\u0e33\u0e17\u0e35\u0e48\u0e44",
+       "\u0e19\u0e49\u0e4d\u0e32\u0e17\u0e35\u0e48 \u0e17\u0e35\u0e48\u0e44/\u0e44",
+       "\u0e19\u0e49\u0e4d\u0e32\u0e17\u0e35\u0e48 \u0e17\u0e35\u0e48\u0e44",
+       "\u0e19\u0e49\u0e4d\u0e32\u0e17\u0e35\u0e48 \u0e17\u0e35\u0e48\u0e44"},
+      {"ZeroWidthSpace", "hello\u200bworld \u1780\u200b\u1781", "hello world \u1780 \u1781",
+       "hello world \u1780 \u1781", "hello world \u1780 \u1781"},
+      {"MarksWithoutEnd", "\u6771" + Repeat("\u3099", 3000), "\u6771" + Repeat("\u3099", 123),
+       "\u6771" + Repeat("\u3099", 123), "\u6771" + Repeat("\u3099", 123)},
       {"SoftHyphen", "co\u00adop", "coop", "coop", "coop"},
       {"LongWordsAreCutAlike", std::string(300, 'x'), std::string(128, 'x'), std::string(128, 'x'),
        std::string(128, 'x')},

@@ -45,17 +45,30 @@ void Sync(const std::string& path) {
   }
 }
 
+// As far as it came: it may fill the disk.
+void RemoveCopy(const std::string& folder) noexcept {
+  for (const char* suffix : {".copy-journal", ".copy", ""}) {
+    unlink((Database(folder) + suffix).c_str());
+  }
+}
+
 void CopyDatabase(const std::string& from, const std::string& to) {
   const std::string copy = Database(to) + ".copy";
   Remove(copy);
-  MakePrivateFile(copy);
-  {
-    Connection db(Database(from), Connection::Use::kWrite);
-    Sql(db, "VACUUM INTO ?").Text(copy).Run();
-  }
-  Sync(copy);
-  if (rename(copy.c_str(), Database(to).c_str()) != 0) {
-    Fail("renaming failed", copy);
+  try {
+    MakePrivateFile(copy);
+    {
+      Connection db(Database(from), Connection::Use::kWrite);
+      Sql(db, "VACUUM INTO ?").Text(copy).Run();
+    }
+    Sync(copy);
+    if (rename(copy.c_str(), Database(to).c_str()) != 0) {
+      Fail("renaming failed", copy);
+    }
+    SyncFolder(to);
+  } catch (...) {
+    RemoveCopy(to);
+    throw;
   }
 }
 
@@ -74,6 +87,20 @@ bool Exists(const std::string& path) {
     Fail("looking for it failed", path);
   }
   return false;
+}
+
+bool IsSameFile(const std::string& a, const std::string& b) {
+  struct stat first;
+  struct stat second;
+  return stat(a.c_str(), &first) == 0 && stat(b.c_str(), &second) == 0 &&
+         first.st_dev == second.st_dev && first.st_ino == second.st_ino;
+}
+
+bool OnOneDisk(const std::string& a, const std::string& b) {
+  struct stat first;
+  struct stat second;
+  return stat(a.c_str(), &first) == 0 && stat(b.c_str(), &second) == 0 &&
+         first.st_dev == second.st_dev;
 }
 
 void MakeFolders(const std::string& path) {
@@ -98,7 +125,7 @@ void SyncFolder(const std::string& path) {
 
 void RemoveDatabase(const std::string& folder) {
   // The file itself last: as long as it stands, its log belongs to it.
-  for (const char* suffix : {"-shm", "-wal", "-journal", ".copy", ""}) {
+  for (const char* suffix : {"-shm", "-wal", "-journal", ".copy-journal", ".copy", ""}) {
     Remove(Database(folder) + suffix);
   }
 }
@@ -125,7 +152,6 @@ void MoveDatabase(const std::string& from, const std::string& to) {
       Fail("moving the database failed", Database(from));
     }
     CopyDatabase(from, to);
-    SyncFolder(to);
     RemoveDatabase(from);
   }
   SyncFolder(to);

@@ -12,6 +12,11 @@ std::string ErrnoText(const std::string& what, const std::string& path);
 // Throws Failure kStorage when that cannot be told: what counts as missing is made anew.
 bool Exists(const std::string& path);
 
+// Whether both names lead to one file or folder. False where there is none.
+bool IsSameFile(const std::string& a, const std::string& b);
+// Whether both are on one file system. False where there is none.
+bool OnOneDisk(const std::string& a, const std::string& b);
+
 // Makes the folder with those above it. Throws Failure kStorage.
 void MakeFolders(const std::string& path);
 
@@ -29,7 +34,9 @@ void RemoveDatabase(const std::string& folder);
 void RemoveIndexFolder(const std::string& folder);
 
 // Moves the database, which is closed and whole in its one file, to another folder, instead of what
-// is there; across disks as a copy that stands whole before the old one goes. Throws Failure.
+// is there; across disks as a copy that stands whole before the old one goes, for which it may be
+// open, with its log. Throws Failure; where no database stands in `to` then, the one in `from` is
+// as it was, and nothing is left of a copy.
 void MoveDatabase(const std::string& from, const std::string& to);
 
 // Renames the database to "index.db.WHY-N" with a new N; the name, or "" when there was nothing.

@@ -350,6 +350,49 @@ void Engine::CloseCleanly(Slot& slot) {
   }
 }
 
+// As CloseCleanly(); but what fills its disk moves to another one with its log, from which a copy
+// reads it. Then the index stays open.
+void Engine::CloseToMove(Slot& slot, const std::string& to) {
+  if (slot.store != nullptr) {
+    slot.store->Commit();
+  }
+  try {
+    CloseCleanly(slot);
+  } catch (const Failure& failure) {
+    if (failure.GetCode() != Code::kNoSpace || slot.store == nullptr ||
+        OnOneDisk(slot.entry.path, to)) {
+      throw;
+    }
+  }
+}
+
+// The registry tells of the move until the caller puts the new place into it.
+void Engine::MoveFiles(Slot& slot, const std::string& to) {
+  // For good before the registry tells of the move: a database that stands there counts as moved.
+  // It may be somebody's backup.
+  SetAside(to, "found");
+  RemoveDatabase(to);
+  SyncFolder(to);
+  RegistryEntry moving = slot.entry;
+  moving.move_to = to;
+  {
+    const kavo::local::MutexLock lock(registry_mutex_);
+    registry_.Put(slot.id, moving);
+  }
+  try {
+    MoveDatabase(slot.entry.path, to);
+  } catch (const Failure& failure) {
+    if (!Exists(DatabaseFile(to))) {
+      const kavo::local::MutexLock lock(registry_mutex_);
+      registry_.Put(slot.id, slot.entry);
+      throw;
+    }
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                "an index is moved and its old place not tidied, id=" + slot.id +
+                    ", path=" + slot.entry.path + ", reason=" + failure.what());
+  }
+}
+
 void Engine::IndexCreate(const Json::Value& data) {
   const std::string id = RequiredText(data, "id");
   const std::string path = AbsoluteFolder(RequiredText(data, "path"));
@@ -437,26 +480,18 @@ void Engine::IndexConfigSet(const Json::Value& data) {
       throw Failure(Code::kIndexExists, "the id or the folder belongs to another index");
     }
   }
-  CloseCleanly(*slot);
-  entry.state = slot->entry.state;
-  // With nothing at the old place, whoever moved the share has moved the database with it.
   if (entry.path != from && Exists(DatabaseFile(from))) {
     MakeFolders(entry.path);
-    // For good before the registry tells of the move: a database that stands there counts as moved.
-    // It may be somebody's backup.
-    if (slot->entry.move_to != entry.path) {
-      SetAside(entry.path, "found");
-    }
-    RemoveDatabase(entry.path);
-    SyncFolder(entry.path);
-    RegistryEntry moving = slot->entry;
-    moving.move_to = entry.path;
-    {
-      const kavo::local::MutexLock lock(registry_mutex_);
-      registry_.Put(id, moving);
-    }
-    MoveDatabase(from, entry.path);
   }
+  CloseToMove(*slot, entry.path);
+  entry.state = slot->entry.state;
+  // With nothing at the old place, whoever moved the share has moved the database with it. And the
+  // new place may be another name of the old one.
+  if (entry.path != from && Exists(DatabaseFile(from)) &&
+      !IsSameFile(DatabaseFile(from), DatabaseFile(entry.path))) {
+    MoveFiles(*slot, entry.path);
+  }
+  slot->store.reset();
   const kavo::local::MutexLock lock(registry_mutex_);
   registry_.Replace(id, new_id, entry);
   slot->id = new_id;

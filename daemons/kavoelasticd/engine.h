@@ -92,6 +92,8 @@ class Engine {
   SlotPtr Find(const std::string& id);
   void Open(Slot& slot) KAVO_REQUIRES(slot.gate);
   void CloseCleanly(Slot& slot) KAVO_REQUIRES(slot.gate);
+  void CloseToMove(Slot& slot, const std::string& to) KAVO_REQUIRES(slot.gate);
+  void MoveFiles(Slot& slot, const std::string& to) KAVO_REQUIRES(slot.gate);
   void MarkDamaged(Slot& slot, const std::string& reason) KAVO_REQUIRES(slot.gate);
   void SetState(Slot& slot, State state) KAVO_REQUIRES(slot.gate);
   void NoteChange();

@@ -24,9 +24,9 @@ inline int32_t NextCodePoint(std::string_view text, size_t* at) {
   return NextWideCodePoint(text, at);
 }
 
-// NFKC with case folding, without the accents of Latin, Greek, Cyrillic and Arabic letters. The
-// voice marks of kana and the vowel signs of Indic scripts tell words apart and stay. Bytes that
-// are no UTF-8 stay as they are.
+// NFKC with case folding, without the accents of Latin, Greek, Cyrillic and Arabic letters, and
+// without the strokes of d, l and o. The voice marks of kana and the vowel signs of Indic scripts
+// tell words apart and stay. Bytes that are no UTF-8 stay as they are.
 std::string Fold(std::string_view text);
 
 }  // namespace vexlo::elasticd

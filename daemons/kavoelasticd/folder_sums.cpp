@@ -167,19 +167,6 @@ void FolderSums::Write() {
   Clear();
 }
 
-void FillFolderSums(Session& session) {
-  constexpr unsigned kAtOnce = 100'000;
-  FolderSums sums(session);
-  Sql rows(session.db, "SELECT d.path, r.record FROM docs d CROSS JOIN records r ON r.id = d.id");
-  for (unsigned i = 1; rows.Row(); ++i) {
-    sums.Change({}, {0, rows.StringAt(0), Record::Decode(rows.StringAt(1))});
-    if (i % kAtOnce == 0) {
-      sums.Write();
-    }
-  }
-  sums.Write();
-}
-
 Json::Value GetFolderDigests(Session& session, const Json::Value& data) {
   std::string root = RequiredText(data, "below");
   root += root.ends_with('/') ? "" : "/";

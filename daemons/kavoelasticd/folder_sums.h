@@ -46,9 +46,6 @@ class FolderSums {
 // The statement that makes the table.
 extern const char kMakeFolderSums[];
 
-// Fills the table, which is empty, from the documents that there are.
-void FillFolderSums(Session& session);
-
 // folder_digests: those of a folder and of all below it. Throws Failure.
 Json::Value GetFolderDigests(Session& session, const Json::Value& data);
 

@@ -104,7 +104,7 @@ void CollectExact(Session& session, const Condition& condition, const Field& fie
 void CollectWords(Session& session, const Condition& condition, const Field& field,
                   std::vector<int64_t>* ids) {
   const std::string text = condition.value.asString();
-  const bool prefix = condition.prefix || IsSingleIdeograph(text);
+  const bool prefix = condition.prefix || EndsInSingleIdeograph(text);
   if (session.words.QueryTokens(text, Cut::kPrefixQuery).empty()) {
     return;
   }
@@ -168,7 +168,7 @@ bool TextFits(Session& session, const Field& field, const std::string& text,
       return condition.prefix ? at == 0 : at != std::string::npos;
     }
     default: {
-      const bool prefix = condition.prefix || IsSingleIdeograph(wanted);
+      const bool prefix = condition.prefix || EndsInSingleIdeograph(wanted);
       return session.words.Contains(
           text, session.words.QueryTokens(wanted, prefix ? Cut::kPrefixQuery : Cut::kQuery),
           prefix);

@@ -119,7 +119,8 @@ const RegistryEntry* Registry::Find(const std::string& id) const {
 
 std::string Registry::OwnerOf(const std::string& path) const {
   for (const auto& [id, entry] : entries_) {
-    if (entry.path == path) {
+    if (entry.path == path || entry.move_to == path || IsSameFile(entry.path, path) ||
+        (!entry.move_to.empty() && IsSameFile(entry.move_to, path))) {
       return id;
     }
   }

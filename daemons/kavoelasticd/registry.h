@@ -30,7 +30,7 @@ class Registry {
 
   const std::map<std::string, RegistryEntry>& Entries() const { return entries_; }
   const RegistryEntry* Find(const std::string& id) const;
-  // The id of the index in that folder, "" for none.
+  // The id of the index that is in that folder or on its way there, by whatever name; "" for none.
   std::string OwnerOf(const std::string& path) const;
 
   // Throw Failure kStorage, and nothing has changed.

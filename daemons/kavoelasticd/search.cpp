@@ -104,7 +104,7 @@ std::vector<SearchRequest::Term> TermsOf(const std::string& words) {
   for (SearchRequest::Term& term : ParseWords(words)) {
     std::vector<std::string> tokens = cutter.QueryTokens(term.text, Cut::kPrefixQuery);
     const size_t count = tokens.size();
-    term.prefix = term.prefix || IsSingleIdeograph(term.text);
+    term.prefix = term.prefix || EndsInSingleIdeograph(term.text);
     if (count > 0 && known.emplace(std::move(tokens), term.prefix).second) {
       token_count += count;
       if (terms.size() == kMostTerms || token_count > kMostTokens) {

@@ -28,8 +28,7 @@ StoredDocument Stored(const Sql& row) {
 
 }  // namespace
 
-std::string FormatVersion() { return "3, Unicode " U_UNICODE_VERSION; }
-std::string FormatBeforeFolderSums() { return "2, Unicode " U_UNICODE_VERSION; }
+std::string FormatVersion() { return "4, Unicode " U_UNICODE_VERSION; }
 
 int64_t BodyId(int64_t document, uint32_t field) {
   static_assert(kBodyFields == 1 << 16);
@@ -98,14 +97,6 @@ void Session::MakeTables(const IndexInfo& info) {
   for (const auto& [name, field] : schema.Listed()) {
     Sql(db, "INSERT INTO fields(name) VALUES(?)").Blob(name).Run();
   }
-  db.Run("COMMIT");
-}
-
-void Session::AddFolderSums() {
-  db.Run("BEGIN IMMEDIATE");
-  db.Run(kMakeFolderSums);
-  FillFolderSums(*this);
-  Sql(db, "UPDATE meta SET v = ? WHERE k = 'version'").Blob(FormatVersion()).Run();
   db.Run("COMMIT");
 }
 

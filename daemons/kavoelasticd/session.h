@@ -34,8 +34,6 @@ std::string LanguageOf(const Json::Value& settings);
 // Of the tables and of what cuts texts into words: a text index forgets only what is cut as it was
 // when it was learnt, so an index of another version is made anew.
 std::string FormatVersion();
-// The version before it had the table of FolderSums, and was the same in all else.
-std::string FormatBeforeFolderSums();
 
 // The number of a text of its own: of the document, then the field, which is below kBodyFields.
 int64_t BodyId(int64_t document, uint32_t field);
@@ -61,9 +59,6 @@ class Session {
 
   // Makes the tables of a new index.
   void MakeTables(const IndexInfo& info);
-  // Makes an index of the version FormatBeforeFolderSums() one of this version, wholly or not at
-  // all. The session may write.
-  void AddFolderSums();
 
   Connection db;
   const Schema& schema;

@@ -67,7 +67,6 @@ class Store {
   const std::string folder_;
   std::string language_;
   std::unique_ptr<Schema> schema_;
-  bool lacks_folder_sums_ = false;  // Until it is opened to be written.
   kavo::local::Mutex write_mutex_;
   std::unique_ptr<Session> write_session_ KAVO_GUARDED_BY(write_mutex_);
   std::unique_ptr<Writer> writer_ KAVO_GUARDED_BY(write_mutex_);

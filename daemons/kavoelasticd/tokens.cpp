@@ -18,6 +18,10 @@ namespace {
 constexpr size_t kMaxWordBytes = 128;
 constexpr size_t kKnownWords = 8192;
 
+// Where scripts that are written without spaces end a word, if the writer wants it told.
+constexpr int32_t kZeroWidthSpace = 0x200B;
+
+// Ideographs are, in all of this, also the letters of scripts that are written without spaces.
 enum class Class { kSeparator, kLetter, kExtend, kIdeograph };
 
 constexpr std::array<bool, 256> MakePlainLetters() {
@@ -55,6 +59,9 @@ Class ClassOf(int32_t c) {
   if (c >= 0x4E00 && c <= 0x9FFF) {
     return Class::kIdeograph;
   }
+  if (c == kZeroWidthSpace) {
+    return Class::kSeparator;
+  }
   const uint32_t category = U_GET_GC_MASK(c);
   // Vowels and finals of decomposed Hangul, and the half-width voice marks, belong to the one
   // before.
@@ -74,8 +81,19 @@ Class ClassOf(int32_t c) {
     case USCRIPT_BOPOMOFO:
       return Class::kIdeograph;
     default:
-      return c == 0x30FC || c == 0xFF70 ? Class::kIdeograph : Class::kLetter;
+      break;
   }
+  if (c == 0x30FC || c == 0xFF70) {
+    return Class::kIdeograph;
+  }
+  // Thai is the first of them.
+  if (c < 0x0E00 || u_getIntPropertyValue(c, UCHAR_LINE_BREAK) != U_LB_COMPLEX_CONTEXT) {
+    return Class::kLetter;
+  }
+  // Some vowels of Thai and Lao are letters by category and stand behind what they belong to.
+  return u_getIntPropertyValue(c, UCHAR_GRAPHEME_CLUSTER_BREAK) == U_GCB_SPACING_MARK
+             ? Class::kExtend
+             : Class::kIdeograph;
 }
 
 // Those that fold to themselves, which is most of them.
@@ -97,6 +115,19 @@ size_t ClusterEnd(std::string_view text, size_t at) {
     at = next;
   }
   return at;
+}
+
+// Up to kMaxWordBytes of it.
+std::string FoldedWord(std::string_view text) {
+  std::string folded = Fold(text);
+  if (folded.size() > kMaxWordBytes) {
+    size_t length = kMaxWordBytes;
+    while (length > 0 && (static_cast<unsigned char>(folded[length]) & 0xC0) == 0x80) {
+      --length;
+    }
+    folded.resize(length);
+  }
+  return folded;
 }
 
 struct Cluster {
@@ -192,12 +223,8 @@ bool WordCutter::Word(std::string_view text, size_t begin, size_t end, Cut cut,
   if (LowerAscii(word, plain)) {
     word = std::string_view(plain, word.size());
   } else {
-    folded = Fold(text.substr(begin, end - begin));
-    size_t length = std::min(folded.size(), kMaxWordBytes);
-    while (length < folded.size() && (static_cast<unsigned char>(folded[length]) & 0xC0) == 0x80) {
-      --length;
-    }
-    word = std::string_view(folded).substr(0, length);
+    folded = FoldedWord(text.substr(begin, end - begin));
+    word = folded;
   }
   if (word.empty()) {
     return true;
@@ -221,7 +248,8 @@ void WordCutter::Words(std::string_view text, Cut cut, const TokenSink& sink) {
       case Class::kIdeograph: {
         i = ClusterEnd(text, begin);
         const std::string_view cluster = text.substr(begin, i - begin);
-        run.push_back({FoldsToItself(cluster) ? std::string(cluster) : Fold(cluster), begin, i});
+        run.push_back(
+            {FoldsToItself(cluster) ? std::string(cluster) : FoldedWord(cluster), begin, i});
         continue;
       }
       case Class::kLetter:
@@ -290,10 +318,15 @@ bool WordCutter::Contains(std::string_view text, const std::vector<std::string>&
   return found;
 }
 
-bool IsSingleIdeograph(std::string_view text) {
-  size_t at = 0;
-  return !text.empty() && ClassOf(NextCodePoint(text, &at)) == Class::kIdeograph &&
-         ClusterEnd(text, 0) == text.size();
+bool EndsInSingleIdeograph(std::string_view text) {
+  bool is_single = false;
+  WordCutter("none").Words(text, Cut::kPrefixQuery, [&](const Token& token) {
+    size_t at = token.begin;
+    is_single = ClassOf(NextCodePoint(text, &at)) == Class::kIdeograph &&
+                ClusterEnd(text, token.begin) == token.end;
+    return true;
+  });
+  return is_single;
 }
 
 void Grams(std::string_view text, const std::function<bool(std::string_view)>& sink) {

@@ -27,9 +27,10 @@ struct Token {
 using TokenSink = std::function<bool(const Token&)>;
 
 // Words are runs of letters, digits and marks. A document's word is found by itself and by its
-// stem, a query's by its stem, a query for beginnings by the word as typed. Chinese, Japanese and
-// Korean characters come in overlapping pairs, and the last of a run also alone, at the place of
-// its pair, so that one character is found as the beginning of a pair.
+// stem, a query's by its stem, a query for beginnings by the word as typed. Characters of Chinese,
+// Japanese and Korean, and of scripts that are written without spaces, such as Thai, Lao, Khmer and
+// Burmese, come in overlapping pairs, each with the marks on it, and the last of a run also alone,
+// at the place of its pair, so that one character is found as the beginning of a pair.
 class WordCutter {
  public:
   // A Snowball algorithm's name, or "none". Throws Failure kBadMappings for another one.
@@ -63,8 +64,9 @@ class WordCutter {
   std::vector<Known> known_;
 };
 
-// Whether the text is one character of Chinese, Japanese or Korean, as a query found by beginnings.
-bool IsSingleIdeograph(std::string_view text);
+// Whether the last run of the text is one character of those that come in pairs: a query that ends
+// so is found by beginnings, as documents have a character with the one behind it.
+bool EndsInSingleIdeograph(std::string_view text);
 
 // The parts of two and three characters of a text and its last character: what a name is found by.
 void Grams(std::string_view text, const std::function<bool(std::string_view)>& sink);

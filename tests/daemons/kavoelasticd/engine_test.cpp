@@ -199,6 +199,13 @@ TEST(Engine, IndexesArePausedMovedRenamedAndDeleted) {
   };
   engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");
   EXPECT_EQ(engine.Create("j", folder / "i"), "2003") << "another index's folder";
+  // By another name it is the same place.
+  std::filesystem::create_directory_symlink(folder / ".", folder / "link");
+  EXPECT_EQ(engine.Create("j", folder / "link/i"), "2003");
+  EXPECT_EQ(engine.Move(folder / "link/i"), "ok");
+  EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
+  EXPECT_EQ(engine.Move(folder / "i"), "ok");
+  std::filesystem::remove(folder / "link");
   EXPECT_EQ(engine.Create("j", folder / "j"), "ok");
   // Paused: everything in one file, no work, also after a restart.
   EXPECT_EQ(engine.Do("index_pause"), "ok");

@@ -114,6 +114,10 @@ TEST(EngineFailure, AFullDiskIsToldAndTakesNothingThatIsCommitted) {
   SKIP_IF_REFUSED(disk);
   ASSERT_EQ(engine.Move(disk / "index"), "ok");
   engine.Add("/v/a", R"({"KAVOMDTitle":"kept"})");
+  // More than there is room for in the file while it is in the log, too.
+  for (int i = 0; i < 300; ++i) {
+    engine.Add("/w/" + std::to_string(i), R"({"Quiet":")" + std::string(390, 'x') + "\"}");
+  }
   EXPECT_EQ(engine.Do("commit"), "ok");
   std::ofstream filler(disk / "filler", std::ios::binary);
   while (filler << std::string(4096, 'x') << std::flush) {
@@ -125,6 +129,28 @@ TEST(EngineFailure, AFullDiskIsToldAndTakesNothingThatIsCommitted) {
   EXPECT_EQ(answer, "2010");
   engine.Do("commit");  // May say that work was lost, but once only.
   EXPECT_EQ(engine.Search(R"({"words":"kept"})"), "/v/a");
+  // Another disk takes it, with what cannot be brought from the log into its file.
+  EXPECT_EQ(engine.Do("index_pause"), "2010") << "the log still fits into its file";
+  EXPECT_EQ(engine.Move(engine.Folder() / "roomy"), "ok");
+  EXPECT_FALSE(std::filesystem::exists(disk / "index"));
+  EXPECT_EQ(engine.Add("/v/b", R"({"KAVOMDTitle":"kept"})"), "ok");
+  EXPECT_EQ(engine.Search(R"({"words":"kept","sort":"path"})"), "/v/a /v/b");
+}
+
+TEST(EngineFailure, AMoveThatFailsLeavesTheIndexAndTheRoom) {
+  EngineFixture engine;
+  const SyslogCapture log;
+  const auto disk = ScopedMount::Tmpfs(engine.Folder() / "disk", "size=64k");
+  SKIP_IF_REFUSED(disk);
+  for (int i = 0; i < 300; ++i) {
+    engine.Add("/v/" + std::to_string(i), R"({"KAVOMDTitle":"kept"})");
+  }
+  EXPECT_EQ(engine.Move(disk / "index"), "2010");
+  EXPECT_TRUE(std::filesystem::is_empty(disk / "index"));
+  // A database that comes there later is another one.
+  EXPECT_EQ(ReadText(engine.Folder() / "registry.json").find("move_to"), std::string::npos);
+  engine.Restart();
+  EXPECT_EQ(engine.Send("search", Parsed(R"({"words":"kept"})"))["total"].asInt(), 300);
 }
 
 TEST(EngineFailure, ADocumentThatCannotMoveStaysAlone) {

@@ -125,12 +125,6 @@ class Oracle {
     EXPECT_EQ(got, want);
   }
 
-  // What an engine that knew of no digests has left.
-  void ForgetFolders() {
-    engine_.ChangeDatabase("DROP TABLE folders; UPDATE meta SET v = '" +
-                           vexlo::elasticd::FormatBeforeFolderSums() + "' WHERE k = 'version'");
-  }
-
   // Of a file as the index daemon tells it, or what may be taken for it and is none.
   std::string Stamp() {
     const std::string stamp = R"({"ctime":)" + std::to_string(random_() % 3) +
@@ -259,9 +253,6 @@ class Oracle {
     }
     if (random_() % 4 == 0) {
       engine_.Restart();
-    }
-    if (random_() % 8 == 0) {
-      ForgetFolders();
     }
     if (random_() % 4 == 0) {
       while (engine_.Engine().CommitIdle(std::chrono::seconds(0))) {

@@ -33,7 +33,13 @@ TEST(Search, FindsWordsNamesAndWhatTheFiltersLeave) {
                  "KAVOMDFSContentChangeDate":2000,"Quiet":"whisper","Quiet text":"murmur","Hidden":"secretly"})");
   engine.Add("/v/b/\u6771\u4eac\u90fd\u306e\u5730\u56f3.pdf",
              "{\"KAVOMDTextContent\":\"\u65e5\u672c\u8a9e\u306e\u6587\u7ae0\"}");
+  engine.Add("/v/c/1",
+             "{\"KAVOMDTextContent\":\"2019\u5e74\u5ea6 5\uac1c\uc6d4\","
+             "\"Note\":\"\u0e2a\u0e27\u0e31\u0e2a\u0e14\u0e35\"}");
   const SearchCase cases[] = {
+      {"OneIdeographBehindDigits", "{\"words\":\"2019\u5e74\"}", "/v/c/1"},
+      {"OneSyllableBehindADigit", "{\"words\":\"\\\"5\uac1c \\\"\"}", "/v/c/1"},
+      {"InsideARunWithoutSpaces", "{\"words\":\"\u0e2a\u0e14\u0e35\"}", "/v/c/1"},
       {"Stem", R"({"words":"fox","sort":"path"})", "/v/a/fox.JPG /v/a/report.txt /v/ab/notes.md"},
       {"NameCountsMost", R"({"words":"fox","size":1})", "/v/a/fox.JPG"},
       {"WordsOfDifferentFields", R"({"words":"fox winter"})", "/v/a/fox.JPG"},
@@ -62,6 +68,10 @@ TEST(Search, FindsWordsNamesAndWhatTheFiltersLeave) {
   for (const SearchCase& c : cases) {
     EXPECT_EQ(engine.Search(c.data), c.want) << c.name;
   }
+  EXPECT_EQ(engine.Query("{\"term\":{\"KAVOMDTextContent\":\"2019\u5e74\"}}"), "/v/c/1");
+  EXPECT_EQ(engine.Query("{\"and\":[{\"term\":{\"KAVOMDPath\":\"/v/c/1\"}},"
+                         "{\"term\":{\"KAVOMDTextContent\":\"5\uac1c\"}}]}"),
+            "/v/c/1");
   const SearchCase refused[] = {
       {"Sort", R"({"sort":"colour"})", "2000"},
       {"From", R"({"from":1e30})", "2000"},

@@ -28,6 +28,7 @@ constexpr size_t kMaxWaiting = size_t{1} << 20;
 constexpr size_t kFoldersBetweenPulls = 256;
 constexpr size_t kMaxOpenFolders = 32;
 constexpr std::chrono::milliseconds kHintWait(2000);
+constexpr std::chrono::milliseconds kRetryPause(1000);
 constexpr size_t kRescanAtOnce = 1024;  // Folders, so that events are not kept waiting for longer.
 
 Fd StartInotify() {
@@ -89,6 +90,9 @@ std::set<std::string> MountsNow() {
   }
   return mounts;
 }
+
+// Otherwise descriptors or memory were short, or a disk failed, which may be over in a moment.
+bool MeansNoPermission(int error) { return error == EACCES || error == EPERM; }
 
 std::string Count(size_t count, const char* what) {
   return std::to_string(count) + " " + what + (count == 1 ? "" : "s");
@@ -207,8 +211,15 @@ void Watcher::Poll(TimePoint now) {
       }
     }
   }
+  if (now >= next_retry_) {
+    next_retry_ = TimePoint::max();
+    rescan_.insert(rescan_.end(), unreadable_.begin(), unreadable_.end());
+  }
   TakeHints();
   Rescan();
+  if (unreadable_.empty()) {
+    retry_pause_ = {};
+  }
   LogChangedState();
   tree_.Reclaim();
 }
@@ -217,7 +228,7 @@ TimePoint Watcher::NextDeadline() const {
   if (!rescan_.empty() || !drained_) {
     return TimePoint::min();
   }
-  return std::min({IsAtRest() ? TimePoint::max() : next_rescan_,
+  return std::min({IsAtRest() ? TimePoint::max() : next_rescan_, next_retry_,
                    hinted_.empty() ? TimePoint::max() : next_hinted_,
                    changes_.NextDeadline().value_or(TimePoint::max())});
 }
@@ -313,7 +324,7 @@ void Watcher::ApplyToEntry(const Change& change, FolderId parent) {
     case ChangeKind::kAttributes:
       Emit(kMaskAttrib, change.is_dir, std::move(path));
       if (known != kNoFolder && unreadable_.count(known) != 0) {
-        Walk({{parent, change.name, true}}, {});
+        Walk({{parent, change.name, true}}, {.deep = true});
       }
       break;
     case ChangeKind::kDeleted:
@@ -550,9 +561,14 @@ Watcher::Entered Watcher::EnterUnopened(const Visit& visit, int parent_fd, bool 
     known = tree_.Add(visit.parent, visit.name, IdentityOf(attributes));
     entered.appeared = true;
   }
-  if (tree_.Watch(known) < 0) {
-    unwatched_.erase(known);
-    unreadable_.insert(known);
+  // With a watch, too: what was made in it meanwhile has not been read.
+  unwatched_.erase(known);
+  unreadable_.insert(known);
+  if (!MeansNoPermission(error) && next_retry_ == TimePoint::max()) {
+    retry_pause_ = std::clamp<std::chrono::milliseconds>(
+        2 * retry_pause_, std::min(kRetryPause, options_.rescan_interval),
+        options_.rescan_interval);
+    next_retry_ = now_ + retry_pause_;
   }
   entered.folder = known;
   return entered;
@@ -862,8 +878,9 @@ void Watcher::Rescan() {
   for (size_t i = 0; i < kRescanAtOnce && !rescan_.empty(); ++i) {
     const FolderId folder = rescan_.back();
     rescan_.pop_back();
-    if (unwatched_.count(folder) != 0 || unreadable_.count(folder) != 0) {
-      Walk({{tree_.Parent(folder), tree_.Name(folder), true}}, {});
+    const bool unreadable = unreadable_.count(folder) != 0;
+    if (unreadable || unwatched_.count(folder) != 0) {
+      Walk({{tree_.Parent(folder), tree_.Name(folder), true}}, {.deep = unreadable});
     }
   }
 }

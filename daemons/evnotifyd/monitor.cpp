@@ -24,7 +24,7 @@ constexpr std::chrono::milliseconds kDebounce(50);
 constexpr std::chrono::milliseconds kFirstPause(1000);
 constexpr size_t kSpared = 3;  // Queues that give way to the daemon's own threads.
 constexpr uint32_t kFolderMask =
-    IN_MOVED_TO | IN_MOVED_FROM | IN_CLOSE_WRITE | IN_DELETE | IN_ONLYDIR;
+    IN_MOVED_TO | IN_MOVED_FROM | IN_CLOSE_WRITE | IN_DELETE | IN_MOVE_SELF | IN_ONLYDIR;
 
 QueueStats WaitingFor(const RegisteredQueue& registered, const std::string& reason) {
   QueueStats stats;
@@ -81,7 +81,7 @@ Monitor::~Monitor() {
 void Monitor::Run(const std::stop_token& stop) {
   while (!stop.stop_requested()) {
     // Without a watch there is only time to go by.
-    const bool blind = !folder_watched_ || !root_paths_.IsComplete();
+    const bool blind = folder_watch_ < 0 || !root_paths_.IsComplete();
     const TimePoint look_at = blind ? Clock::now() + options_.rescan : TimePoint::max();
     std::vector<pollfd> fds = {{registrations_.Get(), POLLIN, 0},
                                {mounts_.Get(), POLLPRI, 0},
@@ -101,16 +101,19 @@ void Monitor::Run(const std::stop_token& stop) {
   }
 }
 
-// The folder is made anew when somebody has removed it; where it was watched before, nothing
-// changes.
+// The folder is made anew when somebody has removed it or moved it away; where it was watched
+// before, nothing changes.
 void Monitor::WatchFolder() {
   daemon::MakeFolders(folder_);
-  const bool was_watched = std::exchange(
-      folder_watched_, inotify_add_watch(registrations_.Get(), folder_.c_str(), kFolderMask) >= 0);
-  if (!folder_watched_ && was_watched) {
+  const int before = std::exchange(
+      folder_watch_, inotify_add_watch(registrations_.Get(), folder_.c_str(), kFolderMask));
+  if (folder_watch_ < 0 && before >= 0) {
     daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
                 "registrations are looked at time after time, as they cannot be watched, path=" +
                     folder_ + ", reason=" + std::system_category().message(errno));
+  }
+  if (before >= 0 && before != folder_watch_) {
+    inotify_rm_watch(registrations_.Get(), before);  // It may stand elsewhere.
   }
 }
 

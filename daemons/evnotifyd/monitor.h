@@ -60,7 +60,7 @@ class Monitor {
   const Wake wake_;
   daemon::UniqueFd registrations_;
   daemon::UniqueFd mounts_;
-  bool folder_watched_ = false;
+  int folder_watch_ = -1;
   std::chrono::milliseconds pause_{0};  // Before what failed is tried again; 0 when nothing did.
   TimePoint read_at_ = TimePoint::max();
   RootPaths root_paths_;

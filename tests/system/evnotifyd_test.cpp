@@ -182,6 +182,11 @@ TEST_F(EvnotifydTest, ARegistrationThatGrowsLeavesTheRestAlone) {
   Do("share", "> g; > ../other/g");
   AwaitLines("create share/g, write share/g", "q", 5);
   EXPECT_EQ(Stats()["lines"], 7);
+  // So does the folder of the registrations when it is moved away.
+  Do("var/lib/kavo", "mv evnotify old; mkdir -p evnotify");
+  EXPECT_TRUE(Stack::Await([&] { return Stats().isNull(); }));
+  Register({{"other", kMask}});
+  AwaitLines("reindex other/", "q", 7);
 }
 
 TEST_F(EvnotifydTest, TheWayToAFolderMayLeadOverLinks) {

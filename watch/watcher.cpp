@@ -7,9 +7,11 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <iterator>
 #include <memory>
+#include <system_error>
 
 #include "common/check.h"
 #include "common/error.h"
@@ -822,12 +824,22 @@ void Watcher::CheckMounts() {
   std::set_symmetric_difference(mounts.begin(), mounts.end(), mounts_.begin(), mounts_.end(),
                                 std::back_inserter(changed));
   mounts_ = std::move(mounts);
-  for (const std::string& mount : changed) {
-    const std::string path = mount.substr(0, mount.find('\0'));
-    for (const Root& root : roots_) {
-      if (root.folder != kNoFolder && IsBelow(path, root.path)) {
+  if (changed.empty()) {
+    return;
+  }
+  for (const Root& root : roots_) {
+    if (root.folder == kNoFolder) {
+      continue;
+    }
+    // The table has no links in its paths, the root may.
+    std::error_code error;
+    std::string real = std::filesystem::canonical(root.path, error).string();
+    real = error ? root.path : real;
+    for (const std::string& mount : changed) {
+      const std::string path = mount.substr(0, mount.find('\0'));
+      if (IsBelow(path, real)) {
         FolderId folder = root.folder;
-        size_t at = root.path.size() == 1 ? 0 : root.path.size();
+        size_t at = real.size() == 1 ? 0 : real.size();
         for (FolderId next = folder; next != kNoFolder && at < path.size();) {
           const size_t slash = std::min(path.find('/', at + 1), path.size());
           next = tree_.Find(folder, std::string_view(path).substr(at + 1, slash - at - 1));

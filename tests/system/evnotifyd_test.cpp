@@ -216,6 +216,29 @@ TEST_F(EvnotifydTest, TheWayToAFolderMayLeadOverLinks) {
   AwaitLines("create link/photo/f, write link/photo/f", "q", count);
 }
 
+TEST_F(EvnotifydTest, AFolderThatSomebodyStandsInMayGoWithTheOneInIt) {
+  kRoot.MakeFolder("way/root");
+  Register({{"way/root", kMask}});
+  Start();
+  AwaitLines("reindex way/root/");
+  const int stands = open((kRoot / "way").c_str(), O_PATH | O_CLOEXEC);
+  ASSERT_GE(stands, 0);
+  Do("", "rmdir way/root");
+  AwaitLines("delete way/root/", "q", 1);
+  // By the second registration the daemon has looked at the way again.
+  for (const char* const other : {"one", "two"}) {
+    const size_t count = CountLines();
+    kRoot.MakeFolder(other);
+    Register({{"way/root", kMask}, {other, kMask}});
+    AwaitLines(std::string("reindex ") + other + "/", "q", count);
+  }
+  const size_t count = CountLines();
+  Do("", "rmdir way");
+  Do("", "mkdir -p way/root");
+  AwaitLines("reindex way/root/", "q", count);
+  close(stands);
+}
+
 TEST_F(EvnotifydTest, WhatIsMountedInAShareIsReadAnew) {
   Do("share", "mkdir -p d/e; > d/e/hidden");
   Register({{"share", kMask}});

@@ -96,6 +96,19 @@ std::set<std::string> MountsNow() {
 // Otherwise descriptors or memory were short, or a disk failed, which may be over in a moment.
 bool MeansNoPermission(int error) { return error == EACCES || error == EPERM; }
 
+// Whether the way down from `folder` leads over a symbolic link to what is below it; `path` itself
+// is not looked at.
+bool HasLinkBetween(const std::string& folder, const std::string& path) {
+  for (size_t slash = path.find('/', folder.size() + 1); slash != std::string::npos;
+       slash = path.find('/', slash + 1)) {
+    struct stat attributes = {};
+    if (lstat(path.substr(0, slash).c_str(), &attributes) == 0 && S_ISLNK(attributes.st_mode)) {
+      return true;
+    }
+  }
+  return false;
+}
+
 std::string Count(size_t count, const char* what) {
   return std::to_string(count) + " " + what + (count == 1 ? "" : "s");
 }
@@ -756,7 +769,7 @@ void Watcher::CheckPath(const std::string& path) const {
               "cannot be watched as a folder, path=" + path + ", reason=" + strerror(errno));
 }
 
-// Whether a walk from the root comes to the path.
+// Whether a walk from the root comes to the path by its name; it follows no link.
 bool Watcher::Covers(const std::string& root, const std::string& path) const {
   if (!IsBelow(path, root)) {
     return false;
@@ -768,8 +781,9 @@ bool Watcher::Covers(const std::string& root, const std::string& path) const {
 }
 
 bool Watcher::IsCovered(const std::string& path) const {
-  return std::any_of(roots_.begin(), roots_.end(),
-                     [&](const Root& root) { return Covers(root.path, path); });
+  return std::any_of(roots_.begin(), roots_.end(), [&](const Root& root) {
+    return Covers(root.path, path) && !HasLinkBetween(root.path, path);
+  });
 }
 
 bool Watcher::CoversARoot(const std::string& path) const {

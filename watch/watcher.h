@@ -83,9 +83,10 @@ class Watcher {
 
   // Watches what is below `roots`, absolute paths without "." or ".." and without a slash at the
   // end (other than "/"). What is there already is not reported. A root below another one is
-  // reported by it. Blocks until all folders are read. Throws Error 120 for a root that is no such
-  // path, 502 for one that cannot be opened as a folder (a symbolic link is none) unless
-  // `takes_missing_roots`, 502 when the kernel has no more inotify instances or descriptors.
+  // reported by it, unless a link leads there. Blocks until all folders are read. Throws Error 120
+  // for a root that is no such path, 502 for one that cannot be opened as a folder (a symbolic link
+  // is none) unless `takes_missing_roots`, 502 when the kernel has no more inotify instances or
+  // descriptors.
   Watcher(const std::vector<std::string>& roots, WatchOptions options, Sink sink, TimePoint now);
   ~Watcher() = default;
   Watcher(const Watcher&) = delete;

@@ -282,6 +282,13 @@ TEST_F(WatcherTest, ARootMayLieInWhatIsIgnored) {
   EXPECT_EQ(Text(Take()), "create @eaDir/d/f, write @eaDir/d/f, create b/c/f, write b/c/f");
 }
 
+TEST_F(WatcherTest, ARootBehindALinkInAnotherIsOneOfItsOwn) {
+  Do("mkdir -p ../out/c a/d; ln -s ../out link");
+  Start({in_, in_ + "/link/c", in_ + "/a/d"});
+  Do("> link/c/f; > a/d/f");
+  EXPECT_EQ(Text(Take()), "create link/c/f, write link/c/f, create a/d/f, write a/d/f");
+}
+
 TEST_F(WatcherTest, WithoutPollingOfRootsThereIsNoDeadlineAtRest) {
   Do("mkdir a");
   Start({in_ + "/a", in_ + "/b"}, {.takes_missing_roots = true, .polls_roots = false});

@@ -115,6 +115,7 @@ void Cycle::LookAt(const fileindex::Event& event, std::vector<GoneList::Gone>* g
     NoteTouched(*path);  // Whatever is handed over after this is from before.
     const bool is_new = path == &event.path;
     if (is_new && (event.event & kWritten) != 0 && IsWanted(*path)) {
+      FlushDeletes();
       Submit(*path);
     } else if ((!is_new || (event.event & fileindex::EV_DELETE) != 0) && scope_.Covers(*path) &&
                IsGone(*path)) {
@@ -174,12 +175,29 @@ void Cycle::Carry(const fileindex::OP& op, const std::string& path) {
     }
   }
   if (!scope_.IsInShare(path)) {
-    throw Error(ERR_BAD_PARAMETER, "the path lies outside of the share");
+    VEXLO_CHECK(!IsSameOrBelow(path, scope_.SharePath()), ERR_BAD_PARAMETER,
+                "the path lies outside of the share");
+    LeaveToInnerShare(op, path);
+    return;
   }
   CarryKnown(op, path);
   NoteTouched(path);
   if (op.op == fileindex::OP_RENAME) {
     NoteTouched(op.path_old);
+  }
+}
+
+// The path lies in a share within this one, which has it in an index of its own. Documents from
+// before that share was there go, and so does what has moved there.
+void Cycle::LeaveToInnerShare(const fileindex::OP& op, const std::string& path) {
+  Delete(path);
+  if (op.op != fileindex::OP_RENAME || !scope_.IsInShare(op.path_old)) {
+    return;
+  }
+  if (IsGone(op.path_old)) {
+    Delete(op.path_old);
+  } else {
+    ReconcileMixed(op.path_old);
   }
 }
 
@@ -294,7 +312,7 @@ void Cycle::Rename(const std::string& path, const std::string& path_old) {
   if (step == RenameStep::kMove) {
     NoteMove(path, path_old);
     if (now) {
-      FinishMove(path, document->stamp, *now);
+      FinishMove(path, path_old, document->stamp, *now);
       // What lies below keeps what it was indexed with, unless other settings hold now.
       if (is_mixed || !scope_.HaveSameSettings(path, path_old)) {
         ReconcileMixed(path);
@@ -350,9 +368,10 @@ bool Cycle::Move(const std::string& path, const std::string& path_old) {
 }
 
 // The renamed object's own document: its dates are new, and its type may be.
-void Cycle::FinishMove(const std::string& path, const std::optional<Stamp>& before,
-                       const Stamp& now) {
-  if (!before || before->content != now.content || !HasSameContent(*before, now)) {
+void Cycle::FinishMove(const std::string& path, const std::string& path_old,
+                       const std::optional<Stamp>& before, const Stamp& now) {
+  if (!before || before->content != now.content || !HasSameContent(*before, now) ||
+      GetFileExtension(path, /*lower=*/true) != GetFileExtension(path_old, /*lower=*/true)) {
     Submit(path);
     return;
   }
@@ -484,8 +503,11 @@ void Cycle::Reconcile(const std::string& root, const Json::Value& types, const c
     content = {[this](const std::string& path) { return scope_.WantsContent(path); },
                [this](const std::string& folder) { return scope_.ContentsIn(folder); }};
   }
+  const bool goes_on = !point.after.empty() || point.pass > 1;
   CrawlResult result = Crawl(id_, point, rules, content, deeds);
-  if (result.unknown > 0) {
+  // A crawl that was asked for meanwhile was taken for this one, which had passed a part already,
+  // and by other settings perhaps.
+  if (result.unknown > 0 || goes_on) {
     is_first_time = false;
     result = Crawl(id_, {point.root, point.cause, /*after=*/""}, rules, content, deeds);
   }

@@ -65,13 +65,15 @@ class Cycle {
  private:
   void CarryTwice(const fileindex::OP& op, const std::string& path);
   void Carry(const fileindex::OP& op, const std::string& path);
+  void LeaveToInnerShare(const fileindex::OP& op, const std::string& path);
   void CarryKnown(const fileindex::OP& op, const std::string& path);
   void Delete(const std::string& path);
   void Upsert(const std::string& path);
   void UpdateAttributes(const std::string& path);
   void Rename(const std::string& path, const std::string& path_old);
   bool Move(const std::string& path, const std::string& path_old);
-  void FinishMove(const std::string& path, const std::optional<Stamp>& before, const Stamp& now);
+  void FinishMove(const std::string& path, const std::string& path_old,
+                  const std::optional<Stamp>& before, const Stamp& now);
 
   // Compares what is at and below the path with the index. `types` names the types of files that
   // are indexed anew even so, or is null. The cycle's cause where `cause` is null.

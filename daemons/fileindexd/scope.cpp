@@ -17,9 +17,12 @@
 #include "fileindex/util/path_policy.h"
 #include "fileindex/util/share_path.h"
 #include "kavo/filesystem.h"
+#include "kavo/local/shares.h"
 
 namespace vexlo::fileindexd {
 namespace {
+
+constexpr char kHomesShare[] = "homes";  // In which each user's folder has a recycle bin.
 
 // Whether the errno tells of the machine's state, and nothing of the path.
 bool IsOfMachine(int error) {
@@ -104,7 +107,30 @@ std::string Scope::SettingsOf(const std::string& folder) const {
   return settings;
 }
 
+// Whether something below the folder goes by other rules than the folder: an indexed folder,
+// another share, or a user's recycle bin.
+bool Scope::HoldsRulesOfItsOwn(const std::string& folder) const {
+  if (!inner_shares_) {
+    inner_shares_.emplace();
+    try {
+      for (const kavo::local::Share& share : kavo::local::ReadShares(kavo::local::SharesFile())) {
+        if (share.name != share_ && IsSameOrBelow(share.path, share_path_)) {
+          inner_shares_->push_back(share.path);
+        }
+      }
+    } catch (const kavo::local::SharesError& error) {
+      throw Error(ERR_SHARE_ENUM, error.what());
+    }
+  }
+  return LeadsToFolder(folder) || (share_ == kHomesShare && Dirname(folder) == share_path_) ||
+         std::any_of(inner_shares_->begin(), inner_shares_->end(),
+                     [&](const std::string& share) { return IsSameOrBelow(share, folder); });
+}
+
 bool Scope::HaveSameSettings(const std::string& a, const std::string& b) const {
+  if (HoldsRulesOfItsOwn(a) || HoldsRulesOfItsOwn(b)) {
+    return false;
+  }
   const auto at_a = folders_.GetMostSuitableCfg(a);
   const auto at_b = folders_.GetMostSuitableCfg(b);
   return at_a == at_b ||

@@ -34,7 +34,7 @@ class Scope {
   std::optional<ContentByType> ContentsIn(const std::string& folder) const;
   // The types whose contents are indexed in the folder, in alphabetical order with commas between.
   std::string SettingsOf(const std::string& folder) const;
-  // Whether files of every type are treated alike at both paths.
+  // Whether all at and below both paths is treated alike: by the same settings, and by the policy.
   bool HaveSameSettings(const std::string& a, const std::string& b) const;
 
   // Asks the policy. Throws Error 800 when it refuses because the share cannot be indexed now: that
@@ -50,10 +50,13 @@ class Scope {
   void CheckShare() const;
 
  private:
+  bool HoldsRulesOfItsOwn(const std::string& folder) const;
+
   const std::string share_;
   const std::string share_path_;
   fileindex::FolderMgr folders_;
   std::vector<std::string> full_paths_;
+  mutable std::optional<std::vector<std::string>> inner_shares_;  // Their paths, once asked for.
 };
 
 }  // namespace vexlo::fileindexd

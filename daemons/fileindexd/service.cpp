@@ -25,6 +25,7 @@ constexpr fileindex::FixedPath kPidFile("/var/run/fileindexd.pid");
 constexpr uint64_t kMostCommandBytes = uint64_t{64} << 10;
 constexpr int kLongestCoalescing = 3'600'000;
 constexpr std::chrono::milliseconds kStopTime{1500};
+constexpr std::chrono::milliseconds kLookForEnd{100};
 
 Json::Value Refusal(const std::string& reason) {
   Json::Value answer(Json::objectValue);
@@ -261,8 +262,21 @@ void Service::Delete(const std::string& share, bool unless_indexed) {
     }
     worker = std::move(found->second);
     workers_.erase(found);
+    leaving_ = worker;
   }
   worker->Stop();
+  // What it waits for, such as an engine that hangs, may last for ever; the end of the daemon does
+  // not wait for that.
+  while (!worker->AwaitEnd(std::chrono::steady_clock::now() + kLookForEnd)) {
+    const kavo::local::MutexLock lock(mutex_);
+    if (ending_) {
+      return;
+    }
+  }
+  {
+    const kavo::local::MutexLock lock(mutex_);
+    leaving_.reset();
+  }
   worker.reset();
   // A share that is indexed no more starts from nothing when it comes back.
   if (!is_indexed) {
@@ -299,6 +313,9 @@ bool Service::Stop(std::chrono::milliseconds time) {
     const kavo::local::MutexLock lock(mutex_);
     ending_ = true;
     workers = workers_;
+    if (leaving_ != nullptr) {
+      workers.emplace("", leaving_);  // No share has this name.
+    }
   }
   changed_.NotifyAll();
   for (const auto& [share, worker] : workers) {

@@ -70,6 +70,7 @@ class Service {
   kavo::local::Mutex mutex_;  // Held for moments.
   kavo::local::Condition changed_;
   Workers workers_ KAVO_GUARDED_BY(mutex_);
+  std::shared_ptr<Worker> leaving_ KAVO_GUARDED_BY(mutex_);  // Told to end, and not at its end yet.
   std::deque<Task> tasks_ KAVO_GUARDED_BY(mutex_);
   bool ending_ KAVO_GUARDED_BY(mutex_) = false;
 

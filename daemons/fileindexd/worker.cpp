@@ -33,6 +33,7 @@ constexpr std::chrono::seconds kSpaceWait{60};
 constexpr std::chrono::seconds kShortestUnreadWait{1};
 constexpr std::chrono::seconds kLongestUnreadWait{60};
 constexpr uint64_t kUsualLineBytes = 100;
+constexpr std::chrono::seconds kLongestPauseWait{60};
 constexpr int kBothBits = fileindex::SS_NEED_REINDEX | fileindex::SS_NEED_REBUILD;
 
 // The engine's answers that make creating or deleting what is there, or not there, no failure.
@@ -318,7 +319,9 @@ void Worker::WaitAfter(Outcome outcome) {
       while (!is_called() && pause_.IsOn()) {
         std::optional<Clock::time_point> until;
         if (const auto end = pause_.End()) {
-          until = Clock::now() + std::chrono::seconds(*end - time(nullptr));
+          // The clock of the pause may be set, and goes on while the machine sleeps.
+          const long left = std::clamp<long>(*end - time(nullptr), 0, kLongestPauseWait.count());
+          until = Clock::now() + std::chrono::seconds(left);
         }
         watch_.Wait(until, /*for_queue=*/false);
       }

@@ -339,6 +339,24 @@ TEST(WorkFaults, AComparisonCommitsWhatItFound) {
   EXPECT_EQ(Differences(ListDisk(kIn), index), "");
 }
 
+// Meanwhile others may have been told that it was under way, and not asked for one of their own.
+TEST(WorkFaults, AComparisonThatGoesOnLooksOnceMoreAtWhatItHadPassed) {
+  Clear();
+  fs::remove_all(kIn);
+  kRoot.MakeFolder("vol/docs/in");
+  for (const char* const name : {"/a.txt", "/m.txt", "/z.txt"}) {
+    WriteText(kIn + name, "q000000000000001");
+  }
+  ASSERT_EQ(Tool({"folder", "add", kIn}), 0);
+  vexlo::fileindexd::Stats stats;
+  vexlo::fileindexd::ShareState state;
+  state.crawl = {kDocs, "settings", kIn + "/m.txt"};
+  vexlo::fileindexd::Cycle cycle("docs", kDocs, "test", state, stats, [] { return false; });
+  cycle.ReconcileShare();
+  cycle.Finish();
+  EXPECT_EQ(Differences(ListDisk(kIn), ListIndex("docs", {"q000000000000001"})), "");
+}
+
 // Neither what it has passed already nor what it will not find.
 TEST(WorkFaults, AComparisonLooksAtWhatIsQueuedMeanwhile) {
   Clear();

@@ -104,16 +104,22 @@ Targets ReadTargets(const Arguments& arguments) {
   return targets;
 }
 
+// What has the index of a share built anew: that it is gone is not noticed before something is
+// queued for the share.
+std::string Rebuild(const std::string& share) {
+  return "fileindex index delete " + ForShell(share) + " && fileindex folder reindex " +
+         ForShell("/" + share);
+}
+
 std::string ExplainIndexError(const Error& error, const std::string& share) {
   switch (static_cast<int>(error.GetErrorCode())) {
     case kNoIndex:
-      return "the share has no index yet; fileindexd makes it, or 'fileindex index create " +
-             share + "'";
+      return "the share has no index; 'fileindex folder reindex " + ForShell("/" + share) +
+             "' has fileindexd make it";
     case kPausedIndex:
       return "its index is paused; 'fileindex index resume " + share + "' goes on";
     case kDamagedIndex:
-      return "its index is damaged; 'fileindex index delete " + share +
-             "' makes fileindexd build it anew";
+      return "its index is damaged; '" + Rebuild(share) + "' has fileindexd build it anew";
     default:
       ExplainEngineError(error);
       return error.what();
@@ -317,8 +323,8 @@ ExitStatus AuditRun::RunRepair() {
       }
       if (repair.Strays() > 0) {
         console_.err << Counted(repair.Strays(), "document") << " of '" << ForTerminal(share)
-                     << "' lie outside of the share: 'fileindex index delete " << ForTerminal(share)
-                     << "' makes fileindexd build the index anew\n";
+                     << "' lie outside of the share: '" << Rebuild(share)
+                     << "' has fileindexd build the index anew\n";
       }
     }
   }

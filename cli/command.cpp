@@ -2,12 +2,14 @@
 
 #include <algorithm>
 #include <cstring>
+#include <functional>
 #include <iomanip>
 #include <optional>
 #include <utility>
 
 #include "cli/text.h"
 #include "common/error.h"
+#include "kavo/local/shares.h"
 
 namespace vexlo::cli {
 namespace {
@@ -52,6 +54,9 @@ size_t TakeOption(const Command& command, const std::vector<std::string>& words,
   const Option* const option = FindOption(command, name);
   if (option == nullptr) {
     throw UsageError("there is no option '" + name + "'");
+  }
+  if (option->value != nullptr && arguments.Has(name)) {
+    throw UsageError("the option " + name + " was given more than once");
   }
   if (option->value == nullptr) {
     if (equals != std::string::npos) {
@@ -106,30 +111,50 @@ std::optional<Arguments> ReadArguments(const Command& command,
   return arguments;
 }
 
+// Throws Failure when what was said cannot be written.
+void FlushOutput(const Console& console) {
+  console.out.flush();
+  if (!console.out) {
+    throw Failure("the output cannot be written");
+  }
+}
+
 ExitStatus RunCommand(const Command& command, const std::vector<std::string>& words,
                       const Console& console) {
   try {
     const std::optional<Arguments> arguments = ReadArguments(command, words);
     if (!arguments.has_value()) {
       PrintHelp(console.out, command);
+      FlushOutput(console);
       return kDone;
     }
-    const ExitStatus status = command.run(*arguments, console);
-    console.out.flush();
-    if (!console.out) {
-      throw Failure("the output cannot be written");
+    if (const std::string fault = kavo::local::RootFault(); !fault.empty()) {
+      throw Failure(fault);
     }
+    const ExitStatus status = command.run(*arguments, console);
+    FlushOutput(console);
     return status;
   } catch (const UsageError& error) {
     console.err << kName << " " << command.name << ": " << error.what() << "\n";
     PrintUsage(console.err, command);
     return kBadUsage;
   } catch (const Error& error) {
-    console.err << kName << ": " << ForTerminal(error.what()) << " (error " << error.GetErrorCode()
-                << ")\n";
+    console.err << kName << ": " << TextOf(error) << "\n";
     return kFailed;
   } catch (const std::exception& error) {
     console.err << kName << ": " << ForTerminal(error.what()) << "\n";
+    return kFailed;
+  }
+}
+
+// What is no command's.
+ExitStatus Print(const Console& console, const std::function<void()>& print) {
+  try {
+    print();
+    FlushOutput(console);
+    return kDone;
+  } catch (const Failure& failure) {
+    console.err << kName << ": " << failure.what() << "\n";
     return kFailed;
   }
 }
@@ -184,12 +209,10 @@ ExitStatus Run(const std::vector<Command>& commands, const std::vector<std::stri
     return kBadUsage;
   }
   if (words[0] == "--help" || words[0] == "-h" || words[0] == "help") {
-    PrintOverview(console.out, commands);
-    return kDone;
+    return Print(console, [&] { PrintOverview(console.out, commands); });
   }
   if (words[0] == "--version") {
-    console.out << kName << " " << FILEINDEX_VERSION << "\n";
-    return kDone;
+    return Print(console, [&] { console.out << kName << " " << FILEINDEX_VERSION << "\n"; });
   }
   for (const Command& command : commands) {
     if (const size_t used = MatchName(command, words); used > 0) {

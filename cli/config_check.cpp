@@ -2,6 +2,8 @@
 
 #include <json/value.h>
 
+#include <algorithm>
+#include <cctype>
 #include <filesystem>
 #include <map>
 #include <optional>
@@ -42,6 +44,15 @@ class Findings {
  private:
   std::vector<ConfigFinding>& list_;
 };
+
+// A key as jq takes it behind a dot: as it is, or in quotes.
+std::string Member(const std::string& key) {
+  const bool is_plain = !key.empty() && (std::isdigit(static_cast<unsigned char>(key[0])) == 0) &&
+                        std::all_of(key.begin(), key.end(), [](unsigned char c) {
+                          return c == '_' || (c < 0x80 && std::isalnum(c) != 0);
+                        });
+  return is_plain ? key : JsonToString(key);
+}
 
 // Null for a file that is missing or cannot be used.
 Json::Value ReadDocument(Findings& findings, const std::string& file) {
@@ -153,7 +164,7 @@ void CheckStatus(Findings& findings, const std::optional<std::set<std::string>>&
     return;
   }
   for (auto share = shares.begin(); share != shares.end(); ++share) {
-    const std::string place = ".share." + share.name();
+    const std::string place = ".share." + Member(share.name());
     if (!isJsonType<unsigned int>(*share)) {
       findings.Add(file, place, "is no word of status bits, and counts as 0");
     }

@@ -87,14 +87,6 @@ std::string Join(std::initializer_list<std::string_view> parts) {
   return text;
 }
 
-std::string Quoted(const std::string& word) {
-  std::string quoted = "'";
-  for (const char c : word) {
-    quoted += c == '\'' ? std::string("'\\''") : std::string(1, c);
-  }
-  return quoted + "'";
-}
-
 std::string Mebibytes(uint64_t bytes) { return Grouped(bytes >> 20) + " MiB"; }
 
 // A number of the kernel's, 0 when it is not told.
@@ -116,7 +108,8 @@ std::string StartCommand(const std::string& program) {
   std::error_code ignored;
   const auto self = std::filesystem::read_symlink("/proc/self/exe", ignored);
   const auto beside = self.parent_path() / program;
-  return (!ignored && access(beside.c_str(), X_OK) == 0 ? Quoted(beside.string()) : program) + " &";
+  return (!ignored && access(beside.c_str(), X_OK) == 0 ? ForShell(beside.string()) : program) +
+         " &";
 }
 
 class Examination {
@@ -188,7 +181,7 @@ void Examination::LookAtConfig() {
   for (const auto& [file, place, what] : CheckConfig(count)) {
     const bool is_gone_share = what.starts_with("there is no share '");
     Add(Severity::kError, Join({file, place.empty() ? "" : ": ", place, ": ", what}),
-        is_gone_share ? "fileindex folder prune" : "${EDITOR:-vi} " + Quoted(file));
+        is_gone_share ? "fileindex folder prune" : "${EDITOR:-vi} " + ForShell(file));
   }
   try {
     folders_ = std::make_unique<fileindex::FolderMgr>();
@@ -211,7 +204,7 @@ bool Examination::CanUseFolder(const std::string& path, std::vector<std::string>
   const bool is_there = stat(path.c_str(), &info) == 0;
   if (is_there && !S_ISDIR(info.st_mode)) {
     Add(Severity::kError, "'" + path + "' is no folder",
-        "mv " + Quoted(path) + " " + Quoted(path + ".old"));
+        "mv " + ForShell(path) + " " + ForShell(path + ".old"));
     return false;
   }
   if (is_there && access(path.c_str(), R_OK | W_OK | X_OK) == 0) {
@@ -222,14 +215,14 @@ bool Examination::CanUseFolder(const std::string& path, std::vector<std::string>
     // The others are made by whoever needs them.
     if (path == kLockFolder.Get()) {
       Add(Severity::kError, "'" + path + "' is missing, and holds the locks",
-          "mkdir -p " + Quoted(path));
+          "mkdir -p " + ForShell(path));
     }
   } else if (error == EACCES && (!is_there || info.st_uid != geteuid())) {
-    foreign.push_back(Quoted(path));
+    foreign.push_back(ForShell(path));
   } else {
     Add(Severity::kError,
         Join({"'", path, "' cannot be written: ", std::generic_category().message(error)}),
-        error == EACCES ? "chmod u+rwx " + Quoted(path) : "");
+        error == EACCES ? "chmod u+rwx " + ForShell(path) : "");
   }
   return false;
 }
@@ -247,7 +240,7 @@ bool Examination::CanUseLock(const std::string& path) {
   Add(Severity::kError,
       Join({"the lock file '", path, "' of user ", std::to_string(info.st_uid),
             " cannot be opened"}),
-      (is_file ? "sudo chmod a+r " : "sudo rm ") + Quoted(path));
+      (is_file ? "sudo chmod a+r " : "sudo rm ") + ForShell(path));
   return false;
 }
 
@@ -308,7 +301,7 @@ std::optional<Json::Value> Examination::AskOne(const std::string& socket,
     Add(severity,
         (is_listening ? "runs but gives no answer, " : "does not run, ") + effect + " (" + reason +
             ")",
-        is_listening ? "kill $(cat " + Quoted(kRunFolder.Get() + "/" + subject_ + ".pid") + ")"
+        is_listening ? "kill $(cat " + ForShell(kRunFolder.Get() + "/" + subject_ + ".pid") + ")"
                      : StartCommand(subject_));
   }
   return reply;
@@ -332,15 +325,15 @@ void Examination::LookAtEngine() {
       ++active;
     } else if (state == "paused") {
       Add(Severity::kWarning, "the index of '" + share + "' is paused, so it is not searched",
-          "fileindex index resume " + Quoted(share));
+          "fileindex index resume " + ForShell(share));
     } else if (state.empty()) {
       Add(Severity::kError, "the share '" + share + "' has no index",
-          "fileindex index create " + Quoted(share) + " && fileindex folder reindex " +
-              Quoted("/" + share));
+          "fileindex index create " + ForShell(share) + " && fileindex folder reindex " +
+              ForShell("/" + share));
     } else {
       Add(Severity::kError, Join({"the index of '", share, "' is ", state}),
-          "fileindex index delete " + Quoted(share) + " && fileindex folder reindex " +
-              Quoted("/" + share));
+          "fileindex index delete " + ForShell(share) + " && fileindex folder reindex " +
+              ForShell("/" + share));
     }
   }
   Add(Severity::kOk, "listens and answers; " + Grouped(active) +
@@ -367,7 +360,7 @@ void Examination::LookAtIndexDaemon() {
   }
   for (const std::string& share : without) {
     Add(Severity::kError, "nobody works on the indexed share '" + share + "'",
-        "fileindex folder reindex " + Quoted("/" + share));
+        "fileindex folder reindex " + ForShell("/" + share));
   }
   Add(Severity::kOk, "listens and answers; " + Counted((*reply)["shares"].size(), "worker"));
 }
@@ -405,7 +398,7 @@ void Examination::LookAtNotifyDaemon() {
       if (std::none_of(roots.begin(), roots.end(),
                        [&](const std::string& root) { return IsSameOrBelow(path, root); })) {
         Add(Severity::kError, "nobody watches the indexed folder '" + path + "'",
-            "fileindex folder set " + Quoted(folder->GetPath()));
+            "fileindex folder set " + ForShell(folder->GetPath()));
       }
     }
   }
@@ -499,7 +492,7 @@ void Examination::LookAtMounts() {
           (rule == "file_system" || rule == "mount_point" || rule == "snapshot")) {
         is_well = false;
         Add(Severity::kError, "'" + path + "' is not indexed: " + verdict.reason,
-            "fileindex folder delete " + Quoted(folder->GetPath()));
+            "fileindex folder delete " + ForShell(folder->GetPath()));
       }
     }
     well += is_well ? 1 : 0;
@@ -521,7 +514,7 @@ void Examination::LookAtVolume(const std::string& path, const std::string& of) {
   Add(severity,
       Mebibytes(free) + " are free for " + of + " in '" + path + "'" +
           (lacks_inodes ? ", and " + Counted(info.f_favail, "inode") : ""),
-      severity == Severity::kOk ? "" : "df -h " + Quoted(there.string()));
+      severity == Severity::kOk ? "" : "df -h " + ForShell(there.string()));
 }
 
 void Examination::LookAtSpace() {
@@ -544,7 +537,7 @@ void Examination::LookAtStatus() {
           "'" + share + "' is marked " +
               ((bits & fileindex::SS_NEED_REBUILD) != 0 ? "to be built anew"
                                                         : "for a reindex, as a change was lost"),
-          "fileindex folder reindex " + Quoted("/" + share));
+          "fileindex folder reindex " + ForShell("/" + share));
     }
     const sdk::SDKShare asked(share);
     if (IsDirExist(asked.GetPath(), /*follow_link=*/false) && !asked.CanBeIndexed()) {
@@ -596,7 +589,7 @@ void Examination::LookAtDates() {
   }
   std::string paths;
   for (const Json::Value& hit : (*reply)["data"]) {
-    paths += (paths.empty() ? "" : " ") + Quoted(hit["path"].asString());
+    paths += (paths.empty() ? "" : " ") + ForShell(hit["path"].asString());
   }
   Add(Severity::kWarning,
       Counted(total, "file") + (total == 1 ? " is" : " are") +

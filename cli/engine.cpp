@@ -5,6 +5,7 @@
 #include <cerrno>
 #include <string>
 
+#include "cli/service.h"
 #include "cli/shares.h"
 #include "cli/text.h"
 #include "common/json.h"
@@ -18,10 +19,12 @@ namespace {
 // Where anybody may search.
 constexpr fileindex::FixedPath kSearchSocket("/var/run/kavoelasticd.search.sock");
 constexpr int kConnectSeconds = 10;
+// Where a page ends there.
+constexpr int kMostShown = 10000;
 
 [[noreturn]] void FailWithoutEngine() {
-  throw Failure("the search engine kavoelasticd does not run (nobody answers on '" +
-                fileindex::kElasticdSocketPath.Get() + "')");
+  throw Failure(
+      WhyUnreached("the search engine kavoelasticd", fileindex::kElasticdSocketPath.Get()));
 }
 
 }  // namespace
@@ -69,9 +72,13 @@ Json::Value AskSearch(const Json::Value& request, Json::Value* reply) {
   if (access(path.c_str(), W_OK) != 0 && errno == EACCES) {
     throw Failure("only the user who runs the search engine can search: it is not root's");
   }
+  Json::Value asked = request;
+  if (asked["data"]["size"].asInt() > kMostShown) {
+    asked["data"]["size"] = kMostShown;
+  }
   kavodaemon::DomainSockConnection connection(path);
   std::string text;
-  if (!connection.Connect(kConnectSeconds) || !connection.Send(JsonToString(request)) ||
+  if (!connection.Connect(kConnectSeconds) || !connection.Send(JsonToString(asked)) ||
       !connection.Recv(text) || !JsonFromString(*reply, text) || !reply->isObject()) {
     throw Failure("the search engine kavoelasticd gives no answer on '" + path + "'");
   }

@@ -23,7 +23,7 @@ void WithEngine(const std::function<void()>& work);
 void ExplainEngineError(const Error& error);
 
 // The same for a search, which anybody may ask: who may not ask the engine everything gets what he
-// may read.
+// may read, of the first 10,000 hits.
 Json::Value AskSearch(const Json::Value& request, Json::Value* reply);
 
 // Sends one request within WithEngine(). The reply's "data".

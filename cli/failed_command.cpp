@@ -49,9 +49,10 @@ class FailedFiles {
     }
   }
 
-  void Summarize() const {
+  // `all_read`: no index is missing.
+  void Summarize(bool all_read) const {
     console_.out.flush();
-    if (counts_.empty()) {
+    if (counts_.empty() && all_read) {
       console_.err << "the text of every file that was indexed is there\n";
     }
     for (const auto& [reason, count] : counts_) {
@@ -107,7 +108,7 @@ ExitStatus ShowFailed(const Arguments& arguments, const Console& console) {
     }
   }
   failed.PrintRest();
-  failed.Summarize();
+  failed.Summarize(all_read);
   return !all_read ? kFailed : failed.IsEmpty() ? kNothingFound : kDone;
 }
 

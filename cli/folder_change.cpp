@@ -3,6 +3,9 @@
 #include <pwd.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <optional>
+
 #include "cli/engine.h"
 #include "cli/folder_paths.h"
 #include "cli/service.h"
@@ -15,6 +18,7 @@
 #include "fileindex/folder_mgr.h"
 #include "fileindex/index_mgr/folder_ops.h"
 #include "fileindex/util/share_path.h"
+#include "kavo/local/monitor_queues.h"
 #include "kavo/local/shares.h"
 
 namespace vexlo::cli {
@@ -71,7 +75,7 @@ void ChangeFolders(const Console& console, const Json::Value& paths,
     try {
       work();
     } catch (const Error& error) {
-      if (error.GetErrorCode() != ERR_SYSTEM || IsIndexDaemonRunning() ||
+      if (error.GetErrorCode() != ERR_SYSTEM || IsIndexDaemonListening() ||
           !std::string_view(error.what()).starts_with("write failed")) {
         throw;
       }
@@ -92,7 +96,22 @@ void ChangeFolders(const Console& console, const Json::Value& paths,
   });
 }
 
-std::string ShareFor(const std::string& folder, const Console& console) {
+namespace {
+
+// Whether anything stands on the share: a folder in the list, or a queue that is fed from it.
+bool IsInUse(const kavo::local::Share& share) {
+  const auto queues = kavo::local::ReadMonitorQueues().queues;
+  return FolderMgr().IsShareIndexed(share.name) ||
+         std::any_of(queues.begin(), queues.end(), [&share](const auto& queue) {
+           return std::any_of(
+               queue.folders.begin(), queue.folders.end(),
+               [&share](const auto& folder) { return IsSameOrBelow(folder.path, share.path); });
+         });
+}
+
+// The folder's share path. `made` becomes the share that it was made for the lack of another.
+std::string ShareFor(const std::string& folder, std::optional<kavo::local::Share>& made,
+                     const Console& console) {
   const std::string path = RealPath(folder);
   if (path.empty() || !IsDirExist(path, /*follow_link=*/false)) {
     throw Failure("'" + ForTerminal(folder) + "' is no folder");
@@ -114,9 +133,11 @@ std::string ShareFor(const std::string& folder, const Console& console) {
     throw Failure(error.what());
   }
   console.err << "no share held it, so it was made the share '" << ForTerminal(share.name) << "'\n";
+  made = share;
   return "/" + share.name;
 }
 
+// A record for the folder of this share path, with everything indexed.
 Json::Value NewFolder(const std::string& path) {
   Json::Value record;
   record["path"] = path;
@@ -128,7 +149,8 @@ Json::Value NewFolder(const std::string& path) {
   return record;
 }
 
-void AddFolder(const Json::Value& record, const Console& console) {
+// Adds the folder of a record.
+void AddRecord(const Json::Value& record, const Console& console) {
   const std::string path = record["path"].asString();
   const std::string share = fileindex::GetShareNameByPath(path);
   WithFolders([&] {
@@ -143,6 +165,38 @@ void AddFolder(const Json::Value& record, const Console& console) {
   ChangeFolders(
       console, paths, [&] { fileindex::FolderAdd(records, /*updater_mode=*/false); },
       [&] { fileindex::elastic::ShareIndexDelete(share); }, kIndexExists);
+}
+
+void TakeBack(const kavo::local::Share& share, const Console& console) {
+  try {
+    if (!IsInUse(share)) {
+      kavo::local::RemoveShare(kavo::local::SharesFile(), share.name);
+      console.err << "the share '" << ForTerminal(share.name) << "' was taken out again\n";
+    }
+  } catch (const std::exception& error) {
+    console.err << "the share '" << ForTerminal(share.name)
+                << "' stays: " << ForTerminal(error.what()) << "\n";
+  }
+}
+
+}  // namespace
+
+Json::Value AddFolder(const std::string& folder, const Console& console,
+                      const std::function<bool(Json::Value&)>& is_wanted) {
+  std::optional<kavo::local::Share> made;
+  const std::string path = ShareFor(folder, made, console);
+  try {
+    Json::Value record = NewFolder(path);
+    if (is_wanted(record)) {
+      AddRecord(record, console);
+    }
+    return record;
+  } catch (...) {
+    if (made) {
+      TakeBack(*made, console);
+    }
+    throw;
+  }
 }
 
 }  // namespace vexlo::cli

@@ -29,14 +29,12 @@ void ChangeFolders(const Console& console, const Json::Value& paths,
                    const std::function<void()>& work, const std::function<void()>& mend_index,
                    int mendable);
 
-// The share path of a folder; it is made a share, and that is said, when none holds it.
-std::string ShareFor(const std::string& folder, const Console& console);
-
-// A record for the folder of this share path, with everything indexed.
-Json::Value NewFolder(const std::string& path);
-
-// Adds the folder of a record.
-void AddFolder(const Json::Value& record, const Console& console);
+// Adds a folder, which is made a share when none holds it; that is said. `is_wanted` gets its
+// record, with everything indexed and the share path as "path", may change it, and is asked whether
+// to add it at all. The record as it left that. When it fails, a share that was made is taken out
+// again.
+Json::Value AddFolder(const std::string& folder, const Console& console,
+                      const std::function<bool(Json::Value&)>& is_wanted);
 
 }  // namespace vexlo::cli
 

@@ -70,9 +70,12 @@ std::string TypesOf(const Json::Value& record) {
 }
 
 ExitStatus Add(const Arguments& arguments, const Console& console) {
-  Json::Value record = NewFolder(ShareFor(arguments.positional[0], console));
-  ApplyOptions(record, arguments);
-  AddFolder(record, console);
+  Json::Value checked;
+  ApplyOptions(checked, arguments);  // Wrong usage is told before a share is made.
+  const Json::Value record = AddFolder(arguments.positional[0], console, [&](Json::Value& wanted) {
+    ApplyOptions(wanted, arguments);
+    return true;
+  });
   console.out << "added: " << ForTerminal(record["path"].asString()) << " (" << TypesOf(record)
               << ")\n";
   return kDone;
@@ -159,6 +162,9 @@ Json::Value FoldersToDelete(const Arguments& arguments, const FolderMgr& folders
 }
 
 ExitStatus Delete(const Arguments& arguments, const Console& console) {
+  if (arguments.positional.empty() && !arguments.Has("--share")) {
+    throw UsageError("wants FOLDER, or the option --share NAME");
+  }
   Json::Value paths;
   std::set<std::string> ending;  // Shares that keep no folder.
   WithFolders([&] {
@@ -176,7 +182,8 @@ ExitStatus Delete(const Arguments& arguments, const Console& console) {
     }
   });
   if (paths.empty()) {
-    throw Failure("no folder to delete was named; 'fileindex folder list' lists them");
+    throw Failure("no folder of the share '" + ForTerminal(arguments.Get("--share")) +
+                  "' is indexed; 'fileindex folder list' lists them");
   }
   if (!ending.empty()) {
     RequireEngine();
@@ -217,7 +224,7 @@ ExitStatus Reindex(const Arguments& arguments, const Console& console) {
   for (const Json::Value& path : paths) {
     console.out << "to be indexed again: " << ForTerminal(path.asString()) << "\n";
   }
-  if (!IsIndexDaemonRunning()) {
+  if (!IsIndexDaemonListening()) {
     console.err << NoIndexDaemon() << "; this waits for it\n";
   }
   return kDone;

@@ -1,14 +1,18 @@
 // "fileindex index ...": the indexes of shares, and "fileindex doc ...": single documents in them.
 #include <json/value.h>
 
+#include <algorithm>
 #include <functional>
 
 #include "cli/command.h"
 #include "cli/engine.h"
+#include "cli/folder_paths.h"
+#include "cli/shares.h"
 #include "cli/text.h"
 #include "common/file.h"
 #include "common/json.h"
 #include "common/sdk/share.h"
+#include "common/string.h"
 #include "fileindex/elastic_control/documents.h"
 #include "fileindex/elastic_control/share_index.h"
 #include "fileindex/util/share_path.h"
@@ -79,9 +83,17 @@ ExitStatus ListIndexes(const Arguments& arguments, const Console& console) {
   return list.empty() ? kNothingFound : kDone;
 }
 
-// The path of a document, by a path of the file system or below the share: "/photo/2019".
+// The path of a document, by a path of the file system or below the share: "/photo/2019". A
+// symbolic link on the way is followed, one that is named itself is not: it may have a document
+// that is to go.
 std::string DocumentPath(const std::string& path) {
   std::string absolute = AbsolutePath(path);
+  const std::string folder = absolute.substr(0, std::max<size_t>(absolute.rfind('/'), 1));
+  const std::string followed = IndexedPath(folder);
+  if (std::string in_share = followed + "/" + Basename(absolute);
+      followed != folder && !SharePathOf(in_share).empty()) {
+    return in_share;
+  }
   if (IsFileExist(absolute) || IsDirExist(absolute, /*follow_link=*/false)) {
     return absolute;
   }
@@ -95,6 +107,11 @@ std::string DocumentPath(const std::string& path) {
 ExitStatus PutDocument(const Arguments& arguments, const Console& console) {
   const std::string& share = arguments.positional[0];
   const std::string path = DocumentPath(arguments.positional[1]);
+  const std::string share_path = SharePathOf(path);
+  if (ShareNames().contains(share) && !IsSameOrBelow(share_path, "/" + share)) {
+    throw Failure("'" + ForTerminal(path) + "' does not lie in the share '" + ForTerminal(share) +
+                  "'");
+  }
   return Do(console, "indexed: " + path, [&] {
     elastic::IndexUpsert(share, path, !arguments.Has("--no-content"));
     elastic::IndexCommit(share);
@@ -163,7 +180,7 @@ std::vector<Command> IndexCommands() {
        "indexes one file or folder",
        "Puts what is known of PATH into the index of SHARE, in the place of what was there, and\n"
        "commits it. What lies below a folder is not looked at. PATH is a path of the file system\n"
-       "or one that begins with the share, \"/photo/2019\".\n"
+       "or one that begins with the share, \"/photo/2019\", and lies in the share.\n"
        "\n"
        "  fileindex doc put photo /volume1/photo/2019/beach.jpg\n",
        {{"--no-content", nullptr, "name, size, dates and owner only"}},

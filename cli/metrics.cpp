@@ -160,8 +160,10 @@ std::string MetricsText(const Json::Value& state) {
   Page page;
   page.Announce("fileindex_up", "gauge", "Whether the daemon answers.");
   for (const Json::Value& daemon : state["daemons"]) {
-    page.Put("fileindex_up", {{"daemon", daemon["name"].asString()}},
-             daemon["running"].asBool() ? 1 : 0);
+    if (daemon["running"].isBool()) {
+      page.Put("fileindex_up", {{"daemon", daemon["name"].asString()}},
+               daemon["running"].asBool() ? 1 : 0);
+    }
   }
   if (state["resume_time"].isNumeric()) {
     const int64_t resume_time = state["resume_time"].asInt64();

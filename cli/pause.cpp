@@ -31,7 +31,7 @@ bool ChangePause(const std::function<void(fileindex::StatusMgr&)>& change) {
     return true;
   } catch (const Error& error) {
     // The state is saved before the daemon is told, so a failure to tell leaves it there.
-    if (error.GetErrorCode() != ERR_SYSTEM || IsIndexDaemonRunning()) {
+    if (error.GetErrorCode() != ERR_SYSTEM || IsIndexDaemonListening()) {
       throw;
     }
     return false;

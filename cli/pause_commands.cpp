@@ -53,9 +53,8 @@ std::vector<Command> PauseCommands() {
        "[HOURS]",
        "stops indexing for some hours, or until 'resume'",
        "Changes go on being collected, and are indexed when the pause ends. Searching goes on.\n"
-       "The pause is saved before the daemon is told. Exit status 3 when no daemon runs: the "
-       "pause\n"
-       "holds all the same when one starts.\n"
+       "The pause is saved before the daemon is told: when none runs, that is said, and the pause\n"
+       "holds for the next one.\n"
        "\n"
        "  fileindex pause 2\n",
        {},

@@ -160,7 +160,7 @@ ExitStatus AddEvent(const Arguments& arguments, const Console& console) {
   console.out << "added to " << ForTerminal(share.GetQueuePath()) << ": " << event.name << " "
               << (path_old.empty() ? "" : ForTerminal(path_old) + " -> ") << ForTerminal(path)
               << "\n";
-  if (!IsIndexDaemonRunning()) {
+  if (!IsIndexDaemonListening()) {
     console.err << NoIndexDaemon() << "; the event waits in the queue until it does\n";
   }
   return kDone;

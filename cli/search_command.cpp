@@ -21,11 +21,17 @@ constexpr char kBold[] = "\033[1m";
 
 // A snippet with its marks as colours, and nothing else in it that a terminal obeys.
 std::string Coloured(const std::string& snippet) {
+  constexpr char kMarks[] = {kMarkBegin, kMarkEnd};
+  const std::string_view text = snippet;
   std::string shown;
-  for (const char c : snippet) {
-    shown += c == kMarkBegin ? std::string(kHighlight)
-             : c == kMarkEnd ? std::string(kPlain)
-                             : ForTerminal(std::string_view(&c, 1));
+  for (size_t from = 0; from < text.size();) {
+    const size_t mark = text.find_first_of(std::string_view(kMarks, sizeof(kMarks)), from);
+    shown += ForTerminal(text.substr(from, mark - from));
+    if (mark == std::string_view::npos) {
+      break;
+    }
+    shown += text[mark] == kMarkBegin ? kHighlight : kPlain;
+    from = mark + 1;
   }
   return shown;
 }

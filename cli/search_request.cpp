@@ -6,6 +6,7 @@
 #include <ctime>
 #include <limits>
 
+#include "cli/folder_paths.h"
 #include "cli/text.h"
 #include "fileindex/elastic_control/share_index.h"
 #include "fileindex/util/file_type.h"
@@ -53,8 +54,14 @@ int64_t ReadTime(const std::string& text) {
     struct tm parts {};
     parts.tm_isdst = -1;
     const char* const rest = strptime(text.c_str(), format, &parts);
-    if (rest != nullptr && *rest == '\0') {
-      return static_cast<int64_t>(mktime(&parts));
+    if (rest == nullptr || *rest != '\0') {
+      continue;
+    }
+    // 31 February would be a day in March.
+    const int day = parts.tm_mday;
+    const auto instant = static_cast<int64_t>(mktime(&parts));
+    if (parts.tm_mday == day) {
+      return instant;
     }
   }
   throw UsageError("'" + text +
@@ -120,7 +127,7 @@ Json::Value MakeSearchRequest(const Arguments& arguments) {
     data["ids"].append(fileindex::elastic::GetFileIndexID(arguments.Get("--share")));
   }
   if (arguments.Has("--below")) {
-    data["below"] = AbsolutePath(arguments.Get("--below"));
+    data["below"] = IndexedPath(arguments.Get("--below"));
   }
   if (arguments.Has("--name")) {
     data["name"] = arguments.Get("--name");

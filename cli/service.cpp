@@ -2,30 +2,32 @@
 
 #include <sys/socket.h>
 #include <sys/un.h>
-#include <unistd.h>
+#include <cerrno>
 
 #include "cli/daemon_stats.h"
 #include "fileindex/paths.h"
 #include "kavo/local/content.h"
 #include "kavo/local/shares.h"
+#include "watch/directory.h"
 
 namespace vexlo::cli {
 
-bool IsListening(const std::string& path) {
+Reach ReachOf(const std::string& socket) {
   sockaddr_un address{AF_UNIX, {}};
-  if (path.size() >= sizeof(address.sun_path)) {
-    return false;
+  if (socket.size() >= sizeof(address.sun_path)) {
+    return Reach::kNobody;
   }
-  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-  if (fd < 0) {
-    return false;
-  }
-  path.copy(address.sun_path, sizeof(address.sun_path) - 1);
-  const bool connected =
-      connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
-  close(fd);
-  return connected;
+  const watch::Fd fd(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+  socket.copy(address.sun_path, sizeof(address.sun_path) - 1);
+  // A queue of connections that is full is somebody's, too.
+  return connect(fd.Get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0 ||
+                 errno == EAGAIN
+             ? Reach::kListening
+         : errno == EACCES ? Reach::kClosed
+                           : Reach::kNobody;
 }
+
+bool IsListening(const std::string& socket) { return ReachOf(socket) == Reach::kListening; }
 
 std::vector<DaemonPlace> LocalDaemons() {
   return {{"kavoelasticd", fileindex::kElasticdSocketPath.Get()},
@@ -46,11 +48,16 @@ Json::Value AskShares() {
   return shares.isArray() ? shares : Json::Value(Json::arrayValue);
 }
 
-bool IsIndexDaemonRunning() { return IsListening(fileindex::kFileIndexDaemonSocketPath.Get()); }
+bool IsIndexDaemonListening() { return IsListening(fileindex::kFileIndexDaemonSocketPath.Get()); }
+
+std::string WhyUnreached(const std::string& daemon, const std::string& socket) {
+  return ReachOf(socket) == Reach::kClosed
+             ? daemon + " cannot be asked: its socket '" + socket + "' is closed to this user"
+             : daemon + " does not run (nobody answers on '" + socket + "')";
+}
 
 std::string NoIndexDaemon() {
-  return "the index daemon fileindexd does not run (nobody answers on '" +
-         fileindex::kFileIndexDaemonSocketPath.Get() + "')";
+  return WhyUnreached("the index daemon fileindexd", fileindex::kFileIndexDaemonSocketPath.Get());
 }
 
 }  // namespace vexlo::cli

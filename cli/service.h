@@ -9,9 +9,13 @@
 
 namespace vexlo::cli {
 
-// Whether somebody takes connections on the Unix socket at `path`.
-bool IsListening(const std::string& path);
-bool IsIndexDaemonRunning();
+// What comes of a connection to a Unix socket: somebody takes it, there is nobody, or this user may
+// not try, and so cannot know.
+enum class Reach { kListening, kNobody, kClosed };
+Reach ReachOf(const std::string& socket);
+
+bool IsListening(const std::string& socket);
+bool IsIndexDaemonListening();
 
 // The daemons of the local stack, in the order in which they are started.
 struct DaemonPlace {
@@ -26,7 +30,9 @@ Json::Value AskStats(const std::string& socket);
 // The index daemon's "shares", an array.
 Json::Value AskShares();
 
-// "the index daemon fileindexd does not run (nobody answers on '...')".
+// "DAEMON does not run (nobody answers on 'SOCKET')", or that the socket is closed to this user.
+std::string WhyUnreached(const std::string& daemon, const std::string& socket);
+// The same of the index daemon.
 std::string NoIndexDaemon();
 
 }  // namespace vexlo::cli

@@ -12,6 +12,7 @@
 #include <filesystem>
 #include <system_error>
 #include <thread>
+#include <utility>
 
 #include "cli/command.h"
 #include "cli/text.h"
@@ -24,7 +25,8 @@ namespace {
 constexpr auto kTick = std::chrono::milliseconds(20);
 constexpr auto kPatience = std::chrono::seconds(4);  // Until a daemon that is to end is killed.
 constexpr auto kTrialTime = std::chrono::seconds(60);
-constexpr size_t kMostStarts = 5;  // Within the time above.
+constexpr size_t kMostStarts = 5;   // Within the time above.
+constexpr int kAlreadyRunning = 3;  // The exit status of a daemon that finds another of its kind.
 
 std::string ProgramFolder() {
   std::error_code error;
@@ -55,7 +57,7 @@ std::string ProgramFolder() {
 
 Stack::Stack(Notice notice) : notice_(std::move(notice)) {
   for (const DaemonPlace& place : LocalDaemons()) {
-    children_.push_back({place, 0, {}});
+    children_.push_back({place, {}});
   }
 }
 
@@ -63,6 +65,9 @@ Stack::~Stack() { Stop(); }
 
 bool Stack::Start(const std::function<bool()>& is_stopped) {
   for (Child& child : children_) {
+    if (ReachOf(child.place.socket) == Reach::kClosed) {
+      throw Failure(WhyUnreached(child.place.name, child.place.socket));
+    }
     if (IsListening(child.place.socket)) {
       notice_(std::string(child.place.name) + " runs already, and is left alone");
       continue;
@@ -83,7 +88,15 @@ bool Stack::Start(const std::function<bool()>& is_stopped) {
 
 void Stack::Tend() {
   for (Child& child : children_) {
-    if (child.pid == 0 || !HasEnded(child)) {
+    if (child.pid == 0) {
+      TakeOver(child);
+      continue;
+    }
+    if (!HasEnded(child)) {
+      continue;
+    }
+    if (child.exit_status == kAlreadyRunning) {
+      child.starts.pop_back();  // Whoever has it was faster, or is just ending it.
       continue;
     }
     notice_(std::string(child.place.name) + " has ended and is started again: " + LastWords(child));
@@ -95,6 +108,18 @@ void Stack::Tend() {
     }
     Spawn(child);
   }
+}
+
+// Somebody else's is left alone as long as it is there.
+void Stack::TakeOver(Child& child) {
+  if (ReachOf(child.place.socket) != Reach::kNobody) {
+    child.is_missed = false;
+    return;
+  }
+  if (!std::exchange(child.is_missed, true)) {
+    notice_(std::string(child.place.name) + " runs no longer, and is started");
+  }
+  Spawn(child);
 }
 
 void Stack::Stop() {
@@ -143,10 +168,12 @@ void Stack::Spawn(Child& child) {
 
 // True once, when it has.
 bool Stack::HasEnded(Child& child) {
-  if (child.pid == 0 || waitpid(child.pid, nullptr, WNOHANG) == 0) {
+  int status = 0;
+  if (child.pid == 0 || waitpid(child.pid, &status, WNOHANG) == 0) {
     return false;
   }
   child.pid = 0;
+  child.exit_status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
   return true;
 }
 

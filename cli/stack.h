@@ -15,11 +15,11 @@ namespace vexlo::cli {
 
 // Starts those of the four daemons that do not run yet, and ends them: by Stop(), or by SIGTERM
 // from the kernel when the tool is killed. Their lines go to files below the root. The programs are
-// those beside the tool's own. For a program of one thread that blocks SIGINT, SIGTERM and SIGHUP;
+// those beside the tool's own. For a program of one thread that blocks what StopSignalSet() gives;
 // the daemons do not inherit that, and signals of the terminal do not reach them.
 class Stack {
  public:
-  // Told when a daemon has ended unasked.
+  // Told when a daemon has ended unasked, and of those that are somebody else's.
   using Notice = std::function<void(const std::string& sentence)>;
 
   explicit Stack(Notice notice);
@@ -28,10 +28,12 @@ class Stack {
   Stack& operator=(const Stack&) = delete;
 
   // Starts them in order, each when the one before listens. Throws Failure when one ends instead,
-  // with the last line that it wrote. `is_stopped` is asked meanwhile; false when it said so.
+  // with the last line that it wrote, and where a socket is closed to this user. `is_stopped` is
+  // asked meanwhile; false when it said so.
   bool Start(const std::function<bool()>& is_stopped);
 
-  // Starts anew those that have ended. Throws Failure for one that does so again and again.
+  // Starts anew those that have ended, also those that ran before Start() and were left alone.
+  // Throws Failure for one that does so again and again.
   void Tend();
 
   // Asks those that it started to end, the ones that depend on others first, and kills after four
@@ -43,11 +45,14 @@ class Stack {
 
   struct Child {
     DaemonPlace place;
-    pid_t pid = 0;  // 0: not ours, or not running.
     std::vector<Clock::time_point> starts;
+    pid_t pid = 0;           // 0: not ours, or not running.
+    int exit_status = 0;     // Of the last one that ended; -1 for a signal.
+    bool is_missed = false;  // It was somebody else's, it is gone, and that was said.
   };
 
   void Spawn(Child& child);
+  void TakeOver(Child& child);
   bool HasEnded(Child& child);
   std::string LogFile(const Child& child) const;
   std::string LastWords(const Child& child) const;

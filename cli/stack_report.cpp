@@ -18,7 +18,9 @@ Json::Value AskWholeStack() {
     const Json::Value stats = AskStats(place.socket);
     Json::Value daemon;
     daemon["name"] = place.name;
-    daemon["running"] = !stats.isNull();
+    daemon["running"] = stats.isNull() && ReachOf(place.socket) == Reach::kClosed
+                            ? Json::Value()
+                            : Json::Value(!stats.isNull());
     daemon["socket"] = place.socket;
     daemon["stats"] = stats;
     all["daemons"].append(daemon);

@@ -12,7 +12,8 @@ namespace vexlo::cli {
 //    what it answered,
 //  "shares": the index daemon's, each with "watch", the notify daemon's word on its queue or null}
 //
-// A daemon that does not answer in time runs no more than one that is not there. Throws as
+// "running" is null where the daemon's socket is closed to this user, as it cannot be told then. A
+// daemon that does not answer in time runs no more than one that is not there. Throws as
 // GetIndexProcessingStatus() and StatusMgr do.
 Json::Value AskWholeStack();
 

@@ -62,11 +62,15 @@ std::string WatchText(const Json::Value& watch) {
 
 std::string TableOf(const Json::Value& all, const std::map<std::string, double>& rates) {
   Rows daemons = {{"DAEMON", "STATE"}};
+  bool is_told = false;  // Which shares there are.
   for (const Json::Value& daemon : all["daemons"]) {
-    daemons.push_back(
-        {daemon["name"].asString(), daemon["running"].asBool()
-                                        ? "running"
-                                        : "does not answer on " + daemon["socket"].asString()});
+    const std::string socket = daemon["socket"].asString();
+    const bool is_closed = daemon["running"].isNull();
+    is_told = is_told || (daemon["name"] == "fileindexd" && daemon["running"] == true);
+    daemons.push_back({daemon["name"].asString(), is_closed ? "closed to this user on " + socket
+                                                  : daemon["running"].asBool()
+                                                      ? "running"
+                                                      : "does not answer on " + socket});
   }
   Rows shares = {{"SHARE", "STATE", "QUEUED", "DONE", "A SECOND", "WATCHED", "LAST ERROR"}};
   for (const Json::Value& share : all["shares"]) {
@@ -81,7 +85,9 @@ std::string TableOf(const Json::Value& all, const std::map<std::string, double>&
          ForTerminal(WatchText(share["watch"])), ForTerminal(share["last_error"].asString())});
   }
   return "indexing is " + all["status"].asString() + "\n\n" + Table(daemons) +
-         (shares.size() > 1 ? "\n" + Table(shares) : "\nno share is indexed\n");
+         (shares.size() > 1 ? "\n" + Table(shares)
+          : is_told         ? "\nno share is indexed\n"
+                            : "\nof the shares nothing is told, as fileindexd was not reached\n");
 }
 
 void Show(const Arguments& arguments, const Console& console, Rates& rates, bool again) {
@@ -109,7 +115,7 @@ ExitStatus ShowStatus(const Arguments& arguments, const Console& console) {
   }
   const std::string status = fileindex::GetIndexProcessingStatus();
   console.out << (arguments.Has("--json") ? JsonToString(status) : status) << "\n";
-  if (!IsIndexDaemonRunning()) {
+  if (!IsIndexDaemonListening()) {
     console.err << NoIndexDaemon() << "\n";
   }
   return kDone;

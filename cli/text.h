@@ -7,6 +7,8 @@
 #include <string_view>
 #include <vector>
 
+#include "common/error.h"
+
 namespace vexlo::cli {
 
 std::vector<std::string> Split(std::string_view text, char separator);
@@ -17,11 +19,19 @@ std::string Grouped(uint64_t number);
 // "1 line", "2,000 lines".
 std::string Counted(uint64_t number, std::string_view noun);
 
-// Control characters as "\012", so that a file name cannot drive the terminal; the rest as it is.
+// Control characters and those that turn the direction of writing byte by byte as "\012", so that a
+// file name can neither drive the terminal nor look like another; the rest as it is.
 std::string ForTerminal(std::string_view text);
+
+// A word as a shell takes it: as it is, or in single quotes where that is wanted.
+std::string ForShell(const std::string& word);
 
 // What a library reason says of the system's error: the text behind its last "reason=", or all.
 std::string CauseOf(std::string_view reason);
+
+// An error of the library for people: its reason and number. The one that comes without a reason,
+// for want of root's rights, gets one.
+std::string TextOf(const Error& error);
 
 // The argument as an absolute path without ".", ".." and doubled or trailing slashes. Works on the
 // text alone: nothing needs to exist.

@@ -1,11 +1,13 @@
 // "fileindex up DIR...": the whole local stack in the foreground.
 #include <json/value.h>
+#include <sys/ioctl.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <atomic>
 #include <chrono>
 #include <csignal>
+#include <cstdint>
 #include <cstdlib>
 #include <ctime>
 #include <filesystem>
@@ -17,6 +19,7 @@
 #include "cli/folder_change.h"
 #include "cli/service.h"
 #include "cli/stack.h"
+#include "cli/stop_signals.h"
 #include "cli/text.h"
 #include "common/file.h"
 #include "common/json.h"
@@ -33,17 +36,17 @@ constexpr auto kLineInterval = std::chrono::seconds(2);  // Where there is no te
 constexpr auto kFollowInterval = std::chrono::seconds(1);
 constexpr size_t kBarWidth = 30;
 
-// SIGINT, SIGTERM and SIGHUP, blocked as long as it lives.
+// What ends the command, blocked as long as it lives.
 class StopSignals {
  public:
-  StopSignals() {
-    sigemptyset(&signals_);
-    for (const int signal : {SIGINT, SIGTERM, SIGHUP}) {
-      sigaddset(&signals_, signal);
+  StopSignals() { sigprocmask(SIG_BLOCK, &signals_, &before_); }
+  ~StopSignals() {
+    // A second Ctrl-C, while all was ending, asked for nothing new.
+    constexpr timespec kNoTime = {0, 0};
+    while (sigtimedwait(&signals_, nullptr, &kNoTime) > 0) {
     }
-    sigprocmask(SIG_BLOCK, &signals_, &before_);
+    sigprocmask(SIG_SETMASK, &before_, nullptr);
   }
-  ~StopSignals() { sigprocmask(SIG_SETMASK, &before_, nullptr); }
   StopSignals(const StopSignals&) = delete;
   StopSignals& operator=(const StopSignals&) = delete;
 
@@ -55,7 +58,7 @@ class StopSignals {
   }
 
  private:
-  sigset_t signals_{};
+  const sigset_t signals_ = StopSignalSet();
   sigset_t before_{};
   bool stopped_ = false;
 };
@@ -95,6 +98,13 @@ class Count {
   std::thread thread_;
 };
 
+// What the terminal shows without going on to another line, at its present size.
+size_t WidestLine() {
+  winsize size{};
+  return ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) != 0 || size.ws_col == 0 ? std::string::npos
+                                                                          : size.ws_col - 1U;
+}
+
 // Says things to people, or in JSON to programs: an object a line, with "event".
 class Voice {
  public:
@@ -112,7 +122,8 @@ class Voice {
     }
   }
 
-  // Drawn over the last one on a terminal, a line every other second elsewhere.
+  // Drawn over the last one on a terminal, no wider than that; elsewhere a line every other second
+  // in which something was done.
   void ShowProgress(uint64_t done, const Count& total, double seconds) {
     const auto rate = static_cast<uint64_t>(static_cast<double>(done) / std::max(seconds, 0.001));
     std::string text = Counted(done, "file");
@@ -126,11 +137,13 @@ class Voice {
     if (has_bar_) {
       const size_t most = std::max<uint64_t>({total.Get(), done, 1});
       const size_t filled = total.IsDone() ? done * kBarWidth / most : 0;
-      console_.out << "\r\033[K[" << std::string(filled, '#')
-                   << std::string(kBarWidth - filled, '.') << "] " << text << std::flush;
+      std::string bar = "[" + std::string(filled, '#');
+      bar.append(kBarWidth - filled, '.').append("] ").append(text);
+      console_.out << "\r\033[K" << bar.substr(0, WidestLine()) << std::flush;
       drawn_ = true;
-    } else if (Clock::now() >= next_) {
+    } else if (Clock::now() >= next_ && done != done_said_) {
       next_ = Clock::now() + kLineInterval;
+      done_said_ = done;
       Json::Value fields;
       fields["done"] = Json::UInt64{done};
       fields["total"] = total.IsDone() ? Json::Value(Json::UInt64{total.Get()}) : Json::Value();
@@ -151,6 +164,7 @@ class Voice {
   const bool as_json_;
   const bool has_bar_;
   bool drawn_ = false;
+  uint64_t done_said_ = UINT64_MAX;
   Clock::time_point next_ = Clock::now() + kLineInterval;
 };
 
@@ -162,7 +176,8 @@ uint64_t FilesTaken(const Json::Value& shares) {
   return files;
 }
 
-// Whether every share has a worker that has nothing left to do, and every queue is fed.
+// Whether every share has a worker that has nothing left to do or does nothing at present, and
+// every queue is fed.
 bool IsQuiet(const Json::Value& shares) {
   const size_t wanted = fileindex::FolderMgr().GetIndexedShares().size();
   const bool are_idle = std::all_of(shares.begin(), shares.end(), [](const Json::Value& share) {
@@ -187,11 +202,11 @@ std::vector<std::string> AddFolders(const std::vector<std::string>& folders, Voi
                                     const Console& console) {
   std::vector<std::string> full_paths;
   for (const std::string& folder : folders) {
-    const std::string path = ShareFor(folder, console);
-    const bool is_new = !fileindex::FolderMgr().HasFolder(path);
-    if (is_new) {
-      AddFolder(NewFolder(path), console);
-    }
+    bool is_new = false;
+    AddFolder(folder, console, [&is_new](const Json::Value& record) {
+      is_new = !fileindex::FolderMgr().HasFolder(record["path"].asString());
+      return is_new;
+    });
     full_paths.push_back(RealPath(folder));
     Json::Value fields;
     fields["path"] = full_paths.back();
@@ -204,8 +219,8 @@ std::vector<std::string> AddFolders(const std::vector<std::string>& folders, Voi
 std::string OwnCall() {
   std::error_code error;
   const char* const root = getenv("FILEINDEX_ROOT");  // NOLINT(concurrency-mt-unsafe)
-  return (root == nullptr ? "" : "FILEINDEX_ROOT=" + std::string(root) + " ") +
-         std::filesystem::read_symlink("/proc/self/exe", error).string();
+  return (root == nullptr ? "" : "FILEINDEX_ROOT=" + ForShell(root) + " ") +
+         ForShell(std::filesystem::read_symlink("/proc/self/exe", error).string());
 }
 
 std::string TimeOfDay() {
@@ -236,9 +251,60 @@ void SayWhatIsNew(const Json::Value& shares, std::map<std::string, uint64_t>& op
   }
 }
 
+// Says why shares fail, each reason once until they are done with what failed.
+class FailureNotes {
+ public:
+  explicit FailureNotes(Voice& voice) : voice_(voice) {}
+
+  void Say(const Json::Value& shares) {
+    for (const Json::Value& share : shares) {
+      const std::string name = share["share"].asString();
+      const std::string state = share["state"].asString();
+      const std::string error = share["last_error"].asString();
+      if (state == "idle") {
+        said_.erase(name);
+      } else if (state == "failing" && said_[name] != error) {
+        said_[name] = error;
+        Json::Value fields;
+        fields["share"] = name;
+        std::string text = TimeOfDay();
+        text.append("  ").append(name).append(": fails, and is tried again: ").append(error);
+        voice_.Say("failing", text, fields);
+      }
+    }
+  }
+
+ private:
+  Voice& voice_;
+  std::map<std::string, std::string> said_;  // By share.
+};
+
+// Says which shares nothing is done for at present. Whether there are some.
+bool SayWhatRests(const Json::Value& shares, Voice& voice) {
+  bool is_some = false;
+  for (const Json::Value& share : shares) {
+    const std::string name = share["share"].asString();
+    const std::string state = share["state"].asString();
+    if (state != "paused" && state != "unavailable") {
+      continue;
+    }
+    is_some = true;
+    const std::string error = share["last_error"].asString();
+    Json::Value fields;
+    fields["share"] = name;
+    voice.Say(state.c_str(),
+              name + ": " +
+                  (state == "paused" ? "indexing is paused; 'fileindex resume' goes on"
+                   : error.empty()   ? "is unavailable; 'fileindex doctor' says more"
+                                     : "is unavailable: " + error),
+              fields);
+  }
+  return is_some;
+}
+
 // False when a signal came before all of it was found.
 bool AwaitFirstCrawl(const std::vector<std::string>& folders, StopSignals& signals, Stack& stack,
-                     Voice& voice) {
+                     Voice& voice, FailureNotes& failures) {
   const Count total(folders);
   const Clock::time_point began = Clock::now();
   for (;;) {
@@ -251,12 +317,14 @@ bool AwaitFirstCrawl(const std::vector<std::string>& folders, StopSignals& signa
       fields["seconds"] = seconds;
       char text[32];
       snprintf(text, sizeof(text), "%.1f", seconds);
-      voice.Say("ready",
-                "everything can be found: " + Counted(done, "file") + " and folders indexed in " +
-                    text + " s",
+      const bool is_all = !SayWhatRests(shares, voice);
+      voice.Say(is_all ? "ready" : "resting",
+                (is_all ? "everything can be found: " : "the rest can be found: ") +
+                    Counted(done, "file") + " and folders indexed in " + text + " s",
                 fields);
       return true;
     }
+    failures.Say(shares);
     voice.ShowProgress(done, total, seconds);
     if (signals.Await(kProgressInterval)) {
       return false;
@@ -299,7 +367,8 @@ ExitStatus Up(const Arguments& arguments, const Console& console) {
   if (folders.empty()) {
     throw Failure("no folder is indexed; name one: fileindex up DIR");
   }
-  if (!AwaitFirstCrawl(folders, signals, stack, voice)) {
+  FailureNotes failures(voice);
+  if (!AwaitFirstCrawl(folders, signals, stack, voice, failures)) {
     return kDone;
   }
   Json::Value fields;
@@ -315,7 +384,9 @@ ExitStatus Up(const Arguments& arguments, const Console& console) {
   }
   while (!signals.Await(kFollowInterval)) {
     stack.Tend();
-    SayWhatIsNew(AskShares(), operations, voice);
+    const Json::Value shares = AskShares();
+    failures.Say(shares);
+    SayWhatIsNew(shares, operations, voice);
   }
   voice.Say("stopping", "stopping");
   stack.Stop();
@@ -330,11 +401,13 @@ std::vector<Command> UpCommands() {
        "[DIR...]",
        "starts everything, indexes folders and follows their changes until Ctrl-C",
        "Starts the daemons that do not run yet, adds the folders (a folder that no share holds is\n"
-       "made a share), shows how far the first crawl is, and says so when everything can be "
-       "found.\n"
-       "Then it goes on following changes. Without DIR it goes on with the folders that are\n"
-       "indexed. Ctrl-C stops what it started within five seconds; the index stays. What the\n"
-       "daemons say is in var/log/fileindex below the root.\n"
+       "made a share), shows how far the first crawl is, and says so when everything can be\n"
+       "found, or which shares are paused or unavailable, and why one fails. Then it goes on\n"
+       "following changes. Without DIR it goes on with the folders that are indexed. A daemon "
+       "that\n"
+       "ran already is left alone, and started when it ends. Ctrl-C stops what it started within\n"
+       "five seconds; the index stays. What the daemons say is in var/log/fileindex below the\n"
+       "root.\n"
        "\n"
        "  fileindex up ~/Documents\n",
        {{"--json", nullptr, "one JSON object a line: event, text, and what belongs to it"}},

@@ -17,6 +17,7 @@
 
 #include "cli/command.h"
 #include "cli/operation_writer.h"
+#include "cli/stop_signals.h"
 #include "cli/text.h"
 #include "common/error.h"
 #include "common/file.h"
@@ -119,11 +120,7 @@ class QueueFile {
 class StopSignals {
  public:
   StopSignals() {
-    sigset_t stop;
-    sigemptyset(&stop);
-    for (const int signal : {SIGINT, SIGTERM, SIGHUP}) {
-      sigaddset(&stop, signal);
-    }
+    const sigset_t stop = StopSignalSet();
     sigprocmask(SIG_BLOCK, &stop, nullptr);
     fd_ = signalfd(-1, &stop, SFD_CLOEXEC | SFD_NONBLOCK);
     if (fd_ < 0) {

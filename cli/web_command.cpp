@@ -6,6 +6,7 @@
 #include <ctime>
 
 #include "cli/command.h"
+#include "cli/stop_signals.h"
 #include "cli/web/api.h"
 #include "cli/web/guard.h"
 #include "cli/web/http_server.h"
@@ -22,11 +23,7 @@ ExitStatus Web(const Arguments& arguments, const Console& console) {
   const sockaddr_storage address =
       ReadLoopbackAddress(arguments.Has("--listen") ? arguments.Get("--listen") : kDefaultPlace);
   // The threads inherit this, so a signal is for the wait below.
-  sigset_t signals;
-  sigemptyset(&signals);
-  for (const int signal : {SIGINT, SIGTERM, SIGHUP}) {
-    sigaddset(&signals, signal);
-  }
+  const sigset_t signals = StopSignalSet();
   pthread_sigmask(SIG_BLOCK, &signals, nullptr);
   const int socket = ListenOn(address);
   const std::string place = ListeningPlace(socket);

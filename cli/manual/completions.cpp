@@ -53,7 +53,7 @@ std::string BashValues(Kind kind) {
     case Kind::kFolder:
       return "compopt -o filenames; mapfile -t COMPREPLY < <(compgen -d -- \"$word\")";
     case Kind::kShare:
-      return "mapfile -t COMPREPLY < <(compgen -W \"$(_fileindex_shares)\" -- \"$word\")";
+      return "_fileindex_complete_share \"$word\"";
     default:
       return ":";
   }
@@ -62,7 +62,17 @@ std::string BashValues(Kind kind) {
 std::string Bash(const std::vector<Command>& commands) {
   std::ostringstream script;
   script << "# Completes fileindex in bash.\n_fileindex_shares() {\n  " << kShareNames
-         << "\n}\n\n_fileindex() {\n"
+         << "\n}\n\n"
+            "# A share's name is one word, whatever it holds.\n"
+            "_fileindex_complete_share() {\n"
+            "  local share quoted\n"
+            "  while read -r share; do\n"
+            "    quoted=$(printf %q \"$share\")\n"
+            "    if [[ $share == \"$1\"* || $quoted == \"$1\"* ]]; then\n"
+            "      COMPREPLY+=(\"$quoted\")\n"
+            "    fi\n"
+            "  done < <(_fileindex_shares)\n"
+            "}\n\n_fileindex() {\n"
             "  local word=${COMP_WORDS[COMP_CWORD]} before=${COMP_WORDS[COMP_CWORD-1]} command\n"
             "  COMPREPLY=()\n"
             "  for command in \"${COMP_WORDS[*]:1:2}\" \"${COMP_WORDS[1]-}\"; do\n"

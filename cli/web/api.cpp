@@ -11,6 +11,7 @@
 #include "cli/pause.h"
 #include "cli/search_request.h"
 #include "cli/stack_report.h"
+#include "cli/text.h"
 #include "cli/web/guard.h"
 #include "cli/web/pages.h"
 #include "common/error.h"
@@ -154,9 +155,7 @@ HttpResponse Run(const Route& route, const HttpRequest& request) {
   } catch (const UsageError& error) {
     return Safe(ErrorResponse(400, error.what()));
   } catch (const Error& error) {
-    return Safe(ErrorResponse(503, std::string(error.what()) + " (error " +
-                                       std::to_string(static_cast<int>(error.GetErrorCode())) +
-                                       ")"));
+    return Safe(ErrorResponse(503, TextOf(error)));
   } catch (const std::exception& error) {
     return Safe(ErrorResponse(503, error.what()));
   }

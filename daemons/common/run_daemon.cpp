@@ -314,6 +314,9 @@ int RunDaemon(const DaemonOptions& options, int argc, char** argv,
   }
   OpenLog(options);
   try {
+    if (const std::string fault = kavo::local::RootFault(); !fault.empty()) {
+      throw std::runtime_error(fault);
+    }
     umask(022);
     if (chdir("/") != 0) {  // A folder that is held may be of a volume that is to be unmounted.
       Throw("chdir failed, path=/");

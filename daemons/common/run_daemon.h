@@ -79,7 +79,8 @@ class Daemon {
 // returns kAlreadyRunning. So whatever belongs to a daemon of this name (its socket, its files) is
 // the work's alone. The file is removed at the end; one that a killed daemon left is taken over.
 //
-// An exception that leaves the work is logged: kFailed. The log is syslog, and standard error
+// An exception that leaves the work is logged: kFailed. So is a FILEINDEX_ROOT in the environment
+// that is no absolute path. The log is syslog, and standard error
 // unless that goes to the journal, which has the lines of syslog already.
 int RunDaemon(const DaemonOptions& options, int argc, char** argv,
               const std::function<void(Daemon&)>& work);

@@ -7,8 +7,12 @@
 
 #include <fcntl.h>
 
+#include <algorithm>
+#include <cstdint>
 #include <cstdlib>
+#include <iterator>
 #include <string>
+#include <string_view>
 
 #include "daemons/kavocontentextractd/fault.h"
 #include "daemons/kavocontentextractd/formats.h"
@@ -73,6 +77,38 @@ void ReadProperties(const TagLib::PropertyMap& properties, Document& document) {
   }
 }
 
+// Whether files of the type hold notes, instruments or programs that play them: what is told of
+// recordings is not missing there.
+bool IsScore(const std::string& type) {
+  constexpr std::string_view kTypes[] = {
+      "audio/mid",   "audio/midi",  "audio/x-idf", "audio/x-mids", "audio/x-mod", "audio/x-psf",
+      "audio/x-s3m", "audio/x-sap", "audio/x-syx", "audio/x-sfbk", "audio/x-vgm"};
+  return std::find(std::begin(kTypes), std::end(kTypes), type) != std::end(kTypes);
+}
+
+// Whether it is a WAV without a length, as one has that was written to a pipe: programs write none
+// or the largest of 32 bits, with a sign or without.
+bool IsEndlessWav(const Source& source) {
+  constexpr size_t kSizeAt = 4;
+  constexpr size_t kSizeBytes = 4;
+  constexpr uint8_t kLargest = 0x7F;  // Of its last byte.
+  const std::string head = source.Read(kSizeAt + kSizeBytes);
+  const std::string_view size = std::string_view(head).substr(std::min(kSizeAt, head.size()));
+  return head.starts_with("RIFF") && size.size() == kSizeBytes &&
+         (static_cast<uint8_t>(size.back()) >= kLargest ||
+          size.find_first_not_of('\0') == std::string_view::npos);
+}
+
+void ReadOther(const Source& source, const std::string& type, Document& document) {
+  try {
+    ReadMedia(source, type, document);  // It knows more formats, and less of each.
+  } catch (const Fault& fault) {
+    if (fault.Reason() != reason::kDamaged || !IsScore(type)) {
+      throw;
+    }
+  }
+}
+
 }  // namespace
 
 void ReadAudio(const Source& source, const std::string& type, Document& document) {
@@ -86,10 +122,11 @@ void ReadAudio(const Source& source, const std::string& type, Document& document
   stream.seek(0);
   const TagLib::FileRef file(&stream);
   if (file.isNull()) {
-    ReadMedia(source, type, document);  // It knows more formats, and less of each.
+    ReadOther(source, type, document);
     return;
   }
-  if (const TagLib::AudioProperties* const sound = file.audioProperties()) {
+  const TagLib::AudioProperties* const sound = file.audioProperties();
+  if (sound != nullptr) {
     document.SetReal(field::KAVOMDDurationSecond, sound->lengthInMilliseconds() / 1000.0);
     document.SetNumber(field::KAVOMDAudioBitRate, int64_t{sound->bitrate()} * kBitsPerKilobit);
     document.SetNumber(field::KAVOMDAudioSampleRate, sound->sampleRate());
@@ -97,8 +134,12 @@ void ReadAudio(const Source& source, const std::string& type, Document& document
   }
   document.AddText(field::KAVOMDMediaTypes, "Sound");
   ReadProperties(file.file()->properties(), document);
-  if (!file.file()->isValid() || file.audioProperties() == nullptr ||
-      file.audioProperties()->lengthInMilliseconds() == 0) {
+  // A recording that was written to a pipe says no length; on such a WAV the library gives up.
+  const bool has_sound = file.file()->isValid() && sound != nullptr &&
+                         (sound->lengthInMilliseconds() > 0 || sound->sampleRate() > 0);
+  if (!has_sound && IsEndlessWav(source)) {
+    ReadMedia(source, type, document);
+  } else if (!has_sound) {
     throw Fault(reason::kDamaged, "the sound cannot be found in the file");
   }
 }

@@ -161,6 +161,12 @@ void Document::SetText(const char* field, std::string_view value) {
   }
 }
 
+void Document::SetFirstText(const char* field, std::string_view value) {
+  if (!fields_.isMember(field)) {
+    SetText(field, value);
+  }
+}
+
 void Document::SetNumber(const char* field, int64_t value) {
   if (value > 0) {
     fields_[field] = static_cast<Json::Int64>(value);

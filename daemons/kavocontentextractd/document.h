@@ -42,6 +42,7 @@ class Document {
   // positive, a date that cannot be read. Texts lose control characters and white space around
   // them, and end at 64 KiB.
   void SetText(const char* field, std::string_view value);
+  void SetFirstText(const char* field, std::string_view value);  // Unless the field is there.
   void SetNumber(const char* field, int64_t value);
   void SetReal(const char* field, double value);
   void SetDate(const char* field, std::string_view iso_8601);

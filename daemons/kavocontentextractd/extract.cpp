@@ -3,6 +3,7 @@
 #include <magic.h>
 
 #include <algorithm>
+#include <clocale>
 #include <exception>
 #include <iterator>
 #include <new>
@@ -139,6 +140,9 @@ Extractor::Extractor()
   if (types_ == nullptr || magic_load(types_.get(), nullptr) != 0) {
     throw std::runtime_error("the table of file types cannot be loaded");
   }
+  // Names in archives come in the locale's encoding, and those that it has no letters for not at
+  // all. Where this one is not installed, parts with such names count as damaged.
+  (void)setlocale(LC_CTYPE, "C.UTF-8");  // NOLINT(concurrency-mt-unsafe): there is one thread.
 }
 
 Json::Value Extractor::Extract(int file, const std::string& name) const {

@@ -14,7 +14,8 @@ namespace vexlo::extractd {
 // For one thread at a time.
 class Extractor {
  public:
-  // Loads the table of types. Throws std::runtime_error when it is not there.
+  // Loads the table of types; throws std::runtime_error when it is not there. Makes C.UTF-8 the
+  // process's locale for characters.
   Extractor();
 
   // The fields, or {"error":..} when there are none but a reason: see docs/extract.md. `name` is

@@ -10,6 +10,7 @@
 #include <optional>
 #include <utility>
 
+#include "common/string.h"
 #include "daemons/kavocontentextractd/fault.h"
 #include "daemons/kavocontentextractd/formats.h"
 #include "daemons/kavocontentextractd/xml.h"
@@ -32,27 +33,56 @@ constexpr size_t kMostPageBytes = size_t{16} << 20;
 constexpr std::string_view kOpenDocument = "application/vnd.oasis.opendocument.";
 constexpr std::string_view kEpub = "application/epub+zip";
 
+// The header or footer of a sheet without its codes: "&CPlan &P" is "Plan ", "&&" is "&".
+std::string WithoutCodes(std::string_view text) {
+  std::string plain;
+  for (size_t i = 0; i < text.size(); ++i) {
+    if (text[i] != '&') {
+      plain += text[i];
+    } else if (const char code = ++i < text.size() ? text[i] : '\0'; code == '&') {
+      plain += '&';
+    } else if (code == '"') {  // A font.
+      i = std::min(text.find('"', i + 1), text.size());
+    } else if (code == 'K') {  // A colour.
+      constexpr size_t kDigits = 6;
+      i += kDigits;
+    } else if (code >= '0' && code <= '9') {  // A size.
+      i = std::min(text.find_first_not_of("0123456789", i), text.size()) - 1;
+    } else {
+      plain += ' ';  // A place, a style, or what is put in.
+    }
+  }
+  return plain;
+}
+
 // The text of office documents. OOXML has it in elements "t" ("w:t", "a:t", "t" of sheets), the
-// cells' numbers in "v"; OpenDocument has it everywhere below "body".
+// cells' numbers in "v"; OpenDocument has it everywhere below "body". Notes, comments and text
+// boxes stand within the paragraph, and often behind a word without white space.
 class TextHandler : public XmlHandler {
  public:
-  TextHandler(bool is_open_document, Text& text)
-      : is_open_document_(is_open_document), text_(text) {}
+  // The numbers go to `numbers`.
+  TextHandler(bool is_open_document, Text& text, Text& numbers)
+      : is_open_document_(is_open_document), text_(text), numbers_(numbers) {}
 
   void Start(std::string_view name, const Attributes& attributes) override {
     if (is_open_document_) {
       StartOpenDocument(name);
-    } else if (name == "t") {
-      is_text_ = true;
+    } else if (name == "p" || name == "br" || name == "cr") {
+      text_.EndLine();
+    } else if (name == "t" || name == "text") {  // "text" is that of a slide's comment.
+      taker_ = &text_;
+    } else if (IsSheetHeader(name)) {
+      is_header_ = true;
     } else if (name == "c") {
       const std::string_view type = attributes.Get("t");
-      is_value_ = type.empty() || type == "n" || type == "str";
+      const bool is_number = type.empty() || type == "n";
+      cell_ = is_number ? &numbers_ : type == "str" ? &text_ : nullptr;
     } else if (name == "v") {
-      is_text_ = is_value_;
+      taker_ = cell_;
     } else if (name == "tab") {
       text_.Append("\t");
-    } else if (name == "br" || name == "cr") {
-      text_.EndLine();
+    } else if (name == "noBreakHyphen") {
+      text_.Append("-");
     }
   }
 
@@ -60,45 +90,75 @@ class TextHandler : public XmlHandler {
     if (is_open_document_) {
       if (name == "p" || name == "h") {
         text_.EndLine();
+      } else if (StandsApart(name)) {
+        text_.EndWord();
       } else if (name == "body") {
-        is_text_ = false;
+        taker_ = nullptr;
       }
       return;
     }
-    if (name == "t" || name == "v") {
-      is_text_ = false;
+    if (name == "t" || name == "v" || name == "text") {
+      taker_ = nullptr;
     }
-    // Paragraphs, strings of sheets, rows; cells end as words do.
-    if (name == "p" || name == "si" || name == "row" || name == "is") {
+    // Paragraphs, strings of sheets, rows, comments; cells end as words do.
+    if (name == "p" || name == "si" || name == "row" || name == "is" || name == "text") {
       text_.EndLine();
-    } else if (name == "v") {
-      text_.EndWord();
+      if (name == "row") {
+        numbers_.EndLine();
+      }
+    } else if (IsSheetHeader(name)) {
+      text_.Append(WithoutCodes(header_));
+      text_.EndLine();
+      header_.clear();
+      is_header_ = false;
+    } else if (name == "v" && cell_ != nullptr) {
+      cell_->EndWord();
     }
   }
 
   void Characters(std::string_view text) override {
-    if (is_text_) {
-      text_.Append(text);
+    if (taker_ != nullptr) {
+      taker_->Append(text);
+    } else if (is_header_) {
+      constexpr size_t kMost = 4096;  // Sixteen times what programs allow.
+      header_ += text.substr(0, kMost - std::min(kMost, header_.size()));
     }
   }
 
  private:
+  // Whether the element is a text of its own in the midst of a paragraph: a note's number, a
+  // comment's author and date, what a picture shows.
+  static bool StandsApart(std::string_view name) {
+    constexpr std::string_view kNames[] = {"note-citation", "creator", "date", "title", "desc"};
+    return std::find(std::begin(kNames), std::end(kNames), name) != std::end(kNames);
+  }
+
+  // "oddHeader", "firstFooter" and the like.
+  static bool IsSheetHeader(std::string_view name) {
+    return (name.ends_with("Header") || name.ends_with("Footer")) && name != "headerFooter";
+  }
+
   void StartOpenDocument(std::string_view name) {
     if (name == "body") {
-      is_text_ = true;
+      taker_ = &text_;
+    } else if (name == "p" || name == "h" || name == "line-break") {
+      text_.EndLine();
+    } else if (StandsApart(name)) {
+      text_.EndWord();
     } else if (name == "s") {
       text_.Append(" ");
     } else if (name == "tab") {
       text_.Append("\t");
-    } else if (name == "line-break") {
-      text_.EndLine();
     }
   }
 
   const bool is_open_document_;
   Text& text_;
-  bool is_text_ = false;
-  bool is_value_ = false;
+  Text& numbers_;
+  Text* taker_ = nullptr;  // Of the characters to come.
+  Text* cell_ = nullptr;   // Of the value of the cell.
+  bool is_header_ = false;
+  std::string header_;
 };
 
 enum class Kind { kText, kList, kNumber, kDate };
@@ -146,7 +206,7 @@ void SetProperty(std::string_view name, const std::string& value, Document& docu
   }
   switch (property->kind) {
     case Kind::kText:
-      document.SetText(property->field, value);
+      document.SetFirstText(property->field, value);
       break;
     case Kind::kList:
       document.AddText(property->field, value);
@@ -198,6 +258,27 @@ class ManifestHandler : public XmlHandler {
   void Characters(std::string_view /*text*/) override {}
 };
 
+bool IsPage(std::string_view name) {
+  return name.ends_with(".xhtml") || name.ends_with(".html") || name.ends_with(".htm");
+}
+
+// Looks for pages in META-INF/encryption.xml of an e-book; mostly it names fonts alone, which hide
+// nothing.
+class BookEncryptionHandler : public XmlHandler {
+ public:
+  void Start(std::string_view name, const Attributes& attributes) override {
+    has_pages_ = has_pages_ ||
+                 (name == "CipherReference" && IsPage(ToLower(std::string(attributes.Get("URI")))));
+  }
+  void End(std::string_view /*name*/) override {}
+  void Characters(std::string_view /*text*/) override {}
+
+  bool HasPages() const { return has_pages_; }
+
+ private:
+  bool has_pages_ = false;
+};
+
 class Archive {
  public:
   explicit Archive(const Source& source) : archive_(archive_read_new(), archive_read_free) {
@@ -211,7 +292,7 @@ class Archive {
     }
   }
 
-  // The name of the next entry; nothing at the end.
+  // The name of the next entry, "" for one that cannot be read; nothing at the end.
   std::optional<std::string> Next() {
     struct archive_entry* entry = nullptr;
     const int result = archive_read_next_header(archive_.get(), &entry);
@@ -251,6 +332,9 @@ class Archive {
     }
   }
 
+  // The bytes that were read of all parts.
+  uint64_t Unpacked() const { return unpacked_; }
+
  private:
   [[noreturn]] void Fail() {
     const char* const text = archive_error_string(archive_.get());
@@ -264,49 +348,62 @@ class Archive {
   bool is_encrypted_ = false;
 };
 
-void ReadXml(Archive& archive, XmlHandler& handler, const Text* text) {
+bool NeverEnough() { return false; }
+
+void ReadXml(Archive& archive, XmlHandler& handler,
+             const std::function<bool()>& is_enough = NeverEnough) {
   XmlReader reader(handler);
   archive.Read([&](std::string_view part, bool is_last) {
     reader.Feed(part, is_last);
-    return text == nullptr || !text->IsFull();
+    return !is_enough();
   });
 }
 
-bool HasNumberBetween(std::string_view name, std::string_view before, std::string_view behind) {
-  return name.size() > before.size() + behind.size() && name.starts_with(before) &&
-         name.ends_with(behind) &&
-         name.substr(before.size(), name.size() - before.size() - behind.size())
+// Whether the name is `before`, digits if any, and ".xml".
+bool IsNumbered(std::string_view name, std::string_view before) {
+  constexpr std::string_view kBehind = ".xml";
+  return name.size() >= before.size() + kBehind.size() && name.starts_with(before) &&
+         name.ends_with(kBehind) &&
+         name.substr(before.size(), name.size() - before.size() - kBehind.size())
                  .find_first_not_of("0123456789") == std::string_view::npos;
 }
 
-// The parts of OOXML that hold text.
+// The parts of OOXML that hold text, by their names in lower case: it does not count, and whether
+// there is a number is for each program to choose.
 bool IsTextPart(std::string_view name) {
-  constexpr std::string_view kNames[] = {"word/document.xml", "word/footnotes.xml",
-                                         "word/endnotes.xml", "word/comments.xml",
-                                         "xl/sharedStrings.xml"};
-  constexpr std::string_view kNumbered[] = {"word/header", "word/footer", "xl/worksheets/sheet",
-                                            "ppt/slides/slide", "ppt/notesSlides/notesSlide"};
-  return std::find(std::begin(kNames), std::end(kNames), name) != std::end(kNames) ||
-         std::any_of(std::begin(kNumbered), std::end(kNumbered), [name](std::string_view before) {
-           return HasNumberBetween(name, before, ".xml");
-         });
+  constexpr std::string_view kParts[] = {"word/document",
+                                         "word/footnotes",
+                                         "word/endnotes",
+                                         "word/comments",
+                                         "word/header",
+                                         "word/footer",
+                                         "xl/sharedstrings",
+                                         "xl/worksheets/sheet",
+                                         "xl/comments",
+                                         "xl/comments/comment",
+                                         "xl/drawings/drawing",
+                                         "ppt/slides/slide",
+                                         "ppt/notesslides/notesslide",
+                                         "ppt/diagrams/data"};
+  return std::any_of(std::begin(kParts), std::end(kParts),
+                     [name](std::string_view part) { return IsNumbered(name, part); }) ||
+         (name.starts_with("ppt/comments/") && name.ends_with(".xml"));
 }
 
+// The part without which there is no document of the type.
 struct Main {
-  std::string_view part;
+  std::string_view part;  // Followed by a number, if any, and ".xml".
   const char* type;
 };
 constexpr Main kMains[] = {
-    {"word/document.xml",
-     "application/vnd.openxmlformats-officedocument.wordprocessingml.document"},
-    {"xl/workbook.xml", "application/vnd.openxmlformats-officedocument.spreadsheetml.sheet"},
-    {"ppt/presentation.xml",
+    {"word/document", "application/vnd.openxmlformats-officedocument.wordprocessingml.document"},
+    {"xl/workbook", "application/vnd.openxmlformats-officedocument.spreadsheetml.sheet"},
+    {"ppt/presentation",
      "application/vnd.openxmlformats-officedocument.presentationml.presentation"},
 };
-
-bool IsPage(std::string_view name) {
-  return name.ends_with(".xhtml") || name.ends_with(".html") || name.ends_with(".htm");
-}
+// Of a workbook whose parts are not XML the properties are read, and its type is all besides.
+constexpr std::string_view kBinaryWorkbook = "xl/workbook.bin";
+constexpr char kBinaryWorkbookType[] = "application/vnd.ms-excel.sheet.binary.macroEnabled.12";
 
 class PartReader {
  public:
@@ -320,29 +417,37 @@ class PartReader {
     if (type_.starts_with(kOpenDocument)) {
       if (name == "META-INF/manifest.xml") {
         ManifestHandler manifest;
-        ReadXml(archive, manifest, nullptr);
+        ReadXml(archive, manifest);
       } else if (name == "meta.xml") {
-        ReadXml(archive, properties, nullptr);
+        ReadXml(archive, properties);
       } else if (name == "content.xml") {
         ReadText(/*is_open_document=*/true, archive);
       }
     } else if (type_ == kEpub) {
-      if (name.ends_with(".opf")) {
-        ReadXml(archive, properties, nullptr);
-        has_text_ = true;
-      } else if (IsPage(name) && !document_.text.IsFull()) {
-        ReadPage(archive);
-      }
-    } else if (name == "docProps/core.xml" || name == "docProps/app.xml") {
-      ReadXml(archive, properties, nullptr);
-    } else if (IsTextPart(name)) {
-      ReadText(/*is_open_document=*/false, archive);
+      ReadBookPart(ToLower(name), archive, properties);
+    } else {
+      ReadOpenXmlPart(ToLower(name), archive, properties);
     }
-    for (const Main& row : kMains) {
-      if (name == row.part) {
-        document_.SetText(field::KAVOMDContentType, row.type);
-        is_document_ = has_text_ = true;
-      }
+  }
+
+  // For the end of the archive. Of a book with encrypted pages its properties remain: what was read
+  // of pages before that was known is noise.
+  void CheckEncryption() {
+    if (is_encrypted_) {
+      document_.text = Text();
+      throw Fault(reason::kEncrypted, "the pages of the book are encrypted");
+    }
+  }
+
+  // Puts the numbers of sheets behind the words of all parts: a large table would leave no room for
+  // the words, which stand in a part behind it.
+  void AppendNumbers() {
+    if (!numbers_.Get().empty()) {
+      document_.text.EndLine();
+      document_.text.Append(numbers_.Get());
+    }
+    if (numbers_.IsFull()) {
+      document_.text.SetTruncated();
     }
   }
 
@@ -367,11 +472,49 @@ class PartReader {
     }
   }
 
-  void ReadText(bool is_open_document, Archive& archive) {
+  // The names in lower case.
+  void ReadBookPart(const std::string& name, Archive& archive, PropertyHandler& properties) {
+    if (name.ends_with(".opf")) {
+      ReadXml(archive, properties);
+      has_text_ = true;
+    } else if (name == "meta-inf/encryption.xml") {
+      BookEncryptionHandler encryption;
+      ReadXml(archive, encryption);
+      is_encrypted_ = encryption.HasPages();
+    } else if (IsPage(name) && !is_encrypted_ && !document_.text.IsFull()) {
+      ReadPage(archive);
+    }
+  }
+
+  void ReadOpenXmlPart(const std::string& name, Archive& archive, PropertyHandler& properties) {
+    for (const Main& row : kMains) {
+      if (IsNumbered(name, row.part)) {
+        SetType(row.type);
+      }
+    }
+    if (name == kBinaryWorkbook) {
+      SetType(kBinaryWorkbookType);
+    } else if (name == "docprops/core.xml" || name == "docprops/app.xml") {
+      ReadXml(archive, properties);
+    } else if (IsTextPart(name)) {
+      ReadText(/*is_open_document=*/false, archive, name.starts_with("xl/worksheets/"));
+    }
+  }
+
+  void SetType(const char* type) {
+    document_.SetText(field::KAVOMDContentType, type);
+    is_document_ = has_text_ = true;
+  }
+
+  // A sheet is left, when there is no room for its numbers, in time for the parts behind it.
+  void ReadText(bool is_open_document, Archive& archive, bool is_sheet = false) {
     is_document_ = has_text_ = true;
     if (!document_.text.IsFull()) {
-      TextHandler handler(is_open_document, document_.text);
-      ReadXml(archive, handler, &document_.text);
+      TextHandler handler(is_open_document, document_.text, numbers_);
+      ReadXml(archive, handler, [&] {
+        return document_.text.IsFull() ||
+               (is_sheet && numbers_.IsFull() && archive.Unpacked() > kMostUnpacked / 2);
+      });
       document_.text.EndLine();
     }
   }
@@ -387,6 +530,8 @@ class PartReader {
 
   std::string type_;
   Document& document_;
+  Text numbers_;
+  bool is_encrypted_ = false;
   bool is_document_ = false;
   bool has_text_ = false;
 };
@@ -402,6 +547,9 @@ void ReadOffice(const Source& source, const std::string& type, Document& documen
     Archive archive(source);
     while (const std::optional<std::string> name = archive.Next()) {
       try {
+        if (name->empty()) {
+          throw Fault(reason::kDamaged, "the name of a part cannot be read");
+        }
         parts.Read(*name, archive);
       } catch (const Fault& thrown) {
         if (thrown.Reason() != reason::kDamaged) {
@@ -410,9 +558,11 @@ void ReadOffice(const Source& source, const std::string& type, Document& documen
         fault = fault ? fault : std::optional(thrown);
       }
     }
+    parts.CheckEncryption();
   } catch (const Fault& thrown) {
     fault = thrown;
   }
+  parts.AppendNumbers();
   if (is_plain_archive && !parts.IsDocument()) {
     return;  // What is in archives is not looked at, so nothing is missing.
   }

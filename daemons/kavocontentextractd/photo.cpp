@@ -8,6 +8,7 @@
 
 #include "daemons/kavocontentextractd/fault.h"
 #include "daemons/kavocontentextractd/formats.h"
+#include "daemons/kavocontentextractd/plain_text.h"
 #include "fileindex/elastic_control/schema.h"
 #include "kavo/local/content.h"
 
@@ -25,7 +26,7 @@ enum class Kind {
   kList,   // Of texts.
   kNumber,
   kReal,
-  kDate,
+  kDate,   // With the zone of another tag, if that is there.
   kOnOff,  // The last bit.
 };
 
@@ -33,6 +34,7 @@ struct Tag {
   const char* key;  // "Exif.Image.Make"; the first three letters say of which family.
   const char* field;
   Kind kind;
+  const char* zone = nullptr;  // The key of a date's zone.
 };
 // Where two rows fill one field, the later one counts.
 constexpr Tag kTags[] = {
@@ -46,9 +48,10 @@ constexpr Tag kTags[] = {
     {"Exif.Image.XResolution", field::KAVOMDResolutionWidthDPI, Kind::kNumber},
     {"Exif.Image.YResolution", field::KAVOMDResolutionHeightDPI, Kind::kNumber},
     {"Exif.Image.BitsPerSample", field::KAVOMDBitsPerSample, Kind::kNumber},
-    {"Exif.Image.DateTime", field::KAVOMDContentCreationDate, Kind::kDate},
-    {"Exif.Photo.DateTimeOriginal", field::KAVOMDContentCreationDate, Kind::kDate},
-    {"Exif.Photo.UserComment", field::KAVOMDComment, Kind::kShown},
+    {"Exif.Image.DateTime", field::KAVOMDContentCreationDate, Kind::kDate, "Exif.Photo.OffsetTime"},
+    {"Exif.Photo.DateTimeOriginal", field::KAVOMDContentCreationDate, Kind::kDate,
+     "Exif.Photo.OffsetTimeOriginal"},
+    {"Exif.Photo.UserComment", field::KAVOMDComment, Kind::kText},
     {"Exif.Photo.ExposureTime", field::KAVOMDExposureTimeSeconds, Kind::kReal},
     {"Exif.Photo.ExposureTime", field::KAVOMDExposureTimeString, Kind::kShown},
     {"Exif.Photo.FNumber", field::KAVOMDFNumber, Kind::kReal},
@@ -82,6 +85,11 @@ constexpr Tag kTags[] = {
     {"Xmp.photoshop.Country", field::KAVOMDCountry, Kind::kText},
 };
 
+// Cameras and older programs write their system's encoding, and none says which it is.
+std::string Utf8(const std::string& text) {
+  return IsUtf8(text, /*has_more=*/false) ? text : Convert(text, "windows-1252").value_or(text);
+}
+
 // Of a text in several languages the one that the file prefers, or else the first.
 template <typename Datum>
 std::string TextOf(const Datum& datum) {
@@ -90,7 +98,10 @@ std::string TextOf(const Datum& datum) {
     const auto preferred = texts->value_.find("x-default");
     return preferred == texts->value_.end() ? texts->value_.begin()->second : preferred->second;
   }
-  return datum.toString();
+  if (const auto* const comment = dynamic_cast<const Exiv2::CommentValue*>(&datum.value())) {
+    return Utf8(comment->comment());
+  }
+  return Utf8(datum.toString());
 }
 
 template <typename Datum>
@@ -104,8 +115,8 @@ void SetTag(const Tag& tag, const Datum& datum, const std::string& shown, Docume
       break;
     case Kind::kList:
       for (long i = 0; i < std::min(datum.count(), 256L); ++i) {
-        document.AddText(
-            tag.field, datum.typeId() == Exiv2::asciiString ? datum.toString() : datum.toString(i));
+        document.AddText(tag.field, Utf8(datum.typeId() == Exiv2::asciiString ? datum.toString()
+                                                                              : datum.toString(i)));
         if (datum.typeId() == Exiv2::asciiString || datum.typeId() == Exiv2::string) {
           break;  // It counts its characters.
         }
@@ -126,6 +137,16 @@ void SetTag(const Tag& tag, const Datum& datum, const std::string& shown, Docume
   }
 }
 
+// Cameras without a zone leave its tag blank, and the date as it is.
+void SetZone(const Tag& tag, const std::string& date, const Exiv2::ExifData& data,
+             Document& document) {
+  const auto zone =
+      tag.zone == nullptr ? data.end() : data.findKey(Exiv2::ExifKey(std::string(tag.zone)));
+  if (zone != data.end()) {
+    document.SetDate(tag.field, date + zone->toString());
+  }
+}
+
 void ReadTag(const Exiv2::Image& image, const Tag& tag, Document& document) {
   const std::string key = tag.key;
   if (key.starts_with("Exif")) {
@@ -133,6 +154,7 @@ void ReadTag(const Exiv2::Image& image, const Tag& tag, Document& document) {
     const auto found = data.findKey(Exiv2::ExifKey(key));
     if (found != data.end() && found->count() > 0) {
       SetTag(tag, *found, tag.kind == Kind::kShown ? found->print(&data) : "", document);
+      SetZone(tag, found->toString(), data, document);
     }
   } else if (key.starts_with("Iptc")) {
     for (const Exiv2::Iptcdatum& datum : image.iptcData()) {
@@ -158,7 +180,11 @@ double Degrees(const Exiv2::ExifData& data, const char* key, const char* referen
   double degrees = 0;
   double unit = 1;
   for (long i = 0; i < 3; ++i, unit /= 60) {
-    degrees += found->toFloat(i) * unit;
+    const Exiv2::Rational part = found->toRational(i);
+    if (part.second == 0) {  // So cameras write that they do not know.
+      return NAN;
+    }
+    degrees += static_cast<double>(part.first) / part.second * unit;
   }
   const auto side = data.findKey(Exiv2::ExifKey(reference));
   const bool is_negative = side != data.end() && side->toString().starts_with(negative);

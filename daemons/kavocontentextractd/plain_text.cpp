@@ -31,10 +31,35 @@ constexpr Mark kMarks[] = {
     {"\xFF\xFE", "UTF-16LE"},  {"\xFE\xFF", "UTF-16BE"},
 };
 
-// Encodings of seven bits that shift to other characters look like ASCII.
-bool HasShifts(std::string_view bytes) {
-  return bytes.find("\x1B$") != std::string_view::npos ||
-         bytes.find("\x1B(") != std::string_view::npos;
+// Names that are not taken for what they say: encodings whose larger ones are what is written under
+// their name, and those that ICU has by another name, or only all but a few letters of.
+struct Alias {
+  const char* name;
+  const char* encoding;
+};
+constexpr Alias kAliases[] = {
+    {"cn-big5", "Big5"},
+    {"EUC-KR", "windows-949"},
+    {"GB2312", "GB18030"},
+    {"GB_2312-80", "GB18030"},
+    {"GBK", "GB18030"},
+    {"ISO-8859-1", "windows-1252"},
+    {"ISO-8859-11", "TIS-620"},
+    {"ISO-8859-16", "ISO-8859-2"},
+    {"ISO-8859-9", "windows-1254"},
+    {"koi", "KOI8-R"},
+    {"koi8-ru", "KOI8-U"},
+    {"logical", "ISO-8859-8"},
+    {"UHC", "windows-949"},
+    {"US-ASCII", "windows-1252"},
+    {"visual", "ISO-8859-8"},
+};
+
+// ICU's own name of an encoding that it knows, else the one that it is given.
+const char* CanonicalName(const char* name) {
+  UErrorCode error = U_ZERO_ERROR;
+  const char* const known = ucnv_getAlias(name, 0, &error);
+  return known == nullptr ? name : known;
 }
 
 }  // namespace
@@ -58,6 +83,13 @@ bool HasBinaryControls(std::string_view bytes) {
   });
 }
 
+bool HasShifts(std::string_view bytes) {
+  const bool has_escape = bytes.find("\x1B$") != std::string_view::npos ||
+                          bytes.find("\x1B(") != std::string_view::npos;
+  return has_escape && std::none_of(bytes.begin(), bytes.end(),
+                                    [](char c) { return static_cast<unsigned char>(c) >= 0x80; });
+}
+
 bool IsUtf8(std::string_view bytes, bool has_more) {
   const auto* const start = reinterpret_cast<const uint8_t*>(bytes.data());
   size_t at = 0;
@@ -76,6 +108,16 @@ bool IsUtf8(std::string_view bytes, bool has_more) {
   return true;
 }
 
+std::string FindEncoding(const std::string& name) {
+  const char* const wanted = CanonicalName(name.c_str());
+  const auto* const row =
+      std::find_if(std::begin(kAliases), std::end(kAliases), [wanted](const Alias& alias) {
+        return ucnv_compareNames(wanted, CanonicalName(alias.name)) == 0;
+      });
+  std::string encoding = row == std::end(kAliases) ? name : row->encoding;
+  return name.empty() || !Convert("", encoding) ? "" : encoding;
+}
+
 std::string GuessEncoding(std::string_view bytes) {
   const std::unique_ptr<struct uchardet, decltype(&uchardet_delete)> detector(uchardet_new(),
                                                                               uchardet_delete);
@@ -84,8 +126,8 @@ std::string GuessEncoding(std::string_view bytes) {
     return kFallback;
   }
   uchardet_data_end(detector.get());
-  const std::string guess = uchardet_get_charset(detector.get());
-  return guess.empty() || guess == "ASCII" || guess == "UTF-8" ? kFallback : guess;
+  std::string guess = FindEncoding(uchardet_get_charset(detector.get()));
+  return guess.empty() ? kFallback : guess;
 }
 
 std::optional<std::string> Convert(std::string_view bytes, const std::string& encoding) {
@@ -139,7 +181,6 @@ std::optional<std::string> DecodeText(std::string_view bytes, bool has_more) {
   const std::string encoding =
       IsUtf8(bytes, has_more) && !HasShifts(bytes) ? "UTF-8" : GuessEncoding(bytes);
   std::optional<std::string> text = Convert(bytes, encoding);
-  text = text ? std::move(text) : Convert(bytes, kFallback);
   while (has_more && text && text->ends_with(kReplacement)) {  // A character that is cut off.
     text->resize(text->size() - kReplacement.size());
   }

@@ -21,11 +21,18 @@ std::optional<std::string> Convert(std::string_view bytes, const std::string& en
 // Appends the character; U+FFFD for what is none.
 void AppendUtf8(std::string& out, char32_t character);
 
+// What Convert() reads that goes by a name which pages use; "" when nothing does. It may be a
+// larger encoding than the name says, as what is called Latin-1 mostly is windows-1252.
+std::string FindEncoding(const std::string& name);
+
 // The encoding that the letters look like most, windows-1252 when they do not tell.
 std::string GuessEncoding(std::string_view bytes);
 
 // Whether all of it is UTF-8; when more would follow, the last character may be cut off.
 bool IsUtf8(std::string_view bytes, bool has_more);
+
+// Whether it is ASCII by its bytes, and shifts to other characters as ISO-2022-JP does.
+bool HasShifts(std::string_view bytes);
 
 // Whether there are control characters that no text has; white space, backspace and escape
 // sequences are not among them.

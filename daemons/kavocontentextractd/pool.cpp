@@ -161,7 +161,9 @@ class Pool::Worker {
     if (status && WIFEXITED(*status) && WEXITSTATUS(*status) == kOutOfMemory) {
       return {Outcome::kMemory, ""};
     }
-    return {Outcome::kDied, status ? "the worker " + StatusText(*status) : "the worker is gone"};
+    const bool is_killed = status && WIFSIGNALED(*status) && WTERMSIG(*status) == SIGKILL;
+    return {is_killed ? Outcome::kKilled : Outcome::kDied,
+            status ? "the worker " + StatusText(*status) : "the worker is gone"};
   }
 
   int Socket() const { return socket_.Get(); }
@@ -169,13 +171,12 @@ class Pool::Worker {
   bool IsAlive() const { return pid_ > 0; }
 
  private:
-  // Ends it, if it has not done so itself. How it ended.
+  // Ends it, if it has not ended. How it did so; nothing when it had to be ended.
   std::optional<int> Kill() {
     if (pid_ <= 0) {
       return std::nullopt;
     }
     int status = 0;
-    pid_t ended = 0;
     // One that closed its socket is about to end, and how is worth knowing.
     struct pollfd peer = {socket_.Get(), 0, 0};
     if (poll(&peer, 1, 0) == 1 && (peer.revents & POLLHUP) != 0) {
@@ -183,12 +184,14 @@ class Pool::Worker {
       struct pollfd end = {process.Get(), POLLIN, 0};
       poll(&end, 1, kEndMilliseconds);
     }
-    kill(pid_, SIGKILL);
-    do {
-      ended = waitpid(pid_, &status, 0);
-    } while (ended < 0 && errno == EINTR);
+    const bool has_ended = waitpid(pid_, &status, WNOHANG) == pid_;
+    if (!has_ended) {
+      kill(pid_, SIGKILL);
+      while (waitpid(pid_, &status, 0) < 0 && errno == EINTR) {
+      }
+    }
     pid_ = -1;
-    return ended > 0 ? std::optional(status) : std::nullopt;
+    return has_ended ? std::optional(status) : std::nullopt;
   }
 
   daemon::UniqueFd socket_;

@@ -49,7 +49,8 @@ class Pool {
     enum Kind {
       kReply,
       kNoWorker,  // None came free in time, or none could be started: no fault of the file.
-      kDeadline,  // These three cost a worker.
+      kKilled,    // By SIGKILL, which was not the daemon's. These four cost a worker.
+      kDeadline,
       kMemory,
       kDied,
     };

@@ -155,6 +155,23 @@ void Quarantine::Add(const ContentKey& key, const Fault& fault, const std::strin
   Save();
 }
 
+unsigned Quarantine::CountKill(const ContentKey& key) {
+  const FileId id(key.device, key.inode);
+  const kavo::local::MutexLock lock(mutex_);
+  if (kills_.size() >= most_ && !kills_.contains(id)) {
+    kills_.clear();
+  }
+  auto& [content, kills] = kills_[id];
+  kills = content == key ? kills + 1 : 1;
+  content = key;
+  return kills;
+}
+
+void Quarantine::ForgetKills(const ContentKey& key) {
+  const kavo::local::MutexLock lock(mutex_);
+  kills_.erase({key.device, key.inode});
+}
+
 size_t Quarantine::Size() {
   const kavo::local::MutexLock lock(mutex_);
   return entries_.size();

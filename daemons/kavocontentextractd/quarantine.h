@@ -46,6 +46,11 @@ class Quarantine {
 
   size_t Size();
 
+  // Counts that a process was killed while it read the content, which may be the content's fault or
+  // not. How often that was since ForgetKills(); neither is on disk.
+  unsigned CountKill(const ContentKey& key);
+  void ForgetKills(const ContentKey& key);
+
  private:
   struct Entry {
     ContentKey key;
@@ -65,6 +70,7 @@ class Quarantine {
   kavo::local::Mutex mutex_;
   std::list<Entry> entries_ KAVO_GUARDED_BY(mutex_);  // The oldest first.
   std::map<FileId, std::list<Entry>::iterator> by_file_ KAVO_GUARDED_BY(mutex_);
+  std::map<FileId, std::pair<ContentKey, unsigned>> kills_ KAVO_GUARDED_BY(mutex_);
 };
 
 }  // namespace vexlo::extractd

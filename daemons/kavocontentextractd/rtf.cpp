@@ -2,6 +2,7 @@
 #include <algorithm>
 #include <cstdint>
 #include <iterator>
+#include <map>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -22,11 +23,31 @@ namespace reason = kavo::local::content_reason;
 
 constexpr size_t kMostBytes = size_t{64} << 20;
 constexpr size_t kMostDepth = 10000;
+constexpr size_t kMostFonts = 4096;
 
-// Groups that hold no text of the document; so does each that begins with "\*".
+// Groups that hold no text of the document, or once more what another one holds; so does each that
+// begins with "\*".
 constexpr std::string_view kHiddenGroups[] = {
-    "colortbl", "datafield", "fonttbl", "listoverridetable", "listtable", "objdata",
-    "pict",     "revtbl",    "rsidtbl", "stylesheet",        "themedata", "xmlnstbl"};
+    "colortbl", "datafield", "fonttbl", "listoverridetable", "listtable", "objdata", "pict",
+    "revtbl",   "rsidtbl",   "shprslt", "stylesheet",        "themedata", "xmlnstbl"};
+
+// What fonts tell by "\fcharset"; the other numbers are no encoding, or the document's.
+struct Charset {
+  int64_t number;
+  const char* encoding;
+};
+constexpr Charset kCharsets[] = {
+    {77, "macintosh"},     {128, "windows-932"},  {129, "windows-949"},  {134, "GB18030"},
+    {136, "windows-950"},  {161, "windows-1253"}, {162, "windows-1254"}, {163, "windows-1258"},
+    {177, "windows-1255"}, {178, "windows-1256"}, {186, "windows-1257"}, {204, "windows-1251"},
+    {222, "windows-874"},  {238, "windows-1250"}, {254, "IBM437"},       {255, "IBM850"},
+};
+// Words that tell the document's encoding.
+struct Encoding {
+  std::string_view word;
+  const char* encoding;
+};
+constexpr Encoding kEncodings[] = {{"mac", "macintosh"}, {"pc", "IBM437"}, {"pca", "IBM850"}};
 
 struct InfoGroup {
   std::string_view word;
@@ -96,8 +117,10 @@ class RtfReader {
  private:
   struct Group {
     bool is_hidden = false;
+    bool is_font_table = false;
     const char* info = nullptr;  // The field that its text goes to.
     unsigned replacements = 1;   // Bytes that stand behind "\u" for those who do not know it.
+    int64_t font = -1;           // -1 for the document's own.
   };
 
   void ReadControl() {
@@ -179,14 +202,28 @@ class RtfReader {
       Unicode(static_cast<uint32_t>(number) & 0xFFFFU);
     } else if (word == "uc") {
       group_.replacements = static_cast<unsigned>(std::clamp<int64_t>(number, 0, 16));
-    } else if (word == "ansicpg" && number > 0) {
-      encoding_ = "windows-" + std::to_string(number);
+    } else if (word == "f" || word == "plain") {
+      FlushBytes();
+      group_.font = word == "f" ? number : -1;
+    } else if (word == "deff") {
+      font_ = number;
+    } else if (group_.is_font_table && (word == "fcharset" || word == "cpg")) {
+      SetFontEncoding(word == "cpg" ? PageEncoding(number) : CharsetEncoding(number));
+    } else if (word == "ansicpg") {
+      const std::string encoding = PageEncoding(number);
+      encoding_ = encoding.empty() ? encoding_ : encoding;
+    } else if (const Encoding* const encoding = Find(kEncodings, word)) {
+      encoding_ = encoding->encoding;
     } else if (word == "bin") {
       at_ += static_cast<size_t>(
           std::clamp<int64_t>(number, 0, static_cast<int64_t>(rtf_.size() - at_)));
     } else if (std::find(std::begin(kHiddenGroups), std::end(kHiddenGroups), word) !=
                std::end(kHiddenGroups)) {
       group_.is_hidden = true;
+      group_.is_font_table = word == "fonttbl";
+    } else if (word == "shptxt") {  // Text in a box, within the hidden group that describes it.
+      group_.is_hidden = false;
+      document_.text.EndLine();
     } else if (const InfoGroup* const info = Find(kInfoGroups, word)) {
       group_.info = in_info_ ? info->field : nullptr;
     } else if (const Symbol* const symbol = Find(kSymbols, word)) {
@@ -195,6 +232,31 @@ class RtfReader {
       in_info_ = true;
       info_depth_ = groups_.size();
     }
+  }
+
+  // The encoding by the number of a code page, or of a font's character set; "" for none.
+  static std::string PageEncoding(int64_t number) {
+    const std::string encoding = FindEncoding("windows-" + std::to_string(number));
+    return encoding.empty() ? FindEncoding("cp" + std::to_string(number)) : encoding;
+  }
+  static std::string CharsetEncoding(int64_t number) {
+    const Charset* const row =
+        std::find_if(std::begin(kCharsets), std::end(kCharsets),
+                     [number](const Charset& charset) { return charset.number == number; });
+    return row == std::end(kCharsets) ? "" : row->encoding;
+  }
+
+  // Of the font that is described.
+  void SetFontEncoding(const std::string& encoding) {
+    if (!encoding.empty() && font_encodings_.size() < kMostFonts) {
+      font_encodings_[group_.font] = encoding;
+    }
+  }
+
+  // Of the bytes at this place. What is told of a document has no font.
+  [[nodiscard]] const std::string& CurrentEncoding() const {
+    const auto font = font_encodings_.find(group_.font < 0 ? font_ : group_.font);
+    return in_info_ || font == font_encodings_.end() ? encoding_ : font->second;
   }
 
   // A UTF-16 unit, and behind it what others show instead.
@@ -216,7 +278,7 @@ class RtfReader {
     Put(utf8);
   }
 
-  // Of the document's own encoding; several may be one character.
+  // Of the encoding at this place; several may be one character.
   void Byte(char c) {
     if (skip_ > 0) {
       --skip_;
@@ -228,7 +290,7 @@ class RtfReader {
   void FlushBytes() {
     if (!bytes_.empty()) {
       const std::string bytes = std::exchange(bytes_, "");
-      const std::optional<std::string> utf8 = Convert(bytes, encoding_);
+      const std::optional<std::string> utf8 = Convert(bytes, CurrentEncoding());
       Put(utf8 ? *utf8 : bytes);
     }
   }
@@ -268,6 +330,8 @@ class RtfReader {
   Group group_;
   std::vector<Group> groups_;  // Those around it.
   std::string encoding_ = "windows-1252";
+  int64_t font_ = 0;
+  std::map<int64_t, std::string> font_encodings_;
   std::string bytes_;
   std::string info_;
   bool in_info_ = false;

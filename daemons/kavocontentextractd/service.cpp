@@ -27,6 +27,8 @@ namespace {
 namespace reason = kavo::local::content_reason;
 
 constexpr unsigned kTries = 2;
+// Until who kills the workers of a file counts as provoked by it: a kernel without memory.
+constexpr unsigned kMostKills = 3;
 constexpr size_t kMaxRequestBytes = size_t{256} << 10;
 // A thread each for a file in work, and some more, so that those that wait for a worker are told in
 // time that there is none.
@@ -144,8 +146,18 @@ std::string Service::Extract(const std::string& path, int file) {
     if (outcome.kind == Pool::Outcome::kNoWorker) {
       return Refusal(reason::kUnavailable, outcome.text);
     }
+    if (outcome.kind == Pool::Outcome::kKilled) {
+      daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                  "killed from outside, path=" + path + ", reason=" + outcome.text);
+      if (quarantine_.CountKill(key) < kMostKills) {
+        return Refusal(reason::kUnavailable, outcome.text);
+      }
+      fault = Fault(reason::kCrash, outcome.text);
+      break;
+    }
     fault = DeathOf(outcome, options_);
     if (!fault) {
+      quarantine_.ForgetKills(key);
       return std::move(outcome.text);
     }
   }

@@ -20,6 +20,8 @@ namespace {
 
 // Hits of a page, for those who only search.
 constexpr size_t kMostShown = 10000;
+// And how long they may make a search take: it keeps a worker, and who would pause the index.
+constexpr std::chrono::seconds kSearchTime(10);
 
 // What a request gives as "data": an empty object where there is none.
 const Json::Value& DataOf(const Json::Value& request) {
@@ -105,7 +107,7 @@ Json::Value Engine::HandleSearch(const Json::Value& request, const JudgePaths& j
     if (PageNumber(data, "from", 0) + PageNumber(data, "size", 0) > kMostShown) {
       throw Failure(Code::kBadRequest, "the page ends behind the hit number 10000");
     }
-    return Search(data, judge);
+    return Search(data, judge, std::chrono::steady_clock::now() + kSearchTime);
   });
 }
 
@@ -167,7 +169,7 @@ Json::Value Engine::Dispatch(const Json::Value& request) {
     return Success();
   }
   if (command == "search") {
-    return Search(data, nullptr);
+    return Search(data, nullptr, std::nullopt);
   }
   if (command == "index_list") {
     return WithData(IndexList());
@@ -475,14 +477,14 @@ Json::Value Engine::IndexList() {
   return list;
 }
 
-Json::Value Engine::Search(const Json::Value& data, const JudgePaths& judge) {
+Json::Value Engine::Search(const Json::Value& data, const JudgePaths& judge,
+                           Connection::Deadline deadline) {
   const SearchRequest request = ParseSearch(data);
   std::vector<std::string> ids;
-  for (const Json::Value& id : data["ids"]) {
-    if (!id.isString()) {
-      throw Failure(Code::kBadRequest, "ids holds something else than texts");
+  for (const std::string& id : request.ids) {
+    if (std::find(ids.begin(), ids.end(), id) == ids.end()) {
+      ids.push_back(id);
     }
-    ids.push_back(id.asString());
   }
   const bool named = !ids.empty();
   if (!named) {
@@ -496,17 +498,19 @@ Json::Value Engine::Search(const Json::Value& data, const JudgePaths& judge) {
   std::vector<std::pair<SearchHit, const std::string*>> hits;
   size_t total = 0;
   bool is_least = false;
-  const size_t shown_from = ids.size() == 1 ? request.from : 0;
+  const Merge merge = ids.size() == 1 ? Merge::kOne : Merge::kSeveral;
+  const size_t shown_from = merge == Merge::kOne ? request.from : 0;
   for (const std::string& id : ids) {
     SearchPage page;
     try {
       WithStore(id, [&](Store& store) {
         store.ReadCommitted([&](Session& session) {
-          page = elasticd::Search(session, request, shown_from, judge);
+          const TimeLimit limit(session.db, deadline);
+          page = elasticd::Search(session, request, merge, shown_from, judge);
         });
       });
     } catch (const Failure& failure) {
-      if (named) {
+      if (named || failure.GetCode() == Code::kTimeIsUp) {
         throw;
       }
       Json::Value& skipped = reply["skipped"].append(Json::objectValue);

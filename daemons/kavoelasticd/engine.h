@@ -45,7 +45,8 @@ class Engine {
   Json::Value Handle(const Json::Value& request);
 
   // The same for somebody who may search and nothing else, and finds what the judge says may be
-  // read: any other command is refused, and so are pages of over 10,000 hits.
+  // read: any other command is refused, and so are pages of over 10,000 hits. Ends with kTimeIsUp
+  // what takes over ten seconds.
   Json::Value HandleSearch(const Json::Value& request, const JudgePaths& judge);
 
   // Commits what was written longer ago than `idle` to any index, and tidies such indexes up in
@@ -82,7 +83,8 @@ class Engine {
   void IndexResume(const Json::Value& data) KAVO_REQUIRES(admin_mutex_);
   void IndexConfigSet(const Json::Value& data) KAVO_REQUIRES(admin_mutex_);
   Json::Value IndexList();
-  Json::Value Search(const Json::Value& data, const JudgePaths& judge);
+  Json::Value Search(const Json::Value& data, const JudgePaths& judge,
+                     Connection::Deadline deadline);
 
   // Calls `use` with the open store. Throws kIndexMissing, kIndexPaused, kIndexDamaged, and what
   // `use` throws.

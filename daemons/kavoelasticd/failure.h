@@ -23,6 +23,7 @@ enum class Code {
   kNoSpace = 2010,          // the disk is full
   kLost = 2011,             // changes since the last commit were rolled back; send them again
   kInternal = 2012,         // a fault of this program
+  kTimeIsUp = 2013,         // it takes longer than the one who asks may make it take
 };
 
 inline constexpr char kNoMemory[] = "there is no memory at present";

@@ -187,7 +187,11 @@ std::vector<Verdict> Judge::Ask(const daemon::Peer& peer, const std::vector<std:
   std::vector<Verdict> verdicts;
   verdicts.reserve(paths.size());
   const kavo::local::MutexLock lock(mutex_);
+  const auto deadline = std::chrono::steady_clock::now() + kPatience;
   for (size_t from = 0; from < paths.size(); from += kPathsAtOnce) {
+    if (std::chrono::steady_clock::now() >= deadline) {
+      throw Failure(Code::kTimeIsUp, "it takes too long to tell who may read what: ask for less");
+    }
     AskSome(peer, paths, from, std::min(kPathsAtOnce, paths.size() - from), verdicts);
   }
   return verdicts;

@@ -35,7 +35,8 @@ class Judge {
   // For each path whether the user may reach it and read it: modes, access control lists and groups
   // of each folder on the way and of the last component count as they do in open(). Nobody's
   // superuser: for uid 0 nothing is readable. Throws Failure kInternal when there is no answer in
-  // ten seconds, as a file system may make it wait. Any thread may call.
+  // ten seconds, as a file system may make it wait, and kTimeIsUp when there is not the whole one.
+  // Any thread may call.
   std::vector<Verdict> Ask(const daemon::Peer& peer, const std::vector<std::string>& paths);
 
  private:

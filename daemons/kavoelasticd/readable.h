@@ -9,6 +9,8 @@
 #include <string>
 #include <vector>
 
+#include "daemons/kavoelasticd/snippet.h"
+
 namespace vexlo::elasticd {
 
 struct SearchPage;
@@ -29,8 +31,11 @@ constexpr size_t kMostJudged = 200000;
 
 // Leaves on the page the hits that may be read, each with its `changed`, and counts them; where
 // there were more than `most` to judge, the rest is left out and the total is the least there is.
-void KeepReadable(Session& session, const SearchRequest& request, const JudgePaths& judge,
-                  SearchPage* page, size_t most = kMostJudged);
+// That a document of another file than the one that was judged is found, and where in the order,
+// tells nothing but what its path does: `wanted`, the words of the request, are all in its name,
+// and it has no size, no date and no score.
+void KeepReadable(Session& session, const SearchRequest& request, const std::vector<Wanted>& wanted,
+                  const JudgePaths& judge, SearchPage* page, size_t most = kMostJudged);
 
 // Whether what stands in the document is of the file that was judged, and not of one that was at
 // its path before. False for a document that does not say of what it is.

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <iterator>
+#include <set>
 #include <unordered_map>
 #include <utility>
 
@@ -18,6 +19,9 @@ namespace {
 [[noreturn]] void Refuse(const std::string& what) { throw Failure(Code::kBadRequest, what); }
 
 constexpr size_t kMaxPage = 100'000'000;
+// Each costs a look at all that it finds, and a word of a phrase as much.
+constexpr size_t kMostTerms = 64;
+constexpr size_t kMostTokens = 1000;
 
 std::string TextMember(const Json::Value& data, const char* name) {
   const Json::Value& value = data[name];
@@ -87,6 +91,28 @@ std::vector<SearchRequest::Term> ParseWords(const std::string& words) {
       term.text.pop_back();
     }
     terms.push_back(std::move(term));
+  }
+  return terms;
+}
+
+// Without what has no word in it, and what stands there before.
+std::vector<SearchRequest::Term> TermsOf(const std::string& words) {
+  std::vector<SearchRequest::Term> terms;
+  std::set<std::pair<std::vector<std::string>, bool>> known;
+  size_t token_count = 0;
+  WordCutter cutter("none");
+  for (SearchRequest::Term& term : ParseWords(words)) {
+    std::vector<std::string> tokens = cutter.QueryTokens(term.text, Cut::kPrefixQuery);
+    const size_t count = tokens.size();
+    term.prefix = term.prefix || IsSingleIdeograph(term.text);
+    if (count > 0 && known.emplace(std::move(tokens), term.prefix).second) {
+      token_count += count;
+      if (terms.size() == kMostTerms || token_count > kMostTokens) {
+        Refuse("words has more than " + std::to_string(kMostTerms) + " different words, or " +
+               std::to_string(kMostTokens) + " with those of its phrases");
+      }
+      terms.push_back(std::move(term));
+    }
   }
   return terms;
 }
@@ -168,15 +194,10 @@ void AddScores(Session& session, const char* sql, const std::string& match, Scor
   }
 }
 
-// How well the documents fit any of the terms: BM25 of the two tables, words of the name counting
-// most. Of `members` only.
+// How well the documents fit the terms: BM25 of the two tables, words of the name counting most. Of
+// `members` only. Term by term, which adds up to the same, as SQLite weighs all that it is asked
+// for at once before it looks at the time.
 Scores Rank(Session& session, const std::vector<SearchRequest::Term>& terms, const Ids& members) {
-  std::string any;
-  for (const SearchRequest::Term& term : terms) {
-    any += any.empty() ? "" : " OR ";
-    any += Phrase(term);
-  }
-  any = "(" + any + ")";
   std::vector<bool> bits(members.empty() ? 0 : static_cast<size_t>(members.back()) + 1);
   for (const int64_t id : members) {
     bits[static_cast<size_t>(id)] = true;
@@ -184,14 +205,17 @@ Scores Rank(Session& session, const std::vector<SearchRequest::Term>& terms, con
   session.db.SetMembers(&bits);
   Scores scores;
   scores.reserve(members.size());
-  if (HasTextColumns(session)) {
-    AddScores(session, "SELECT rowid, bm25(texts) FROM texts WHERE texts MATCH ? AND member(rowid)",
-              TextFilter(session) + any, &scores);
+  for (const SearchRequest::Term& term : terms) {
+    if (HasTextColumns(session)) {
+      AddScores(session,
+                "SELECT rowid, bm25(texts) FROM texts WHERE texts MATCH ? AND member(rowid)",
+                TextFilter(session) + Phrase(term), &scores);
+    }
+    AddScores(session,
+              "SELECT rowid, bm25(words, 10.0, 3.0, 0.0) FROM words WHERE words MATCH ?"
+              " AND member(rowid)",
+              "{name rest} : " + Phrase(term), &scores);
   }
-  AddScores(session,
-            "SELECT rowid, bm25(words, 10.0, 3.0, 0.0) FROM words WHERE words MATCH ?"
-            " AND member(rowid)",
-            "{name rest} : " + any, &scores);
   session.db.SetMembers(nullptr);
   return scores;
 }
@@ -390,8 +414,8 @@ void Show(Session& session, const SearchRequest& request, const Selection& selec
     return;
   }
   hit->path = document->path;
-  const bool shows_text = !is_judged || IsOfFile(session, *document, hit->changed);
-  hit->shown = shows_text ? session.Fields(&*document, selection) : Json::Value(Json::objectValue);
+  const bool is_told = !is_judged || IsOfFile(session, *document, hit->changed);
+  hit->shown = is_told ? session.Fields(&*document, selection) : Json::Value(Json::objectValue);
   hit->shown["path"] = document->path;
   if (!is_judged) {  // How often a word stands in others' files shows in it.
     hit->shown["score"] = hit->score;
@@ -402,11 +426,31 @@ void Show(Session& session, const SearchRequest& request, const Selection& selec
     return item != nullptr ? JsonOf(*item, document->path) : Json::Value();
   };
   hit->shown["name"] = Basename(document->path);
-  hit->shown["size"] = number(kSizeField);
-  hit->shown["modified"] = number(kModifiedField);
+  if (is_told) {
+    hit->shown["size"] = number(kSizeField);
+    hit->shown["modified"] = number(kModifiedField);
+  }
   hit->shown["is_dir"] = number(kIsDirField).isBool() && number(kIsDirField).asBool();
-  if (request.snippet && shows_text) {
+  if (request.snippet && is_told) {
     hit->shown["snippet"] = SnippetOf(session, &*document, wanted);
+  }
+}
+
+// Which of the hits that fit equally well are among the first `count` is the same for every page of
+// several indexes when their paths decide, as they do between the indexes.
+void AddPathsAtCut(Session& session, const SearchRequest& request, size_t count,
+                   std::vector<SearchHit>* hits) {
+  if (request.order != Order::kRelevance || count == 0 || count >= hits->size()) {
+    return;
+  }
+  const auto last = hits->begin() + static_cast<std::ptrdiff_t>(count - 1);
+  std::nth_element(hits->begin(), last, hits->end(),
+                   [](const SearchHit& a, const SearchHit& b) { return a.score > b.score; });
+  const double score = last->score;
+  for (SearchHit& hit : *hits) {
+    if (hit.score == score) {
+      AddPath(session, &hit);
+    }
   }
 }
 
@@ -431,14 +475,9 @@ size_t PageNumber(const Json::Value& object, const char* name, size_t otherwise)
 
 SearchRequest ParseSearch(const Json::Value& data) {
   SearchRequest request;
+  request.ids = ListMember(data, "ids");
   const std::string words = TextMember(data, "words");
-  WordCutter cutter("none");
-  for (SearchRequest::Term& term : ParseWords(words)) {
-    if (!cutter.QueryTokens(term.text, Cut::kPrefixQuery).empty()) {
-      term.prefix = term.prefix || IsSingleIdeograph(term.text);
-      request.terms.push_back(std::move(term));
-    }
-  }
+  request.terms = TermsOf(words);
   request.only_noise = request.terms.empty() && !Trim(words).empty();
   request.name = TextMember(data, "name");
   request.below = TextMember(data, "below");
@@ -477,7 +516,16 @@ bool ComesBefore(const SearchRequest& request, const SearchHit& a, const SearchH
   return request.descending && request.order != Order::kRelevance ? order > 0 : order < 0;
 }
 
-SearchPage Search(Session& session, const SearchRequest& request, size_t shown_from,
+void AddPath(Session& session, SearchHit* hit) {
+  if (hit->path.empty()) {
+    Sql row(session.db, "SELECT path FROM docs WHERE id = ?");
+    if (row.Int(hit->id).Row()) {
+      hit->path = row.BytesAt(0);
+    }
+  }
+}
+
+SearchPage Search(Session& session, const SearchRequest& request, Merge merge, size_t shown_from,
                   const JudgePaths& judge) {
   if (request.only_noise) {
     return {};
@@ -485,10 +533,14 @@ SearchPage Search(Session& session, const SearchRequest& request, size_t shown_f
   SearchPage page;
   page.hits = FindHits(session, request);
   page.total = page.hits.size();
+  const std::vector<Wanted> wanted = WantedOf(session, request);
   if (judge) {
-    KeepReadable(session, request, judge, &page);
+    KeepReadable(session, request, wanted, judge, &page);
   }
   const size_t count = std::min(page.hits.size(), request.from + request.count);
+  if (merge == Merge::kSeveral) {
+    AddPathsAtCut(session, request, count, &page.hits);
+  }
   std::partial_sort(
       page.hits.begin(), page.hits.begin() + static_cast<std::ptrdiff_t>(count), page.hits.end(),
       [&](const SearchHit& a, const SearchHit& b) { return ComesBefore(request, a, b); });
@@ -497,7 +549,6 @@ SearchPage Search(Session& session, const SearchRequest& request, size_t shown_f
   if (request.load_fields.empty()) {
     selection = {/*key=*/false, /*all=*/false};
   }
-  const std::vector<Wanted> wanted = WantedOf(session, request);
   for (size_t i = shown_from; i < count; ++i) {
     Show(session, request, selection, wanted, /*is_judged=*/judge != nullptr, &page.hits[i]);
   }

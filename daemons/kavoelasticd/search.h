@@ -29,6 +29,7 @@ struct SearchRequest {
     std::string text;
     bool prefix = false;
   };
+  std::vector<std::string> ids;    // Indexes, all without any.
   std::vector<Term> terms;         // All must be found.
   bool only_noise = false;         // There were words, but nothing in them to look for.
   std::string name;                // Part of the file name.
@@ -64,11 +65,18 @@ struct SearchPage {
 // Throws Failure kBadRequest.
 SearchRequest ParseSearch(const Json::Value& data);
 
+// The indexes whose pages the caller puts together.
+enum class Merge { kOne, kSeveral };
+
 // Searches one index. `shown` is filled from the hit number `shown_from` on. The session is to be
 // in a transaction, or parts of the answer may be of different moments. With a judge only what may
-// be read is found, and nothing of its text is shown when the file at its path is another by now.
-SearchPage Search(Session& session, const SearchRequest& request, size_t shown_from,
+// be read is found; of a document whose file is another by now, only its path is looked at and
+// shown.
+SearchPage Search(Session& session, const SearchRequest& request, Merge merge, size_t shown_from,
                   const JudgePaths& judge = nullptr);
+
+// Reads the path where the hit has none yet: some orders do without.
+void AddPath(Session& session, SearchHit* hit);
 
 // Whether `a` comes before `b` in the order asked for.
 bool ComesBefore(const SearchRequest& request, const SearchHit& a, const SearchHit& b);

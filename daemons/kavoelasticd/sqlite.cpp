@@ -10,6 +10,7 @@ namespace vexlo::elasticd {
 namespace {
 
 constexpr int kBusyMilliseconds = 10000;
+constexpr int kStepsBetweenLooks = 1000;  // Some hundredths of a millisecond.
 
 Code CodeOf(int result) {
   switch (result & 0xFF) {
@@ -28,6 +29,11 @@ void Member(sqlite3_context* context, int /*count*/, sqlite3_value** arguments) 
       *static_cast<const std::vector<bool>* const*>(sqlite3_user_data(context));
   const auto id = static_cast<uint64_t>(sqlite3_value_int64(arguments[0]));
   sqlite3_result_int(context, members != nullptr && id < members->size() && (*members)[id] ? 1 : 0);
+}
+
+int IsBehind(void* deadline) {
+  const auto& moment = *static_cast<const Connection::Deadline*>(deadline);
+  return moment && std::chrono::steady_clock::now() >= *moment ? 1 : 0;
 }
 
 }  // namespace
@@ -77,7 +83,19 @@ Connection::Connection(const std::string& path, Use use)
 
 Connection::~Connection() = default;
 
+bool Connection::IsTimeUp() const {
+  return deadline_ && std::chrono::steady_clock::now() >= *deadline_;
+}
+
+void Connection::CheckTime() const {
+  if (IsTimeUp()) {
+    throw Failure(Code::kTimeIsUp, "this takes too long: ask for less, or for longer words");
+  }
+}
+
+// What SQLite makes of an end in its midst is none of its results: it may call it damage.
 void Connection::Fail(int result, std::string_view sql) const {
+  CheckTime();
   throw SqlError(result, std::string(sqlite3_errmsg(db_.get())) + ", sql=" + std::string(sql));
 }
 
@@ -92,12 +110,24 @@ bool Connection::InTransaction() const { return sqlite3_get_autocommit(db_.get()
 int64_t Connection::LastInsertId() const { return sqlite3_last_insert_rowid(db_.get()); }
 int64_t Connection::TotalChanges() const { return sqlite3_total_changes64(db_.get()); }
 
+TimeLimit::TimeLimit(Connection& db, Connection::Deadline deadline) : db_(db) {
+  db_.deadline_ = deadline;
+  sqlite3_progress_handler(db_.db_.get(), deadline ? kStepsBetweenLooks : 0, IsBehind,
+                           &db_.deadline_);
+}
+
+TimeLimit::~TimeLimit() {
+  sqlite3_progress_handler(db_.db_.get(), 0, nullptr, nullptr);
+  db_.deadline_.reset();
+}
+
 Connection::Idle::value_type& Connection::IdleOf(std::string_view sql) {
   const auto found = idle_.find(sql);
   return found != idle_.end() ? *found : *idle_.try_emplace(std::string(sql)).first;
 }
 
 Sql::Sql(Connection& db, std::string_view sql) : db_(db), kept_(db.IdleOf(sql)) {
+  db.CheckTime();
   std::vector<StatementPtr>& idle = kept_.second;
   if (!idle.empty()) {
     statement_ = std::move(idle.back());

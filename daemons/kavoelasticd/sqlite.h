@@ -3,10 +3,12 @@
 #ifndef DAEMONS_KAVOELASTICD_SQLITE_H_
 #define DAEMONS_KAVOELASTICD_SQLITE_H_
 
+#include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -44,6 +46,8 @@ using StatementPtr = std::unique_ptr<sqlite3_stmt, StatementDelete>;
 
 class Connection {
  public:
+  using Deadline = std::optional<std::chrono::steady_clock::time_point>;
+
   // Opens an existing database, or makes one with `create`. A connection that is not to write
   // refuses to. Throws SqlError.
   enum class Use { kCreate, kWrite, kRead };
@@ -63,6 +67,9 @@ class Connection {
 
  private:
   friend class Sql;
+  friend class TimeLimit;
+  bool IsTimeUp() const;
+  void CheckTime() const;
   [[noreturn]] void Fail(int result, std::string_view sql) const;
 
   struct TextHash {
@@ -74,14 +81,29 @@ class Connection {
       std::unordered_map<std::string, std::vector<StatementPtr>, TextHash, std::equal_to<>>;
   Idle::value_type& IdleOf(std::string_view sql);
 
+  Deadline deadline_;                                  // Its address is known to SQLite.
   std::unique_ptr<const std::vector<bool>*> members_;  // Its address is known to SQLite.
   std::unique_ptr<sqlite3, ConnectionDelete> db_;
   Idle idle_;
 };
 
+// As long as it lives, statements of the connection that begin behind the deadline, or are under
+// way then, throw Failure kTimeIsUp. A transaction goes on.
+class TimeLimit {
+ public:
+  TimeLimit(Connection& db, Connection::Deadline deadline);
+  ~TimeLimit();
+  TimeLimit(const TimeLimit&) = delete;
+  TimeLimit& operator=(const TimeLimit&) = delete;
+
+ private:
+  Connection& db_;
+};
+
 // One use of a statement, from binding to the last row; the connection keeps the statement for the
 // next use. Parameters are numbered by the order of the calls. Bound texts and blobs, and those
-// that columns give, must not, and do not, outlive the use and the row. All throw SqlError.
+// that columns give, must not, and do not, outlive the use and the row. All throw SqlError, and
+// kTimeIsUp as TimeLimit has it.
 class Sql {
  public:
   Sql(Connection& db, std::string_view sql);

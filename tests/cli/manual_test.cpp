@@ -80,15 +80,19 @@ TEST(ManualTest, ShellsComplete) {
       {"search --sort so", ""},
   };
   const std::string fish = "source fileindex.fish; complete -C ";
+  const auto in_bash = [&folder](const std::string& words) {
+    return Output("cd " + folder.Path() +
+                  " && PATH=.:$PATH bash -c 'compopt() { :; }; . ./fileindex.bash; "
+                  "COMP_WORDS=(fileindex " +
+                  words +
+                  "); COMP_CWORD=$((${#COMP_WORDS[@]} - 1)); "
+                  "_fileindex; echo -n \"${COMPREPLY[*]}\"'");
+  };
+  std::ofstream(folder.Path() + "/fileindex") << R"(echo '{"name":"my share"}{"x":1}')";
+  Output("chmod +x " + folder.Path() + "/fileindex");
+  EXPECT_EQ(in_bash("index create m"), "my\\ share");
   for (const auto& [words, want] : cases) {
-    EXPECT_EQ(Output("cd " + folder.Path() +
-                     " && bash -c 'compopt() { :; }; . ./fileindex.bash; "
-                     "COMP_WORDS=(fileindex " +
-                     words +
-                     "); COMP_CWORD=$((${#COMP_WORDS[@]} - 1)); "
-                     "_fileindex; echo -n \"${COMPREPLY[*]}\"'"),
-              want)
-        << words;
+    EXPECT_EQ(in_bash(words), want) << words;
     if (IsInstalled("fish")) {
       const std::string output =
           Output("cd " + folder.Path() + " && HOME=$PWD fish --no-config -c '" + fish +

@@ -42,14 +42,17 @@ TEST_F(RunDaemonTest, EndsWithTheStatusThatSaysWhy) {
     const char* arguments;
     int status;
     std::string says;
+    const char* settings = "";
   } cases[] = {
       {"Usage", "--nope", kUsage, "usage: kavoelasticd [throw|stuck]\n"},
       {"WorkThrows", "throw", kFailed, "failed: as asked\n"},
       {"WorkIsStuck", "stuck", kFailed, "ended at once: as asked\n"},
+      {"RelativeRoot", "", kFailed,
+       "FILEINDEX_ROOT in the environment is no absolute path: 'var'\n", " FILEINDEX_ROOT=var"},
   };
   for (const auto& row : cases) {
     SCOPED_TRACE(row.name);
-    Program program = Start(row.arguments);
+    Program program = Start(row.arguments, row.settings);
     EXPECT_EQ(program.End(), row.status);
     EXPECT_NE(program.text.find(row.says), std::string::npos) << program.text;
   }

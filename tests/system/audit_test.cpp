@@ -345,14 +345,14 @@ TEST_F(AuditTest, TheDoctorFindsWhatIsWrongAndSaysWhatHelps) {
       "state":"degraded","watches":100000000}]})"});
   expect({"warning  shares: indexing is paused without an end" + remedy + "fileindex resume\n",
           "warning  kavoelasticd: the index of 'docs' is paused, so it is not searched" + remedy +
-              "fileindex index resume 'docs'\n",
-          "warning  shares: 'docs' is marked for a reindex", "$ fileindex folder reindex '/docs'\n",
+              "fileindex index resume docs\n",
+          "warning  shares: 'docs' is marked for a reindex", "$ fileindex folder reindex /docs\n",
           "error    fileindexd: does not run, so changes wait in the queues",
           "folders: .[1]: there is no share 'films' for '/films/x'" + remedy +
               "fileindex folder prune\n",
           "warning  evnotifyd: not all changes are seen at once for /q: 4 watches are needed",
           "error    evnotifyd: nobody watches the indexed folder '" + In() + "'" + remedy +
-              "fileindex folder set '",
+              "fileindex folder set /",
           "warning  inotify: 100,000,000 folders are watched of ",
           remedy + "sudo sysctl fs.inotify.max_user_watches=200016384\n",
           "warning  inotify: events were lost 2 times"});
@@ -365,14 +365,14 @@ TEST_F(AuditTest, TheDoctorFindsWhatIsWrongAndSaysWhatHelps) {
   chmod(lock.c_str(), 0);
   expect({"warning  clock: 1 file is dated in the future", remedy + "touch -c 'it'\\''s'\n",
           "error    state: '" + locks + "' cannot be written: Permission denied" + remedy +
-              "chmod u+rwx '" + locks + "'\n",
-          "error    state: the lock file '", remedy + "sudo chmod a+r '"});
+              "chmod u+rwx " + locks + "\n",
+          "error    state: the lock file '", remedy + "sudo chmod a+r /"});
   chmod(locks.c_str(), 0700);
   chmod(lock.c_str(), 0600);
 
   End("kavoelasticd", SIGTERM);
   expect({"error    kavoelasticd: does not run, so nothing is searched or indexed",
-          remedy + "'" KAVOELASTICD_PROGRAM "' &\n"});
+          remedy + KAVOELASTICD_PROGRAM " &\n"});
 }
 
 }  // namespace

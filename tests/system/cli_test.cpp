@@ -57,7 +57,8 @@ const CliCase kCases[] = {
 
 // With faults in the folders file and the status file.
 const CliCase kBadConfigCases[] = {
-    {"Check", "config check", 1, "*folders: .[3]: 'photo' is no share path", "6 findings"},
+    {"Check", "config check", 1, "*folders: .[3]: 'photo' is no share path", "7 findings"},
+    {"CheckPlace", "config check", 1, "*.share.\"my photo\"", ""},
     {"CheckJson", "config check --json", 1, "*.status\",\"place\":\".share.photo\"", ""},
     {"Pending", "queue pending /v --queue queue", 3, "", "'fileindex config check' says"},
 };
@@ -75,6 +76,8 @@ const CliCase kEngineCases[] = {
     {"List", "index list", 0, "*fileindex_docs  active  /", ""},
     {"Put", "doc put docs vol/docs/a.txt", 0, "*indexed: /", ""},
     {"PutBySharePath", "doc put docs '/docs/Caf\xC3\xA9 \xE9.md'", 0, "*indexed: /", ""},
+    {"PutByLink", "doc put docs link/a.txt", 0, "*vol/docs/a.txt\n", ""},
+    {"PutOutside", "doc put docs vol/other.txt", 3, "", "does not lie in the share 'docs'"},
     {"PutFolder", "doc put docs vol/docs", 0, "*indexed: /", ""},
     {"Get", "doc get docs /docs/a.txt", 0, "*\"KAVOMDExtension\" : \"txt\"", ""},
     {"GetMissing", "doc get docs /docs/none", 1, "", "not in the index"},
@@ -83,7 +86,10 @@ const CliCase kEngineCases[] = {
     {"SearchJson", "search museum --json", 0, "*\"snippet\":\"", ""},
     {"SearchFilesOnly", "search --type document --below vol --newer 1d --larger 5 --sort -size", 0,
      "*a.txt\n", ""},
+    {"SearchBelowLink", "search museum --below link", 0, "*vol/docs/a.txt\n", ""},
     {"SearchNothing", "search", 2, "", "wants words"},
+    {"SearchTwice", "search x --share docs --share no", 2, "", "--share was given more than once"},
+    {"SearchBadDate", "search x --newer 2026-02-31", 2, "", "'2026-02-31' is no date"},
     {"SearchBadSize", "search x --larger 5q", 2, "", "'5q' is no size"},
     {"Pause", "index pause docs", 0, "paused: the index of docs\n", ""},
     {"SearchPaused", "search museum", 1, "", "not searched: fileindex_docs"},
@@ -104,6 +110,9 @@ const CliCase kFolderCases[] = {
     {"AddBelow", "folder add vol/docs/in", 0, "added: /docs/in (document,audio,video,photo)\n",
      "fileindexd does not run"},
     {"AddRefused", "folder add vol/docs/.git", 3, "", "/docs/.git cannot be indexed"},
+    {"AddNoType", "folder add vol/@eaDir --types fotos", 2, "", "'fotos' is no type"},
+    {"AddRefusedShare", "folder add vol/@eaDir", 3, "", "'@eaDir' was taken out again"},
+    {"NoShareIsLeft", "share remove @eaDir", 3, "", "@eaDir"},
     {"List", "folder list --sort -path", 0,
      "PATH      NAME     GROUP  TYPES                       STATUS\n"
      "/docs/in  in              document,audio,video,photo  finished\n"
@@ -111,6 +120,7 @@ const CliCase kFolderCases[] = {
      "2 folders of 2"},
     {"ListJson", "folder list --json --find MY --limit 1", 0, "*\"offset\":0,\"total\":1}", ""},
     {"Get", "folder get vol/docs/", 0, "*types  document\n", ""},
+    {"GetByLink", "folder get link/in", 0, "*/docs/in", ""},
     {"GetOutside", "folder get vol", 3, "", "'vol' lies in no share"},
     {"Groups", "folder groups", 0, "work\n", ""},
     {"Set", "folder set /docs --types none --group ''", 0, "changed: /docs (none)\n", ""},
@@ -120,6 +130,7 @@ const CliCase kFolderCases[] = {
     {"Summary", "summary", 0, "in       finished\nMy docs  processing\nin all   processing\n", ""},
     {"Delete", "folder delete vol/docs/in", 0, "deleted: /docs/in\n", ""},
     {"LoseTheIndex", "index delete docs", 0, "*deleted", ""},
+    {"DeleteNothing", "folder delete", 2, "", "wants FOLDER"},
     {"DeleteLast", "folder delete --share docs", 0, "deleted: /docs\n", ""},
     {"NoIndex", "index list", 1, "", ""},
     {"AddBack", "folder add vol/docs", 0, "*added", ""},
@@ -127,6 +138,16 @@ const CliCase kFolderCases[] = {
     {"ListOfGoneShare", "folder list", 3, "", "is gone; 'fileindex folder prune'"},
     {"Prune", "folder prune", 0, "pruned: /docs\n", ""},
     {"IndexPruned", "index list", 1, "", ""},
+};
+
+// With everything running, and the shares docs and two.
+const CliCase kRunningCases[] = {
+    {"Ready", "health --ready", 0, "healthy\n", ""},
+    {"PauseIndex", "index pause two", 0, "*paused", ""},
+    {"PausedIndex", "health --ready", 1, "the index of the share two is paused\n", ""},
+    {"ResumeIndex", "index resume two", 0, "*resumed", ""},
+    {"DeleteIndex", "index delete two", 0, "*deleted", ""},
+    {"MissingIndex", "health --ready", 1, "the share two has no index\n", ""},
 };
 
 class Cli : public testing::Test {
@@ -187,11 +208,17 @@ TEST_F(Cli, AnswersEveryCommandLine) {
   WriteText(files_ / "vol/photo/note.txt", "The harbour\nis closed");
   WriteText(files_ / "vol/photo/note.pdf", "%PDF");
   Check(kCases);
+  Program astray = Start("env FILEINDEX_ROOT=root " FILEINDEX_PROGRAM " share list");
+  EXPECT_EQ(astray.End(), 3) << "a root that is not absolute: " << astray.text;
+  for (const char* const words : {"--help", "--version", "search --help"}) {
+    Program full = Start("sh -c '" FILEINDEX_PROGRAM " " + std::string(words) + " >/dev/full'");
+    EXPECT_EQ(full.End(), 3) << words;
+  }
   const std::string rest = R"(,"name":"","document":true,"audio":true,"video":true,"photo":true)";
   WriteText(etc + "/fileindex.folders",
             R"([{"path":"/photo")" + rest + R"(,"owner":{}},{"path":"/photo")" + rest +
                 R"(},{"path":"/gone")" + rest + R"(},{"path":"photo")" + rest + "},{}]");
-  WriteText(etc + "/fileindex.status", R"({"share": {"photo": "1"}})");
+  WriteText(etc + "/fileindex.status", R"({"share": {"photo": "1", "my photo": 1}})");
   Check(kBadConfigCases);
   WriteText(etc + "/fileindex.folders", "[\n{");
   WriteText(files_ / "root/etc/kavo/shares.json", "{\"shares\": [\n{\"name\": \"a\"}]}");
@@ -200,6 +227,8 @@ TEST_F(Cli, AnswersEveryCommandLine) {
 
 TEST_F(Cli, SearchesWhatItHasIndexed) {
   MakeFolders({"vol/docs"});
+  std::filesystem::create_symlink("vol/docs", files_ / "link");
+  WriteText(files_ / "vol/other.txt", "");
   WriteText(files_ / "vol/docs/a.txt", "The harbour museum.");
   WriteText(files_ / "vol/docs/Caf\xC3\xA9 \xE9.md", "apples");
   const CliCase without[] = {{"NoEngine", "search museum", 3, "", "kavoelasticd does not run"}};
@@ -210,11 +239,39 @@ TEST_F(Cli, SearchesWhatItHasIndexed) {
 }
 
 TEST_F(Cli, AdministersFolders) {
-  MakeFolders({"vol/docs/in", "vol/docs/.git", "root/var/packages/Vexlo/etc", "root/tmp",
-               "root/var/lib/kavo/fileindex/queue", "root/var/run"});
+  MakeFolders({"vol/docs/in", "vol/docs/.git", "vol/@eaDir", "root/var/packages/Vexlo/etc",
+               "root/tmp", "root/var/lib/kavo/fileindex/queue", "root/var/run"});
   WriteText(files_ / "root/var/run/fileindexd.sock", "");
+  std::filesystem::create_symlink("vol/docs", files_ / "link");
   CheckWithEngine(kFolderCases);
   EXPECT_EQ(ReadText(files_ / "root/var/lib/kavo/evnotify/fileindex.json"), "{\"queues\": [\n]}\n");
+}
+
+TEST_F(Cli, UpTakesOverTheDaemonsOfAnotherThatEnds) {
+  MakeFolders({"vol/docs", "vol/two"});
+  Program first = Start(FILEINDEX_PROGRAM " up vol/docs");
+  EXPECT_TRUE(first.Await("following")) << first.text;
+  Program second = Start(FILEINDEX_PROGRAM " up vol/two");
+  EXPECT_TRUE(second.Await("following")) << second.text;
+  EXPECT_EQ(first.End(SIGINT), 0) << first.text;
+  EXPECT_TRUE(second.Await("evnotifyd runs no longer, and is started")) << second.text;
+  WriteText(files_ / "vol/docs/a.txt", "harbour");
+  Program search = Start("sh -c 'until " FILEINDEX_PROGRAM " search harbour; do sleep .1; done'");
+  EXPECT_TRUE(search.Await("vol/docs/a.txt\n")) << second.text;
+  EXPECT_EQ(search.End(), 0);
+  Check(kRunningCases);
+  Program unwatched = Start("sh -c 'rm root/var/lib/kavo/evnotify/*.json; until " FILEINDEX_PROGRAM
+                            " health --ready | grep watches; do sleep .1; done'");
+  EXPECT_TRUE(unwatched.Await("nobody watches the share docs\n"));
+  EXPECT_EQ(unwatched.End(), 0);
+  EXPECT_EQ(second.End(SIGINT), 0) << second.text;
+  const CliCase pause[] = {{"Pause", "pause", 0, "*is paused", "will go by the status file"}};
+  Check(pause);
+  Program paused = Start(FILEINDEX_PROGRAM " up");
+  EXPECT_TRUE(paused.Await("docs: indexing is paused; 'fileindex resume' goes on\n"));
+  EXPECT_TRUE(paused.Await("following"));
+  EXPECT_EQ(paused.text.find("everything can be found"), std::string::npos) << paused.text;
+  EXPECT_EQ(paused.End(SIGINT), 0);
 }
 
 TEST_F(Cli, WatchDeliversWhatAnEarlierRunLeftAndThenWhatHappens) {

@@ -125,14 +125,26 @@ TEST(Rights, OthersFindWhatTheyMayReadAndDoNothingElse) {
   }
   const std::string counted = hear(0, "kavoelasticd", R"({"command":"stats"})");
   EXPECT_NE(counted.find(R"("errors":{"2000":1})"), std::string::npos) << counted;  // The last.
-  const auto tool = [&] {
-    Program program("cd /", std::string(FILEINDEX_PROGRAM) + " search lighthouse 2>&1");
-    const int status = program.End();
-    return program.text + std::to_string(status);
+  const auto tool = [&](const std::string& arguments) {
+    return HearAs(kSomebody + 10, [&arguments] {
+      Program program("cd /", FILEINDEX_PROGRAM " " + arguments + " 2>&1");
+      const int status = program.End();
+      return program.text + std::to_string(status);
+    });
   };
   const auto reaches_tool = [] { return access(FILEINDEX_PROGRAM, X_OK) == 0 ? "yes" : "no"; };
   if (HearAs(kSomebody + 10, reaches_tool) == "yes") {
-    EXPECT_EQ(HearAs(kSomebody + 10, tool), stack.In() + "/open.txt\n0");
+    EXPECT_EQ(tool("search lighthouse --limit 20000"), stack.In() + "/open.txt\n0");
+    // What runs is not said to be down, and no probe has it started again.
+    for (const char* const arguments : {"status", "status --all", "index list", "health"}) {
+      const std::string told = tool(arguments);
+      EXPECT_NE(told.find("closed to this user"), std::string::npos) << told;
+      EXPECT_EQ(told.find("does not"), std::string::npos) << told;
+    }
+    EXPECT_EQ(tool("health").back(), '3');
+    EXPECT_EQ(stack.Tool("resume"), 0);
+    EXPECT_NE(tool("resume").find("not the rights for it; root has (error 503)"),
+              std::string::npos);
   }
 }
 

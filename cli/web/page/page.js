@@ -526,7 +526,7 @@ let isPaused = false;
 function showStatus(status) {
   const until = Number(status.resume_time);
   isPaused = until === 0 || until * 1000 > Date.now();
-  const silent = (status.daemons || []).filter((daemon) => !daemon.running).map((daemon) => daemon.name);
+  const silent = (status.daemons || []).filter((daemon) => daemon.running === false).map((daemon) => daemon.name);
   const text = isPaused ? (until === 0 ? 'Indexing is paused.' : `Indexing is paused until ${timeText(until)}.`) :
       status.status === 'finished' ? 'Everything can be found.' : 'Changes are being indexed.';
   const state = byId('state');
@@ -541,7 +541,8 @@ function showStatus(status) {
   replaceList(byId('shares'), (status.shares || []).map(makeShare));
   replaceList(byId('daemons'), (status.daemons || []).map((daemon) =>
       make('li', '', make('span', '', daemon.name + ' '),
-          make('span', daemon.running ? 'good' : 'bad', daemon.running ? 'runs' : 'does not answer'))));
+          daemon.running === null ? make('span', '', 'is closed to you') :
+              make('span', daemon.running ? 'good' : 'bad', daemon.running ? 'runs' : 'does not answer'))));
 }
 
 async function changePause() {

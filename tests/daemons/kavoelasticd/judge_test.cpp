@@ -31,7 +31,8 @@ class JudgeTest : public testing::Test {
     ASSERT_EQ(chmod(tree_.Path().c_str(), 0755), 0);
   }
 
-  // A file or folder with a document that has the word "common", and a text of its own.
+  // A file or folder with a document that has the word "common", and a text of its own. Each is
+  // smaller and older than the ones before.
   void Index(const std::string& path) {
     struct stat info {};
     ASSERT_EQ(lstat(path.c_str(), &info), 0);
@@ -39,8 +40,11 @@ class JudgeTest : public testing::Test {
         static_cast<int64_t>(info.st_ctim.tv_sec) * 1000000000 + info.st_ctim.tv_nsec;
     ASSERT_EQ(
         engine_.Add(path, R"({"Free":"common text of )" + path + R"(","FileIndexStamp":{"ctime":)" +
-                              std::to_string(changed) + "}}"),
+                              std::to_string(changed) +
+                              "},\"KAVOMDFSSize\":" + std::to_string(rank_) +
+                              ",\"KAVOMDFSContentChangeDate\":" + std::to_string(rank_) + "}"),
         "ok");
+    --rank_;
   }
   Json::Value SearchAs(const daemon::Peer& peer, const std::string& data) {
     engine_.Do("commit");
@@ -54,6 +58,7 @@ class JudgeTest : public testing::Test {
   Judge judge_;  // Before anything starts threads.
   const TempFolder tree_;
   EngineFixture engine_;
+  int rank_ = 40;
 };
 
 // The paths that a process of the user can open for reading.
@@ -153,9 +158,11 @@ TEST_F(JudgeTest, FindsWhatTheUserCanRead) {
 
 TEST_F(JudgeTest, TellsNothingOfAFileThatStoodThereBefore) {
   const daemon::Peer peer = User(kFirstUser);
-  const std::string path = tree_ / "note";
+  const std::string path = tree_ / "tiger note";
   WriteText(path, "");
   Index(path);
+  WriteText(tree_ / "zebra", "");
+  Index(tree_ / "zebra");
   const std::string data = R"({"words":"common","snippet":true,"load_field":["Free"]})";
   const Json::Value own = SearchAs(peer, data)["data"][0];
   EXPECT_NE(own["snippet"].asString(), "");
@@ -164,9 +171,40 @@ TEST_F(JudgeTest, TellsNothingOfAFileThatStoodThereBefore) {
   // Somebody's file under the name of another's, which is in the index still.
   WriteText(tree_ / "other", "");
   std::filesystem::rename(tree_ / "other", path);
-  const Json::Value stale = SearchAs(peer, data)["data"][0];
-  EXPECT_EQ(stale["path"], path);
-  EXPECT_FALSE(stale.isMember("snippet") || stale.isMember("Free")) << stale;
+  const struct {
+    const char* data;
+    bool is_found;
+  } rows[] = {
+      {R"({"words":"common"})", false},
+      {R"({"words":"tiger text"})", false},
+      {R"({"words":"\"text of\""})", false},
+      {R"({"words":"comm*"})", false},
+      {R"({"words":"40","size":5})", false},
+      {R"({"name":"tiger","size_min":40})", false},
+      {R"({"name":"tiger","modified_max":50})", false},
+      {R"({"words":"tiger not*"})", true},
+      {R"({"words":"\"tiger note\"","name":"note","snippet":true,"load_field":["Free"]})", true},
+      {R"({"name":"tiger"})", true},
+      {R"({})", true},
+      // Before or behind what has a size and a date, whatever its own were.
+      {R"({"sort":"size"})", true},
+      {R"({"sort":"modified"})", true},
+  };
+  for (const auto& row : rows) {
+    const Json::Value reply = SearchAs(peer, row.data);
+    Json::Value stale;
+    for (const Json::Value& hit : reply["data"]) {
+      stale = hit["path"] == path ? hit : stale;
+    }
+    EXPECT_EQ(!stale.isNull(), row.is_found) << row.data << reply;
+    for (const char* const member : {"snippet", "Free", "size", "modified"}) {
+      EXPECT_FALSE(stale.isMember(member)) << row.data << stale;
+    }
+    EXPECT_EQ(reply["data"].size(), reply["total"].asUInt()) << row.data;
+  }
+  for (const char* const sort : {"size", "modified"}) {
+    EXPECT_EQ(SearchAs(peer, R"({"sort":")" + std::string(sort) + "\"}")["data"][0]["path"], path);
+  }
 }
 
 TEST_F(JudgeTest, AnswersSearchesAloneAndNotEndlessOnes) {

@@ -4,6 +4,7 @@
 
 #include "daemons/kavoelasticd/engine_fixture.h"
 
+namespace vexlo::elasticd {
 namespace {
 
 struct SearchCase {
@@ -11,6 +12,23 @@ struct SearchCase {
   std::string data;
   std::string want;  // Paths in the order of the reply, or a code.
 };
+
+std::string Again(const std::string& text, int count) {
+  std::string all;
+  for (int i = 0; i < count; ++i) {
+    all += text;
+  }
+  return all;
+}
+
+std::string Numbers(int count) {
+  std::string numbers;
+  for (int i = 0; i < count; ++i) {
+    numbers += std::to_string(i);
+    numbers += ' ';
+  }
+  return numbers;
+}
 
 TEST(Search, FindsWordsNamesAndWhatTheFiltersLeave) {
   EngineFixture engine;
@@ -46,6 +64,7 @@ TEST(Search, FindsWordsNamesAndWhatTheFiltersLeave) {
       {"Sizes", R"({"size_min":101,"size_max":300,"sort":"size","descending":true})",
        "/v/ab/notes.md /v/a/fox.JPG"},
       {"Dates", R"({"modified_max":2000,"sort":"modified"})", "/v/a/report.txt /v/ab/notes.md"},
+      {"SameWordsAgain", R"({"words":")" + Again("FOX wint* fox ", 40) + "\"}", "/v/a/fox.JPG"},
       {"UnknownMembers", R"({"words":"budget","colour":"red"})", "/v/a/report.txt"},
   };
   for (const SearchCase& c : cases) {
@@ -56,6 +75,9 @@ TEST(Search, FindsWordsNamesAndWhatTheFiltersLeave) {
       {"From", R"({"from":1e30})", "2000"},
       {"Below", R"({"below":{}})", "2000"},
       {"Ids", R"({"ids":["nowhere"]})", "2002"},
+      {"IdsAsText", R"({"ids":"i"})", "2000"},
+      {"Words", R"({"words":")" + Numbers(65) + "\"}", "2000"},
+      {"WordsOfAPhrase", R"({"words":"\")" + Again("fox ", 1001) + R"(\""})", "2000"},
   };
   for (const SearchCase& c : refused) {
     EXPECT_EQ(engine.Do("search", c.data), c.want) << c.name;
@@ -104,9 +126,44 @@ TEST(Search, MergesThePagesOfSeveralIndexes) {
                                               i % 3 == 0 ? "i" : "j"))),
               "ok");
   }
+  // They fit equally well, and their paths are in the other order than their numbers.
+  for (int i = 40; i-- > 20;) {
+    const std::string path = "/w/" + std::to_string(i);
+    engine.Send(WriteRequest("document_upsert_by_id", path,
+                             MakeDocument(path, R"({"KAVOMDTextContent":"quarterly report"})"),
+                             i % 2 == 0 ? "i" : "j"));
+  }
   EXPECT_EQ(engine.Do("commit", "{}", "j"), "ok");
+  std::string pages;
+  for (int from = 0; from < 20; from += 4) {
+    pages += from == 0 ? "" : " ";
+    pages += engine.Search(R"({"words":"quarterly","size":4,"from":)" + std::to_string(from) + "}");
+  }
+  EXPECT_EQ(pages, engine.Search(R"({"words":"quarterly","size":20})"));
   EXPECT_EQ(engine.Search(R"({"sort":"path","from":2,"size":4})"), "/v/2 /v/3 /v/4 /v/5");
-  EXPECT_EQ(engine.Search(R"({"ids":["j"],"sort":"path","from":2,"size":2})"), "/v/4 /v/5");
+  EXPECT_EQ(engine.Search(R"({"ids":["j","j"],"sort":"path","from":2,"size":2})"), "/v/4 /v/5");
+}
+
+TEST(Search, EndsAtItsDeadline) {
+  const TempFolder folder;
+  Connection db(folder / "any.db", Connection::Use::kCreate);
+  const auto count = [&](const std::string& to) {
+    Sql(db, "WITH RECURSIVE n(i) AS (SELECT 1 UNION ALL SELECT i + 1 FROM n WHERE i < " + to +
+                ") SELECT count(*) FROM n")
+        .Run();
+  };
+  {
+    const TimeLimit limit(db, std::chrono::steady_clock::now() + std::chrono::milliseconds(50));
+    try {
+      count("1e15");
+      FAIL();
+    } catch (const Failure& failure) {
+      EXPECT_EQ(failure.GetCode(), Code::kTimeIsUp);
+    }
+    EXPECT_THROW(count("1"), Failure) << "it is not begun";
+  }
+  EXPECT_NO_THROW(count("100000"));
 }
 
 }  // namespace
+}  // namespace vexlo::elasticd

@@ -59,6 +59,11 @@ void RemoveShare(const std::string& file, const std::string& name);
 // and trials each have their own; a build for "" never looks there.
 const std::string& Root();
 
+// What is wrong with FILEINDEX_ROOT in the environment where it would be taken, for people; "" for
+// nothing. Root() passes over a value that is not absolute, so programs ask this at their start:
+// otherwise they would work on another root than the one that was meant.
+std::string RootFault();
+
 }  // namespace kavo::local
 
 #endif  // KAVO_LOCAL_SHARES_H_

@@ -70,12 +70,19 @@ class QueueFile {
  public:
   explicit QueueFile(const std::string& given) {
     if (!given.empty()) {
+      // As the watcher names it, whose folders have no links in their paths: it must know its own.
       path_ = AbsolutePath(given);
+      const size_t slash = path_.rfind('/');
+      const std::string folder = RealPath(path_.substr(0, std::max<size_t>(slash, 1)));
+      if (!folder.empty()) {
+        path_.replace(0, slash, folder == "/" ? "" : folder);
+      }
       return;
     }
     const char* const base = getenv("TMPDIR");
-    folder_ =
-        AbsolutePath(base == nullptr || *base == '\0' ? "/tmp" : base) + "/fileindex-watch.XXXXXX";
+    const std::string parent = AbsolutePath(base == nullptr || *base == '\0' ? "/tmp" : base);
+    const std::string real = RealPath(parent);
+    folder_ = (real.empty() ? parent : real) + "/fileindex-watch.XXXXXX";
     if (mkdtemp(folder_.data()) == nullptr) {
       const int error = errno;
       throw Failure("a folder for the queue cannot be made, '" + std::exchange(folder_, "") +

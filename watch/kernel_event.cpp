@@ -2,10 +2,13 @@
 
 #include <sys/inotify.h>
 
+#include <algorithm>
 #include <utility>
 
 namespace vexlo::watch {
 namespace {
+
+constexpr size_t kRenamesKept = 8;
 
 std::optional<ChangeKind> KindOf(const KernelEvent& event) {
   struct Translation {
@@ -81,9 +84,15 @@ std::optional<Change> ChangeQueue::Next(TimePoint now) {
   waiting_.pop_front();
   ++taken_;
   if (change.kind == ChangeKind::kRenamed) {
-    change.reverses = last_.kind == ChangeKind::kRenamed && change.wd == last_.wd_old &&
-                      change.name == last_.name_old && change.wd_old == last_.wd &&
-                      change.name_old == last_.name;
+    change.reverses =
+        std::any_of(renames_.begin(), renames_.end(), [&change](const Change& before) {
+          return change.wd == before.wd_old && change.name == before.name_old &&
+                 change.wd_old == before.wd && change.name_old == before.name;
+        });
+    renames_.push_back(change);
+    if (renames_.size() > kRenamesKept) {
+      renames_.pop_front();
+    }
   } else if (change.kind == ChangeKind::kDeleted) {
     change.reverses =
         last_.kind == ChangeKind::kCreated && change.wd == last_.wd && change.name == last_.name;

@@ -43,10 +43,10 @@ struct Change {
   std::string name;
   int wd_old = -1;  // For kRenamed, where it was before.
   std::string name_old;
-  // A rename that is the very reverse of the one before it, or a delete of what was created just
-  // before it. The kernel reports an exchange of two names as two moves, the second of which seems
-  // to undo the first although a thing stands at either name; where one name is not watched, as a
-  // create and a delete.
+  // A rename that is the very reverse of one shortly before it, or a delete of what was created
+  // just before it. The kernel reports an exchange of two names as two moves, the second of which
+  // seems to undo the first although a thing stands at either name; where one name is not watched,
+  // as a create and a delete. What others do may fall between two moves.
   bool reverses = false;
 };
 
@@ -81,7 +81,8 @@ class ChangeQueue {
   uint64_t taken_ = 0;  // How many have left `waiting_`.
   // First halves in `waiting_` by cookie; the value less `taken_` is the index.
   std::unordered_map<uint32_t, uint64_t> halves_;
-  Change last_;  // The one before, less kSelfMoved.
+  Change last_;                 // The one before, less kSelfMoved.
+  std::deque<Change> renames_;  // The last few.
 };
 
 }  // namespace vexlo::watch

@@ -7,9 +7,11 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <iterator>
 #include <memory>
+#include <system_error>
 
 #include "common/check.h"
 #include "common/error.h"
@@ -28,6 +30,7 @@ constexpr size_t kMaxWaiting = size_t{1} << 20;
 constexpr size_t kFoldersBetweenPulls = 256;
 constexpr size_t kMaxOpenFolders = 32;
 constexpr std::chrono::milliseconds kHintWait(2000);
+constexpr std::chrono::milliseconds kRetryPause(1000);
 constexpr size_t kRescanAtOnce = 1024;  // Folders, so that events are not kept waiting for longer.
 
 Fd StartInotify() {
@@ -88,6 +91,22 @@ std::set<std::string> MountsNow() {
     }
   }
   return mounts;
+}
+
+// Otherwise descriptors or memory were short, or a disk failed, which may be over in a moment.
+bool MeansNoPermission(int error) { return error == EACCES || error == EPERM; }
+
+// Whether the way down from `folder` leads over a symbolic link to what is below it; `path` itself
+// is not looked at.
+bool HasLinkBetween(const std::string& folder, const std::string& path) {
+  for (size_t slash = path.find('/', folder.size() + 1); slash != std::string::npos;
+       slash = path.find('/', slash + 1)) {
+    struct stat attributes = {};
+    if (lstat(path.substr(0, slash).c_str(), &attributes) == 0 && S_ISLNK(attributes.st_mode)) {
+      return true;
+    }
+  }
+  return false;
 }
 
 std::string Count(size_t count, const char* what) {
@@ -207,8 +226,15 @@ void Watcher::Poll(TimePoint now) {
       }
     }
   }
+  if (now >= next_retry_) {
+    next_retry_ = TimePoint::max();
+    rescan_.insert(rescan_.end(), unreadable_.begin(), unreadable_.end());
+  }
   TakeHints();
   Rescan();
+  if (unreadable_.empty()) {
+    retry_pause_ = {};
+  }
   LogChangedState();
   tree_.Reclaim();
 }
@@ -217,7 +243,7 @@ TimePoint Watcher::NextDeadline() const {
   if (!rescan_.empty() || !drained_) {
     return TimePoint::min();
   }
-  return std::min({IsAtRest() ? TimePoint::max() : next_rescan_,
+  return std::min({IsAtRest() ? TimePoint::max() : next_rescan_, next_retry_,
                    hinted_.empty() ? TimePoint::max() : next_hinted_,
                    changes_.NextDeadline().value_or(TimePoint::max())});
 }
@@ -313,7 +339,7 @@ void Watcher::ApplyToEntry(const Change& change, FolderId parent) {
     case ChangeKind::kAttributes:
       Emit(kMaskAttrib, change.is_dir, std::move(path));
       if (known != kNoFolder && unreadable_.count(known) != 0) {
-        Walk({{parent, change.name, true}}, {});
+        Walk({{parent, change.name, true}}, {.deep = true});
       }
       break;
     case ChangeKind::kDeleted:
@@ -550,9 +576,14 @@ Watcher::Entered Watcher::EnterUnopened(const Visit& visit, int parent_fd, bool 
     known = tree_.Add(visit.parent, visit.name, IdentityOf(attributes));
     entered.appeared = true;
   }
-  if (tree_.Watch(known) < 0) {
-    unwatched_.erase(known);
-    unreadable_.insert(known);
+  // With a watch, too: what was made in it meanwhile has not been read.
+  unwatched_.erase(known);
+  unreadable_.insert(known);
+  if (!MeansNoPermission(error) && next_retry_ == TimePoint::max()) {
+    retry_pause_ = std::clamp<std::chrono::milliseconds>(
+        2 * retry_pause_, std::min(kRetryPause, options_.rescan_interval),
+        options_.rescan_interval);
+    next_retry_ = now_ + retry_pause_;
   }
   entered.folder = known;
   return entered;
@@ -738,7 +769,7 @@ void Watcher::CheckPath(const std::string& path) const {
               "cannot be watched as a folder, path=" + path + ", reason=" + strerror(errno));
 }
 
-// Whether a walk from the root comes to the path.
+// Whether a walk from the root comes to the path by its name; it follows no link.
 bool Watcher::Covers(const std::string& root, const std::string& path) const {
   if (!IsBelow(path, root)) {
     return false;
@@ -750,8 +781,9 @@ bool Watcher::Covers(const std::string& root, const std::string& path) const {
 }
 
 bool Watcher::IsCovered(const std::string& path) const {
-  return std::any_of(roots_.begin(), roots_.end(),
-                     [&](const Root& root) { return Covers(root.path, path); });
+  return std::any_of(roots_.begin(), roots_.end(), [&](const Root& root) {
+    return Covers(root.path, path) && !HasLinkBetween(root.path, path);
+  });
 }
 
 bool Watcher::CoversARoot(const std::string& path) const {
@@ -806,12 +838,22 @@ void Watcher::CheckMounts() {
   std::set_symmetric_difference(mounts.begin(), mounts.end(), mounts_.begin(), mounts_.end(),
                                 std::back_inserter(changed));
   mounts_ = std::move(mounts);
-  for (const std::string& mount : changed) {
-    const std::string path = mount.substr(0, mount.find('\0'));
-    for (const Root& root : roots_) {
-      if (root.folder != kNoFolder && IsBelow(path, root.path)) {
+  if (changed.empty()) {
+    return;
+  }
+  for (const Root& root : roots_) {
+    if (root.folder == kNoFolder) {
+      continue;
+    }
+    // The table has no links in its paths, the root may.
+    std::error_code error;
+    std::string real = std::filesystem::canonical(root.path, error).string();
+    real = error ? root.path : real;
+    for (const std::string& mount : changed) {
+      const std::string path = mount.substr(0, mount.find('\0'));
+      if (IsBelow(path, real)) {
         FolderId folder = root.folder;
-        size_t at = root.path.size() == 1 ? 0 : root.path.size();
+        size_t at = real.size() == 1 ? 0 : real.size();
         for (FolderId next = folder; next != kNoFolder && at < path.size();) {
           const size_t slash = std::min(path.find('/', at + 1), path.size());
           next = tree_.Find(folder, std::string_view(path).substr(at + 1, slash - at - 1));
@@ -862,8 +904,9 @@ void Watcher::Rescan() {
   for (size_t i = 0; i < kRescanAtOnce && !rescan_.empty(); ++i) {
     const FolderId folder = rescan_.back();
     rescan_.pop_back();
-    if (unwatched_.count(folder) != 0 || unreadable_.count(folder) != 0) {
-      Walk({{tree_.Parent(folder), tree_.Name(folder), true}}, {});
+    const bool unreadable = unreadable_.count(folder) != 0;
+    if (unreadable || unwatched_.count(folder) != 0) {
+      Walk({{tree_.Parent(folder), tree_.Name(folder), true}}, {.deep = unreadable});
     }
   }
 }

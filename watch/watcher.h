@@ -55,7 +55,7 @@ struct WatchState {
   std::string text;       // For people; empty when there is nothing to say.
   size_t watched = 0;     // Folders that the kernel tells about.
   size_t unwatched = 0;   // Folders that are looked at every `rescan_interval` instead.
-  size_t unreadable = 0;  // Folders about which nothing is known; tried again as often.
+  size_t unreadable = 0;  // Folders that could not be read; tried again as often or sooner.
   std::vector<std::string> gone;  // Roots that do not stand at the moment.
 };
 
@@ -83,9 +83,10 @@ class Watcher {
 
   // Watches what is below `roots`, absolute paths without "." or ".." and without a slash at the
   // end (other than "/"). What is there already is not reported. A root below another one is
-  // reported by it. Blocks until all folders are read. Throws Error 120 for a root that is no such
-  // path, 502 for one that cannot be opened as a folder (a symbolic link is none) unless
-  // `takes_missing_roots`, 502 when the kernel has no more inotify instances or descriptors.
+  // reported by it, unless a link leads there. Blocks until all folders are read. Throws Error 120
+  // for a root that is no such path, 502 for one that cannot be opened as a folder (a symbolic link
+  // is none) unless `takes_missing_roots`, 502 when the kernel has no more inotify instances or
+  // descriptors.
   Watcher(const std::vector<std::string>& roots, WatchOptions options, Sink sink, TimePoint now);
   ~Watcher() = default;
   Watcher(const Watcher&) = delete;
@@ -208,6 +209,10 @@ class Watcher {
   TimePoint next_hinted_;         // When these are looked at.
   std::vector<FolderId> rescan_;  // What is left of the rescan under way.
   TimePoint next_rescan_;
+  // When folders are tried again that could not be opened for want of something that may soon be
+  // had: later each time, up to the interval.
+  TimePoint next_retry_ = TimePoint::max();
+  std::chrono::milliseconds retry_pause_{0};
   std::set<std::string> mounts_;      // As they were at the last look, before anything was opened.
   std::vector<std::string> changed_;  // Folders to report for a reindex when the walk is over.
   size_t removed_watches_ = 0;

@@ -21,8 +21,36 @@ using kavo::local::RegisteredQueue;
 
 // Several registrations that are changed one after the other are one change.
 constexpr std::chrono::milliseconds kDebounce(50);
+constexpr std::chrono::milliseconds kFirstPause(1000);
+constexpr size_t kSpared = 3;  // Queues that give way to the daemon's own threads.
 constexpr uint32_t kFolderMask =
-    IN_MOVED_TO | IN_MOVED_FROM | IN_CLOSE_WRITE | IN_DELETE | IN_ONLYDIR;
+    IN_MOVED_TO | IN_MOVED_FROM | IN_CLOSE_WRITE | IN_DELETE | IN_MOVE_SELF | IN_ONLYDIR;
+
+QueueStats WaitingFor(const RegisteredQueue& registered, const std::string& reason) {
+  QueueStats stats;
+  stats.queue = registered.queue;
+  stats.reason = "nothing is watched, but tried again: " + reason;
+  stats.roots.reserve(registered.folders.size());
+  for (const kavo::local::MonitoredFolder& folder : registered.folders) {
+    stats.roots.push_back(folder.path);
+  }
+  return stats;
+}
+
+Json::Value JsonOf(const QueueStats& stats) {
+  Json::Value value(Json::objectValue);
+  value["queue"] = stats.queue;
+  value["roots"] = Json::arrayValue;
+  for (const std::string& root : stats.roots) {
+    value["roots"].append(root);
+  }
+  value["watches"] = Json::UInt64{stats.watches};
+  value["state"] = stats.live ? "live" : "degraded";
+  value["reason"] = stats.reason;
+  value["lines"] = Json::UInt64{stats.lines};
+  value["overflows"] = Json::UInt64{stats.overflows};
+  return value;
+}
 
 }  // namespace
 
@@ -51,21 +79,19 @@ Monitor::~Monitor() {
 }
 
 void Monitor::Run(const std::stop_token& stop) {
-  TimePoint read_at = TimePoint::max();
   while (!stop.stop_requested()) {
     // Without a watch there is only time to go by.
-    const bool blind = !folder_watched_ || !root_paths_.IsComplete();
+    const bool blind = folder_watch_ < 0 || !root_paths_.IsComplete();
     const TimePoint look_at = blind ? Clock::now() + options_.rescan : TimePoint::max();
     std::vector<pollfd> fds = {{registrations_.Get(), POLLIN, 0},
                                {mounts_.Get(), POLLPRI, 0},
                                {root_paths_.fd(), POLLIN, 0}};
-    wake_.Wait(fds, std::min(read_at, look_at));
+    wake_.Wait(fds, std::min(read_at_, look_at));
     if (TakeFolderEvents()) {
-      read_at = std::min(read_at, Clock::now() + kDebounce);
+      read_at_ = std::min(read_at_, Clock::now() + kDebounce);
     }
     const bool looks = blind && Clock::now() >= look_at;
-    if (looks || Clock::now() >= read_at) {
-      read_at = TimePoint::max();
+    if (looks || Clock::now() >= read_at_) {
       WatchFolder();
       Read();
     }
@@ -75,16 +101,19 @@ void Monitor::Run(const std::stop_token& stop) {
   }
 }
 
-// The folder is made anew when somebody has removed it; where it was watched before, nothing
-// changes.
+// The folder is made anew when somebody has removed it or moved it away; where it was watched
+// before, nothing changes.
 void Monitor::WatchFolder() {
   daemon::MakeFolders(folder_);
-  const bool was_watched = std::exchange(
-      folder_watched_, inotify_add_watch(registrations_.Get(), folder_.c_str(), kFolderMask) >= 0);
-  if (!folder_watched_ && was_watched) {
+  const int before = std::exchange(
+      folder_watch_, inotify_add_watch(registrations_.Get(), folder_.c_str(), kFolderMask));
+  if (folder_watch_ < 0 && before >= 0) {
     daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
                 "registrations are looked at time after time, as they cannot be watched, path=" +
                     folder_ + ", reason=" + std::system_category().message(errno));
+  }
+  if (before >= 0 && before != folder_watch_) {
+    inotify_rm_watch(registrations_.Get(), before);  // It may stand elsewhere.
   }
 }
 
@@ -107,13 +136,25 @@ bool Monitor::TakeFolderEvents() {
 }
 
 void Monitor::Read() {
+  const bool complete = ReadOnce();
+  pause_ = complete ? std::chrono::milliseconds(0)
+                    : std::min(std::max(2 * pause_, kFirstPause),
+                               std::max(options_.rescan, kFirstPause));
+  read_at_ = complete ? TimePoint::max() : Clock::now() + pause_;
+}
+
+// False when something is to be tried again.
+bool Monitor::ReadOnce() {
   kavo::local::MonitorQueues read;
   try {
     read = kavo::local::ReadMonitorQueues();
   } catch (const kavo::local::MonitorQueuesError& error) {
-    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__, error.what());
-    return;
+    if (std::exchange(fault_, error.what()) != error.what()) {
+      daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__, error.what());
+    }
+    return false;
   }
+  fault_.clear();
   for (const auto& [app, fault] : read.unreadable) {
     if (unreadable_[app] != fault) {
       daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
@@ -136,18 +177,54 @@ void Monitor::Read() {
       }
       queue = stays ? std::next(queue) : queues_.erase(queue);
     }
-    for (auto& [key, registered] : wanted) {
-      Queue& queue = queues_[key];
-      if (queue.watch == nullptr) {
-        queue.watch = std::make_unique<QueueWatch>(registered, options_);
-      } else if (queue.registered != registered) {
-        queue.watch->SetFolders(registered.folders);
-      }
-      queue.registered = std::move(registered);
-    }
   }
+  const bool all_started = StartQueues(std::move(wanted));
   Stop(std::move(ended), /*discard=*/true);
   CheckRoots();
+  return all_started && unreadable_.empty();
+}
+
+// False when there is no thread, memory or descriptor for some of them. The others are not to
+// suffer for it, and those that cannot be started are told of in the state.
+bool Monitor::StartQueues(std::map<Key, RegisteredQueue> wanted) {
+  std::string reason;
+  const kavo::local::MutexLock lock(mutex_);
+  const size_t waited = waiting_.size();
+  waiting_.clear();
+  for (auto& [key, registered] : wanted) {
+    const auto queue = queues_.find(key);
+    if (queue == queues_.end()) {
+      try {
+        auto watch = std::make_unique<QueueWatch>(registered, options_);
+        queues_.emplace(key, Queue{std::move(registered), std::move(watch)});
+      } catch (const std::exception& error) {
+        reason = error.what();
+        waiting_.emplace(key, WaitingFor(registered, reason));
+      }
+      continue;
+    }
+    if (queue->second.registered != registered) {
+      queue->second.watch->SetFolders(registered.folders);
+    }
+    queue->second.registered = std::move(registered);
+  }
+  if (!waiting_.empty() && !thread_.joinable()) {
+    // The daemon has threads of its own to start after these.
+    for (size_t i = 0; i < kSpared && !queues_.empty(); ++i) {
+      const auto last = std::prev(queues_.end());
+      waiting_.emplace(last->first, WaitingFor(last->second.registered, reason));
+      queues_.erase(last);
+    }
+  }
+  if (waiting_.size() != waited) {
+    daemon::Log(daemon::Level::kWarning, VEXLO_SOURCE, __LINE__,
+                waiting_.empty()
+                    ? "all queues have a thread again"
+                    : "not watched, but tried again: " + std::to_string(waiting_.size()) + " of " +
+                          std::to_string(waiting_.size() + queues_.size()) +
+                          " queues, reason=" + reason);
+  }
+  return waiting_.empty();
 }
 
 // All at once, so that they are not waited for one by one.
@@ -179,19 +256,10 @@ Json::Value Monitor::Stats() const {
   Json::Value queues(Json::arrayValue);
   const kavo::local::MutexLock lock(mutex_);
   for (const auto& [key, queue] : queues_) {
-    const QueueStats stats = queue.watch->Stats();
-    Json::Value value(Json::objectValue);
-    value["queue"] = stats.queue;
-    value["roots"] = Json::arrayValue;
-    for (const std::string& root : stats.roots) {
-      value["roots"].append(root);
-    }
-    value["watches"] = Json::UInt64{stats.watches};
-    value["state"] = stats.live ? "live" : "degraded";
-    value["reason"] = stats.reason;
-    value["lines"] = Json::UInt64{stats.lines};
-    value["overflows"] = Json::UInt64{stats.overflows};
-    queues.append(std::move(value));
+    queues.append(JsonOf(queue.watch->Stats()));
+  }
+  for (const auto& [key, stats] : waiting_) {
+    queues.append(JsonOf(stats));
   }
   Json::Value answer(Json::objectValue);
   answer["queues"] = std::move(queues);

@@ -25,11 +25,12 @@ namespace vexlo::evnotifyd {
 // does (each queue sees which of its folders stand).
 //
 // Registrations of an application that cannot be read stay as they were: a file that somebody broke
-// by hand must not cost an index.
+// by hand must not cost an index. What cannot be read or started, for want of a thread, of memory
+// or of a descriptor, is tried again, at first after a second, then ever later.
 class Monitor {
  public:
   // Reads the registrations and starts. Throws Error 502 when their folder cannot be made, and
-  // std::system_error without descriptors.
+  // std::system_error without a descriptor or thread for itself.
   explicit Monitor(const FeederOptions& options);
   ~Monitor();  // Stops all queues, within a second.
   Monitor(const Monitor&) = delete;
@@ -49,6 +50,8 @@ class Monitor {
   void WatchFolder();
   bool TakeFolderEvents();
   void Read();
+  bool ReadOnce();
+  bool StartQueues(std::map<Key, kavo::local::RegisteredQueue> wanted);
   void Stop(std::vector<Queue> queues, bool discard);
   void CheckRoots();
 
@@ -57,12 +60,16 @@ class Monitor {
   const Wake wake_;
   daemon::UniqueFd registrations_;
   daemon::UniqueFd mounts_;
-  bool folder_watched_ = false;
+  int folder_watch_ = -1;
+  std::chrono::milliseconds pause_{0};  // Before what failed is tried again; 0 when nothing did.
+  TimePoint read_at_ = TimePoint::max();
   RootPaths root_paths_;
   std::map<std::string, std::string> unreadable_;  // What has been logged.
+  std::string fault_;                              // So has been that nothing can be read.
 
-  mutable kavo::local::Mutex mutex_;                     // Held for moments.
-  std::map<Key, Queue> queues_ KAVO_GUARDED_BY(mutex_);  // Changed by the thread alone.
+  mutable kavo::local::Mutex mutex_;                           // Held for moments.
+  std::map<Key, Queue> queues_ KAVO_GUARDED_BY(mutex_);        // Changed by the thread alone.
+  std::map<Key, QueueStats> waiting_ KAVO_GUARDED_BY(mutex_);  // Those that could not be started.
 
   std::jthread thread_;
 };

@@ -64,7 +64,11 @@ void RootPaths::WatchWay(const std::string& root, int links) {
       return;
     }
     heard = next == std::string::npos || !Exists(root.substr(0, next));
-    if (watch >= 0 && heard && (watch = Watch(folder, kNames)) >= 0) {
+    // Where what is below the next one is missing, that one's own end is heard of by its name
+    // alone: the kernel keeps its own word back for as long as anybody stands in it.
+    const size_t second = heard ? next : root.find('/', next + 1);
+    const bool ends = heard || !Exists(root.substr(0, second));
+    if (watch >= 0 && ends && (watch = Watch(folder, kNames)) >= 0) {
       names_[watch].insert(root.substr(slash + 1, next - slash - 1));
     }
     // What went since it was found is looked for again, from above.

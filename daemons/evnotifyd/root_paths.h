@@ -13,7 +13,8 @@ namespace vexlo::evnotifyd {
 
 // The kernel tells a watched folder nothing when a folder above it is moved, and of one that is
 // gone nobody tells when it is back. So each folder above a root is watched for its own move, and
-// the one that holds the root, or the place of what is missing above it, for that one name in it.
+// the one that holds the root, or the place of what is missing above it, for that one name in it;
+// in the latter case, the one above that, too.
 // Where links lead to a root, they and the way behind them are watched, too. What else happens in
 // these folders, which may be much, goes unheard but in the one.
 class RootPaths {

@@ -182,6 +182,11 @@ TEST_F(EvnotifydTest, ARegistrationThatGrowsLeavesTheRestAlone) {
   Do("share", "> g; > ../other/g");
   AwaitLines("create share/g, write share/g", "q", 5);
   EXPECT_EQ(Stats()["lines"], 7);
+  // So does the folder of the registrations when it is moved away.
+  Do("var/lib/kavo", "mv evnotify old; mkdir -p evnotify");
+  EXPECT_TRUE(Stack::Await([&] { return Stats().isNull(); }));
+  Register({{"other", kMask}});
+  AwaitLines("reindex other/", "q", 7);
 }
 
 TEST_F(EvnotifydTest, TheWayToAFolderMayLeadOverLinks) {
@@ -209,6 +214,29 @@ TEST_F(EvnotifydTest, TheWayToAFolderMayLeadOverLinks) {
   }
   Do("link/photo", "> f");
   AwaitLines("create link/photo/f, write link/photo/f", "q", count);
+}
+
+TEST_F(EvnotifydTest, AFolderThatSomebodyStandsInMayGoWithTheOneInIt) {
+  kRoot.MakeFolder("way/root");
+  Register({{"way/root", kMask}});
+  Start();
+  AwaitLines("reindex way/root/");
+  const int stands = open((kRoot / "way").c_str(), O_PATH | O_CLOEXEC);
+  ASSERT_GE(stands, 0);
+  Do("", "rmdir way/root");
+  AwaitLines("delete way/root/", "q", 1);
+  // By the second registration the daemon has looked at the way again.
+  for (const char* const other : {"one", "two"}) {
+    const size_t count = CountLines();
+    kRoot.MakeFolder(other);
+    Register({{"way/root", kMask}, {other, kMask}});
+    AwaitLines(std::string("reindex ") + other + "/", "q", count);
+  }
+  const size_t count = CountLines();
+  Do("", "rmdir way");
+  Do("", "mkdir -p way/root");
+  AwaitLines("reindex way/root/", "q", count);
+  close(stands);
 }
 
 TEST_F(EvnotifydTest, WhatIsMountedInAShareIsReadAnew) {

@@ -27,6 +27,8 @@ TEST(ChangeQueueTest, PairsMovesAndKeepsTheOrder) {
       {"NoneOvertakes", {{0, {made, from, made}, "c1a "}, {9, {gone, to}, "r1a2b c1a !d1a "}}},
       {"Crossed", {{0, {from, other, other_to}, ""}, {10, {to}, "r1a2b r1c2d "}}},
       {"Exchanged", {{0, {from, to, moved, back, back_to}, "r1a2b M5 !r2b1a "}}},
+      {"ExchangedAmongOthers",
+       {{0, {from, to, other, other_to, made, back, back_to}, "r1a2b r1c2d c1a !r2b1a "}}},
   };
   for (const auto& [name, steps] : cases) {
     SCOPED_TRACE(name);

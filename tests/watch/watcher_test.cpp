@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -151,6 +152,31 @@ TEST_F(WatcherTest, FoldersBeyondTheLimitAreLookedAt) {
   EXPECT_EQ(Text(Take()), "create c/n/, create d/n/");
 }
 
+// With a watch and without it: what is made in it meanwhile has been read by nobody.
+TEST_F(WatcherTest, AFolderThatCannotBeOpenedForAMomentIsReadThen) {
+  Do("mkdir d");
+  Start({in_}, {.polls_roots = false});
+  Take();
+  rlimit files{};
+  ASSERT_EQ(getrlimit(RLIMIT_NOFILE, &files), 0);
+  const rlimit none{STDERR_FILENO + 1, files.rlim_max};
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &none), 0);
+  for (const char* const path : {"/new", "/new/e", "/d/f"}) {
+    EXPECT_EQ(mkdir((in_ + path).c_str(), 0755), 0) << path;
+  }
+  Take();
+  ASSERT_EQ(setrlimit(RLIMIT_NOFILE, &files), 0);
+  EXPECT_NE(watcher_->State().unreadable, 0u);
+  const auto wait =
+      std::chrono::duration_cast<std::chrono::seconds>(watcher_->NextDeadline() - now_);
+  EXPECT_LE(wait, std::chrono::seconds(1));
+  EXPECT_TRUE(Text(Take(std::chrono::seconds(1))).ends_with("reindex ./"));
+  EXPECT_EQ(watcher_->State().unreadable, 0u);
+  EXPECT_EQ(watcher_->NextDeadline(), TimePoint::max());
+  Do("> new/e/g; > d/f/g");
+  EXPECT_EQ(Text(Take()), "create new/e/g, write new/e/g, create d/f/g, write d/f/g");
+}
+
 TEST_F(WatcherTest, HintsShortenTheWaitForThem) {
   Do("mkdir -p a b/c");
   Start({in_}, {.max_watches = 1, .takes_hints = true});
@@ -254,6 +280,13 @@ TEST_F(WatcherTest, ARootMayLieInWhatIsIgnored) {
   EXPECT_EQ(watcher_->State().watched, 4u);
   Do("> @eaDir/d/f; > @eaDir/f; > @eaDir/d/@eaDir/f; > b/c/f");
   EXPECT_EQ(Text(Take()), "create @eaDir/d/f, write @eaDir/d/f, create b/c/f, write b/c/f");
+}
+
+TEST_F(WatcherTest, ARootBehindALinkInAnotherIsOneOfItsOwn) {
+  Do("mkdir -p ../out/c a/d; ln -s ../out link");
+  Start({in_, in_ + "/link/c", in_ + "/a/d"});
+  Do("> link/c/f; > a/d/f");
+  EXPECT_EQ(Text(Take()), "create link/c/f, write link/c/f, create a/d/f, write a/d/f");
 }
 
 TEST_F(WatcherTest, WithoutPollingOfRootsThereIsNoDeadlineAtRest) {
